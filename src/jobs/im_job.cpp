@@ -1,0 +1,249 @@
+#include "jobs/im_job.hpp"
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+
+#include "base/diagnostics.hpp"
+#include "base/errors.hpp"
+#include "base/profile.hpp"
+#include "base/run_services.hpp"
+#include "envisat/product_types.hpp"
+#include "jobs/drivers.hpp"
+#include "jobs/job_common.hpp"
+
+namespace sar::jobs {
+namespace {
+
+constexpr std::string_view kImBanner =
+    "\nINPUT ASA_IM : [ %s ]\nINPUT DORIS : [ %s ]\nINPUT ASA_INS : [ %s ]\nINPUT ASA_XCA : [ %s ]\nOUTPUT ROOT "
+    "NAME : [ %s ]";
+constexpr double kSpeedOfLight = 299792458.0;
+constexpr double kWantedPolyPoints = 6900.0;
+// Attitude law terms of the geometric Doppler prediction.
+constexpr double kAttitude[7] = {1.0, 10.0, 0.0 /* wavelength */, 3.912987, -0.167074, 0.050233, 23.0};
+
+void remove_work_file(const std::string& path) {
+  std::error_code ec;
+  if (!std::filesystem::remove(path, ec)) base::report(base::kReportWarning, "Cannot remove file");
+}
+
+int getInt(const char* section, const char* key, const std::string& file) {
+  return base::GetCheckMyProfileInt(section, key, file);
+}
+double getDouble(const char* section, const char* key, const std::string& file) {
+  return base::GetCheckMyProfileDouble(section, key, file);
+}
+
+}  // namespace
+
+std::string directory_of(const std::string& path) {
+  const auto cut = path.find_last_of("/\\");
+  if (cut == std::string::npos) return ".";
+  return path.substr(0, cut);
+}
+
+int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az,
+               enviauxfiles& files, StageFlags& flags) {
+  base::Frame frame("IMreadpars()");
+  (void)files;
+  par = sarpar{};
+  proc = procparm{};
+  dc = dcestconf{};
+  az = azimuthconf{};
+  flags = {1, 1, 0, 1, 1, 1, 1, 1};
+
+  const std::string& f = parameterFile;
+  const char* gpc = "GeneralProcessingConf";
+  proc.Flag_incore = getInt(gpc, "Flag_incore", f);
+  proc.Flag_ortog = getInt(gpc, "Flag_ortog", f);
+  proc.Flag_swstal = getInt(gpc, "Flag_swstal", f);
+  proc.Azblk = getInt(gpc, "Azblk", f);
+  {
+    int32_t level = 0;  // optional: stays 0 when absent
+    if (base::GetMyProfileIntArray(gpc, "Report_level", std::span<int32_t>(&level, 1), f) == base::kProfileOk)
+      proc.Report_level = level;
+  }
+
+  const char* dcs = "DCestConf";
+  dc.Memory = getInt(dcs, "Memory", f);
+  dc.RgBand = getDouble(dcs, "RgBand", f);
+  dc.Blocks = getInt(dcs, "Blocks", f);
+  dc.Blockl = getInt(dcs, "Blockl", f);
+  dc.AnLen = getDouble(dcs, "AnLen", f);
+  dc.Kthr = getDouble(dcs, "Kthr", f);
+  dc.Lookbf = getDouble(dcs, "Lookbf", f);
+  dc.Lookbt = getDouble(dcs, "Lookbt", f);
+  dc.Lookrp = getDouble(dcs, "Lookrp", f);
+  dc.Lookrs = getDouble(dcs, "Lookrs", f);
+  dc.Decfac = getInt(dcs, "Decfac", f);
+  dc.Flength = getInt(dcs, "Flength", f);
+  dc.Dftstep = getDouble(dcs, "Dftstep", f);
+  dc.Fftrgprc = getDouble(dcs, "Fftrgprc", f);
+  dc.Fftazprc = getDouble(dcs, "Fftazprc", f);
+  dc.Peakwid = getDouble(dcs, "Peakwid", f);
+  dc.Minamb = getDouble(dcs, "Minamb", f);
+  dc.Maxamb = getDouble(dcs, "Maxamb", f);
+  dc.Sthr = getDouble(dcs, "Sthr", f);
+  dc.Nbestblocks = getInt(dcs, "Nbestblocks", f);
+  dc.Nummlbf = getInt(dcs, "Nummlbf", f);
+  dc.Nwdarblocks = getInt(dcs, "Nwdarblocks", f);
+  dc.Varthr = getDouble(dcs, "Varthr", f);
+  dc.Patchs = getInt(dcs, "Patchs", f);
+  dc.Patchl = getInt(dcs, "Patchl", f);
+  dc.Dswst = getInt(dcs, "Dswst", f);
+  dc.Amb_flag = getInt(dcs, "Amb_flag", f);
+  base::GetCheckMyProfileIntArray(dcs, "Pol_Weights", dc.Pol_Weights, f);
+  dc.progressFlag = proc.progressFlag;
+  dc.Flag_incore = proc.Flag_incore;
+
+  const char* azs = "AzimuthConf";
+  az.AntennaLength = getDouble(azs, "AntennaLength", f);
+  az.WhiteningFlag = getInt(azs, "WhiteningFlag", f);
+  az.RangeWindowHammingParameter = getDouble(azs, "RangeWindowHammingParameter", f);
+  az.AzimuthWindowHammingParameter = getDouble(azs, "AzimuthWindowHammingParameter", f);
+  az.RangeLookBandwidth = getDouble(azs, "RangeLookBandwidth", f);
+  az.AzimuthLookBandwidth = getDouble(azs, "AzimuthLookBandwidth", f);
+  az.RangeTransitionBandwidth = getDouble(azs, "RangeTransitionBandwidth", f);
+  az.AzimuthTransitionBandwidth = getDouble(azs, "AzimuthTransitionBandwidth", f);
+  az.LinesInBlock = getInt(azs, "LinesInBlock", f);
+  az.SamplesInBlock = getInt(azs, "SamplesInBlock", f);
+  az.RangeOverlap = getInt(azs, "RangeOverlap", f) / 2;
+  az.AzimuthOverlap = getInt(azs, "AzimuthOverlap", f) / 2;
+  az.PerformInterpolation = getInt(azs, "PerformInterpolation", f);
+  az.StoltPadding = getDouble(azs, "StoltPadding", f);
+  // The shifts scale with the product's size, which is not known before the extraction.
+  az.azimuthShift = getInt(azs, "ApplyAzShift", f) * static_cast<double>(par.lines);
+  az.rangeShift = getInt(azs, "ApplyRgShift", f) * static_cast<double>(par.samples);
+  return 0;
+}
+
+int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, enviauxfiles& files, StageFlags& flags) {
+  base::Frame frame("IMprocessor");
+  const std::string dir = par.outputDir;
+
+  if (flags[kStageExtract]) {
+    if (int st = frame.check(envi_extract(files, par))) return st;
+    if (int st = frame.check(envi_orbit(files.orbit, par, proc))) return st;
+    if (int st = frame.check(envi_rgpattern(files.xca, files.ins, par, proc))) return st;
+    if (int st = frame.check(envi_syntchirp(par, proc))) return st;
+  }
+  if (proc.Flag_incore) {
+    if (int st = frame.check(init_buffer(par, proc))) return st;
+    // With the data in memory there are no work files to remove.
+    flags[kStageCleanup] = 0;
+  }
+  if (flags[kStageRangeFocus]) {
+    if (int st = frame.check(rangefoc(par, proc))) return st;
+    if (flags[kStageCleanup]) remove_work_file(par.extrPath);
+  }
+  if (flags[kStageDoppler]) {
+    const double wavelength = kSpeedOfLight / par.carrierFrequency;
+    const double midRange = 0.5 * par.samples / par.samplingRate + par.nearRangeTime;
+    if (int st = frame.check(EstDopplerENVI(files.orbit, midRange, par.nearRangeTime, kAttitude[0], kAttitude[1],
+                                            wavelength, kAttitude[3], kAttitude[4], kAttitude[5], kAttitude[6], proc)))
+      return st;
+    dc.inputPath = par.rgfPath;
+    dc.outputDir = dir;
+    dc.wantedPolyPoints = kWantedPolyPoints;
+    if (int st = frame.check(getnadcpoly(dc.inputPath, dc, proc))) return st;
+    if (int st = frame.check(getgeopoly(par, proc))) return st;
+    if (flags[kStageCleanup]) remove_work_file(dir + "/DCEST_resume.txt");
+  }
+  if (flags[kStageCalibration]) {
+    if (int st = frame.check(IMCalibration(par, proc))) return st;
+  }
+  if (flags[kStageAzimuth]) {
+    if (az.rangeShift == par.samples) az.rangeShift = proc.rangeSamples;
+    az.RangeLookBandwidth *= par.samplingRate;
+    az.RangeTransitionBandwidth *= par.samplingRate;
+    az.AzimuthLookBandwidth *= par.prf;
+    az.AzimuthTransitionBandwidth *= par.prf;
+    if (int st = frame.check(azimuthfoc(par, proc, az))) return st;
+    if (int st = frame.check(get_coords(proc, par))) return st;
+    az.RangeLookBandwidth /= par.samplingRate;
+    az.RangeTransitionBandwidth /= par.samplingRate;
+    az.AzimuthLookBandwidth /= par.prf;
+    az.AzimuthTransitionBandwidth /= par.prf;
+    if (flags[kStageCleanup]) remove_work_file(par.rgfPath);
+  }
+  if (proc.Flag_incore) {
+    if (int st = frame.check(dest_buffer(par, proc))) return st;
+  }
+  return 0;
+}
+
+int main_focussing_asar_im(const std::string& listPath) {
+  const std::vector<std::string> args = start_job(listPath, kImTitle, kImBanner, {0, 1, 2, 3, 4});
+  const std::string desDir = description_dir();
+  const std::string parameterFile = desDir + std::string(kImParameterFile);
+  const std::string slcPath = args[4] + "_slc";
+  const int quickLook1 = std::atoi(args[5].c_str());
+  const int quickLook2 = std::atoi(args[6].c_str());
+
+  sarpar par;
+  procparm proc;
+  dcestconf dc;
+  azimuthconf az;
+  enviauxfiles files;
+  StageFlags flags{1, 1, 0, 1, 1, 1, 1, 1};
+
+  if (args[0] == kNotOK) base::fatal(base::ec::kBadArguments, {"ASA_IM0"});
+  require_existing(args[0]);
+  if (!envisat::EnvisatTypes(args[0]).is_im0()) base::fatal(base::ec::kBadArguments, {"ASA_IM0"});
+
+  if (args[3] == kNotOK) {
+    // Calibration is off in this job, so a missing ASA_XCA does not stop it.
+    if (find_aux(args[0], desDir, "ASA_XCA", files.xca) != 0) flags[kStageCalibration] = 0;
+  } else {
+    require_existing(args[3]);
+    files.xca = args[3];
+  }
+  if (args[2] == kNotOK) {
+    if (find_aux(args[0], desDir, "ASA_INS", files.ins) != 0) base::fatal(base::ec::kStageFailed, {"find_aux()"});
+  } else {
+    require_existing(args[2]);
+    files.ins = args[2];
+  }
+  if (args[1] == kNotOK) base::fatal(base::ec::kBadArguments, {"DOR_VOR"});
+  require_existing(args[1]);
+  {
+    const envisat::EnvisatTypes orbit(args[1]);
+    if (!orbit.is_dorvor() && !orbit.is_dorpor()) base::fatal(base::ec::kBadArguments, {"DOR_VOR"});
+  }
+
+  if (IMreadpars(parameterFile, par, proc, dc, az, files, flags) != 0)
+    base::fatal(base::ec::kStageFailed, {"IMreadpars_kelvor()"});
+
+  files.level0 = args[0];
+  files.orbit = args[1];
+  par.slcPath = slcPath;
+  par.outputDir = directory_of(slcPath);
+  par.extrPath = par.outputDir + "/EXTR";
+  par.rgfPath = par.extrPath + ".rgf";
+  par.reportPath = par.outputDir + "/report.bin";
+
+  flags[kStageCleanup] = 1;
+  if (IMprocessor(par, proc, dc, az, files, flags) != 0)
+    base::fatal(base::ec::kStageFailed, {"IMprocessor()", failed_stage()});
+
+  const std::string headerPath = slcPath + "_hdr";
+  if (IMwritepars(headerPath, par, proc, files) != 0)
+    base::fatal(base::ec::kStageFailed, {"IMwritepars_kelvor()", failed_stage()});
+  errno = 0;
+
+  if (args[12] == "OK") {
+    base::SetActivityLabel("Tiff generation ...");
+    const std::string label = base::activity_label();
+    base::getAndSetPerc(-1, 0, &label);
+    base::getAndSetPerc(-1, 0, nullptr);
+    (void)quickLook1;
+    (void)quickLook2;
+    if (stage_not_built("quick-look GeoTIFF") != 0)
+      base::fatal(base::ec::kStageFailed, {"GeoTIFF", failed_stage()});
+  }
+  return 0;
+}
+
+}  // namespace sar::jobs

@@ -1,0 +1,166 @@
+#include "jobs/setup.hpp"
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <stdexcept>
+
+#include "jobs/drivers.hpp"
+
+namespace sar::jobs {
+namespace fs = std::filesystem;
+
+namespace {
+
+struct ModeInfo {
+  const char* mode;
+  const char* prefix;
+  const char* parameterFile;
+};
+constexpr ModeInfo kModeInfo[] = {
+    {"IM", "main_focussing_asar_IM#", "parameters_IM.hdr"}, {"AP", "main_focussing_asar_AP#", "parameters_AP.hdr"},
+    {"WS", "main_focussing_asar_WS#", "parameters_WS.hdr"}, {"RS", "main_focussing_asar_RS#", "parameters_RS.hdr"},
+    {"WSS", "main_multilook_WSS#", "parameters_multilook.hdr"}};
+
+const ModeInfo& mode_info(const std::string& mode) {
+  for (const auto& m : kModeInfo)
+    if (mode == m.mode) return m;
+  throw std::invalid_argument("unknown mode '" + mode + "' (IM, AP, WS, RS or WSS)");
+}
+
+std::string slash(const fs::path& p) {
+  std::string s = p.string();
+  if (s.empty() || s.back() != '/') s.push_back('/');
+  return s;
+}
+
+// Default job arguments: inputs not given, a root name in the working directory, a 1024 x 1024
+// quick-look requested at scale 1.
+std::vector<std::string> default_arguments(const fs::path& dir) {
+  std::vector<std::string> a(kMinJobArguments, std::string(kNotOK));
+  a[4] = (dir / "product").string();
+  a[5] = "1024";
+  a[6] = "1024";
+  a[8] = "0";
+  a[9] = "0";
+  a[12] = "OK";
+  a[13] = "1.0";
+  return a;
+}
+
+}  // namespace
+
+std::string default_data_dir() {
+  if (const char* d = std::getenv("SAR_DATA_DIR"); d && *d) return d;
+#ifdef SAR_SHIPPED_DATA_DIR
+  return SAR_SHIPPED_DATA_DIR;
+#else
+  return "data";
+#endif
+}
+
+std::string command_for(const std::string& mode, const std::string& listPath) {
+  return std::string(mode_info(mode).prefix) + listPath;
+}
+
+std::string setup_working_dir(const SetupRequest& request) {
+  const ModeInfo& mode = mode_info(request.mode);
+  const fs::path dir = fs::absolute(request.dir);
+  const fs::path data = fs::absolute(request.dataDir.empty() ? default_data_dir() : request.dataDir);
+  const fs::path des = dir / "des";
+  fs::create_directories(des);
+
+  // Parameter files and catalogues are copied, not linked, so that a job's tuning stays with it.
+  for (const auto& entry : fs::directory_iterator(data)) {
+    const std::string ext = entry.path().extension().string();
+    if (entry.is_regular_file() && (ext == ".hdr" || ext == ".des" || ext == ".dat")) {
+      const fs::path target = des / entry.path().filename();
+      if (!fs::exists(target)) fs::copy_file(entry.path(), target);
+    }
+  }
+
+  {
+    std::ofstream ini(dir / "Vanterra_configuration.ini", std::ios::trunc);
+    const std::string d = slash(dir);
+    ini << d << "keys/\n"                    // key files
+        << d << "mandatory/\n"               // mandatory files
+        << d << "\n"                         // working directory
+        << d << "\n"                         // program directory
+        << d << "maps/\n"                    // map projections
+        << slash(des) << "\n"                // description directory
+        << d << "gcp/\n"                     // ground control points
+        << slash(des) << "\n"                // processing core description files
+        << slash(des) << "\n"                // further description files
+        << slash(des) << "\n"                // XML schemas
+        << "m\n"                             // byte order of written files: big-endian
+        << (request.tracing ? "ACTIVE" : "INACTIVE") << "\n"
+        << "\n"                              // reserved
+        << "NaN\n";                          // null value of rasters
+  }
+
+  std::vector<std::string> args = default_arguments(dir);
+  for (std::size_t i = 0; i < request.arguments.size() && i < args.size(); ++i)
+    if (!request.arguments[i].empty()) args[i] = request.arguments[i];
+  const fs::path list = dir / "job.txt";
+  {
+    std::ofstream out(list, std::ios::trunc);
+    out << "job list for " << mode.prefix << " (this first line is not read)\n";
+    for (const auto& a : args) out << a << "\n";
+    out << "#\n";
+  }
+  std::ofstream(dir / "Vanterra.working", std::ios::trunc) << "0\n-\n";
+  std::error_code ec;
+  fs::remove(dir / "Vanterra.working_error", ec);
+  fs::remove(dir / "Vanterra.working_tmp", ec);
+  (void)mode.parameterFile;
+  return list.string();
+}
+
+int setup_main(int argc, char** argv) {
+  if (argc < 1) {
+    std::fprintf(stderr, "usage: focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--data DIR] [--trace] "
+                         "[--arg N=VALUE]...\n");
+    return 2;
+  }
+  SetupRequest req;
+  req.dir = argv[0];
+  try {
+    for (int i = 1; i < argc; ++i) {
+      const std::string a = argv[i];
+      auto value = [&]() -> std::string {
+        if (i + 1 >= argc) throw std::invalid_argument(a + " needs a value");
+        return argv[++i];
+      };
+      if (a == "--mode") {
+        req.mode = value();
+      } else if (a == "--data") {
+        req.dataDir = value();
+      } else if (a == "--trace") {
+        req.tracing = true;
+      } else if (a == "--arg") {
+        const std::string v = value();
+        const auto eq = v.find('=');
+        if (eq == std::string::npos) throw std::invalid_argument("--arg takes N=VALUE");
+        const int n = std::stoi(v.substr(0, eq));
+        if (n < 0 || n >= static_cast<int>(kMinJobArguments)) throw std::invalid_argument("--arg index 0..13");
+        if (req.arguments.size() <= static_cast<std::size_t>(n)) req.arguments.resize(static_cast<std::size_t>(n) + 1);
+        req.arguments[static_cast<std::size_t>(n)] = v.substr(eq + 1);
+      } else {
+        throw std::invalid_argument("unknown option " + a);
+      }
+    }
+    const std::string list = setup_working_dir(req);
+    const std::string dir = fs::absolute(req.dir).string();
+    std::printf("Working directory laid out in %s\n", dir.c_str());
+    std::printf("Edit the job list %s, then run:\n", list.c_str());
+    std::printf("  VANTERRA_INIT_DIR=%s focussing \"%s\"\n", dir.c_str(), command_for(req.mode, list).c_str());
+    return 0;
+  } catch (const std::exception& e) {
+    std::fprintf(stderr, "focussing --setup: %s\n", e.what());
+    return 2;
+  }
+}
+
+}  // namespace sar::jobs

@@ -1,0 +1,64 @@
+#pragma once
+// Processing stages as the job drivers call them. Stages that this build does not hold yet are
+// reported as such and fail, so that a job stops cleanly at the first of them with the
+// stage-failure code and the stage's name in the error record.
+#include <array>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "doppler/dcestconf.hpp"
+#include "envisat/records.hpp"
+#include "stripmap/procparm.hpp"
+
+namespace sar::jobs {
+
+/// The status a stage returns for a rejected input.
+inline constexpr int kStageRejected = 10;
+
+/// Name of the last stage that failed in this job (empty when none did).
+const std::string& failed_stage();
+void note_failed_stage(std::string_view name);
+
+/// Report that a stage is not available in this build and return kStageRejected.
+int stage_not_built(std::string_view name);
+
+/// Stage flags of a stripmap job.
+enum ImStage : std::size_t {
+  kStageExtract = 0,
+  kStageRangeFocus = 1,
+  kStageCalibration = 2,
+  kStageDoppler = 3,
+  kStageAzimuth = 4,
+  kStageSpare5 = 5,
+  kStageCleanup = 6,
+  kStageSpare7 = 7,
+};
+using StageFlags = std::array<int32_t, 8>;
+
+using envisat::enviauxfiles;
+using envisat::sarpar;
+using stripmap::azimuthconf;
+using stripmap::procparm;
+using doppler::dcestconf;
+
+// Stages of the stripmap chain, in the order the IM job calls them.
+int envi_extract(const enviauxfiles& files, sarpar& par);
+int envi_orbit(const std::string& orbitPath, sarpar& par, procparm& proc);
+int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, procparm& proc);
+int envi_syntchirp(sarpar& par, procparm& proc);
+int init_buffer(sarpar& par, procparm& proc);
+int rangefoc(sarpar& par, procparm& proc);
+int EstDopplerENVI(const std::string& orbitPath, double midRangeTime, double nearRangeTime, double attitude1,
+                   double attitude2, double wavelength, double a0, double a1, double a2, double a3, procparm& proc);
+int getnadcpoly(const std::string& input, dcestconf& conf, procparm& proc);
+int getgeopoly(sarpar& par, procparm& proc);
+int IMCalibration(sarpar& par, procparm& proc);
+int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az);
+int dest_buffer(sarpar& par, procparm& proc);
+int get_coords(procparm& proc, sarpar& par);
+int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const enviauxfiles& files);
+/// Auxiliary lookup by the product's sensing start: `kind` is "ASA_INS" or "ASA_XCA".
+int find_aux(const std::string& product, const std::string& desDir, std::string_view kind, std::string& result);
+
+}  // namespace sar::jobs

@@ -1,0 +1,66 @@
+#pragma once
+// The record that carries a stripmap job from stage to stage, and the azimuth configuration.
+#include <array>
+#include <cstdint>
+#include <vector>
+
+namespace sar::stripmap {
+
+/// Nine doubles a0..a8: f = a0 + a1 x + a2 y + a3 x y + a4 x^2 + a5 x^3 + a6 x^4,
+/// x = range time - a7, y = azimuth time - a8.
+using DopplerPoly = std::array<double, 9>;
+
+/// A located point of the scene: times and geographic coordinates (degrees).
+struct LocatedPoint {
+  double rangeTime = 0.0;
+  double azimuthTime = 0.0;
+  double latitude = 0.0;
+  double longitude = 0.0;
+};
+
+struct procparm {
+  int32_t progressFlag = 0;
+  int32_t rangeSamples = 0;
+  int32_t lines = 0;
+  int32_t focusedSamples = 0;
+  int32_t focusedLines = 0;
+  // near-early, far-early, near-late, far-late, centre
+  std::array<LocatedPoint, 5> corners{};
+  double centreIncidence = 0.0;
+  double centreLook = 0.0;
+  DopplerPoly dopplerCentroid{};
+  DopplerPoly dopplerRate{};
+  DopplerPoly outputCentroid{};
+  DopplerPoly outputRate{};
+  DopplerPoly lookAngle{};
+  DopplerPoly incidenceAngle{};
+  double centroidOverride = 0.0;
+  int32_t Report_level = 0;
+  int32_t Flag_ortog = 0;
+  int32_t Flag_swstal = 0;
+  int32_t Flag_incore = 0;
+  int32_t Azblk = 0;
+};
+
+/// Section "AzimuthConf". Bandwidths are fractions of the sampling rate (range) or PRF (azimuth)
+/// in the file; the azimuth stage scales them to Hz for its run.
+struct azimuthconf {
+  double AntennaLength = 0.0;
+  int32_t WhiteningFlag = 0;
+  double RangeWindowHammingParameter = 0.0;
+  double AzimuthWindowHammingParameter = 0.0;
+  double RangeLookBandwidth = 0.0;
+  double AzimuthLookBandwidth = 0.0;
+  double RangeTransitionBandwidth = 0.0;
+  double AzimuthTransitionBandwidth = 0.0;
+  int32_t LinesInBlock = 0;
+  int32_t SamplesInBlock = 0;
+  int32_t RangeOverlap = 0;    // stored halved
+  int32_t AzimuthOverlap = 0;  // stored halved
+  int32_t PerformInterpolation = 0;
+  double StoltPadding = 0.0;
+  double azimuthShift = 0.0;
+  double rangeShift = 0.0;
+};
+
+}  // namespace sar::stripmap
