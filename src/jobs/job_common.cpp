@@ -29,6 +29,8 @@ std::vector<std::string> start_job(const std::string& listPath, std::string_view
     }
   }
   base::PrintStartBanner(args, title, &text);
+  // Tell the host at once that the job runs, and honour a stop it asked for before we started.
+  base::waitbar_open("Checking job inputs");
   return args;
 }
 

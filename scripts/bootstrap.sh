@@ -1,0 +1,23 @@
+#!/usr/bin/env bash
+# Install the Debian packages the engine needs (only those missing), then configure and build.
+# Idempotent: a second run installs nothing and rebuilds only what changed.
+set -euo pipefail
+here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
+build="${SAR_BUILD_DIR:-$here/build}"
+
+packages=(build-essential cmake pkg-config libfftw3-dev libeigen3-dev libxml2-dev libtiff-dev
+          libgeotiff-dev libgtest-dev libgmock-dev libbenchmark-dev gdal-bin)
+missing=()
+for p in "${packages[@]}"; do
+  dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q "install ok installed" || missing+=("$p")
+done
+if ((${#missing[@]})); then
+  echo "Installing: ${missing[*]}"
+  sudo=""
+  [ "$(id -u)" -eq 0 ] || sudo="sudo"
+  $sudo apt-get update -qq
+  DEBIAN_FRONTEND=noninteractive $sudo apt-get install -y -qq --no-install-recommends "${missing[@]}"
+fi
+
+cmake -S "$here" -B "$build" -DCMAKE_BUILD_TYPE=Release >/dev/null
+cmake --build "$build" -j"$(nproc)"
