@@ -11,12 +11,14 @@ int main(int argc, char** argv) {
   if (argc < 2) {
     std::fprintf(stderr,
                  "usage: focussing \"main_focussing_asar_IM#/path/job.txt\"\n"
-                 "       focussing --setup DIR [--mode IM|AP|WS|RS|WSS]\n"
+                 "       focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--aux DIR]... [--arg N=VALUE]...\n"
+                 "       focussing --aux-index DESDIR AUXDIR...\n"
                  "Modes: main_focussing_asar_IM#, main_focussing_asar_AP#, main_focussing_asar_WS#,\n"
                  "       main_focussing_asar_RS#, main_multilook_WSS#\n");
     return 2;
   }
   if (std::strcmp(argv[1], "--setup") == 0) return sar::jobs::setup_main(argc - 2, argv + 2);
+  if (std::strcmp(argv[1], "--aux-index") == 0) return sar::jobs::aux_index_main(argc - 2, argv + 2);
   if (std::strcmp(argv[1], "--version") == 0) {
     std::printf("%s\n", "focussing (VanterraFocRadarsatASARPalsar ENVI 3.0.000.003)");
     return 0;

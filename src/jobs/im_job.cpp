@@ -10,6 +10,7 @@
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
 #include "envisat/product_types.hpp"
+#include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 #include "jobs/job_common.hpp"
 
@@ -201,7 +202,10 @@ int main_focussing_asar_im(const std::string& listPath) {
     files.xca = args[3];
   }
   if (args[2] == kNotOK) {
-    if (find_aux(args[0], desDir, "ASA_INS", files.ins) != 0) base::fatal(base::ec::kStageFailed, {"find_aux()"});
+    if (find_aux(args[0], desDir, "ASA_INS", files.ins) != 0) {
+      note_failed_stage("find_aux");
+      base::fatal(base::ec::kStageFailed, {"find_aux()"});
+    }
   } else {
     require_existing(args[2]);
     files.ins = args[2];

@@ -7,6 +7,7 @@
 #include <fstream>
 #include <stdexcept>
 
+#include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 
 namespace sar::jobs {
@@ -75,11 +76,16 @@ std::string setup_working_dir(const SetupRequest& request) {
   // Parameter files and catalogues are copied, not linked, so that a job's tuning stays with it.
   for (const auto& entry : fs::directory_iterator(data)) {
     const std::string ext = entry.path().extension().string();
-    if (entry.is_regular_file() && (ext == ".hdr" || ext == ".des" || ext == ".dat")) {
+    if (entry.is_regular_file() && (ext == ".hdr" || ext == ".des")) {
       const fs::path target = des / entry.path().filename();
       if (!fs::exists(target)) fs::copy_file(entry.path(), target);
     }
   }
+
+  // The auxiliary index names files relative to the description directory, so it is written
+  // anew for this one: from the archives asked for, else from the shipped index.
+  write_aux_index(request.auxDirs.empty() ? read_aux_index(slash(data)) : scan_aux_products(request.auxDirs),
+                  slash(des));
 
   {
     std::ofstream ini(dir / "Vanterra_configuration.ini", std::ios::trunc);
@@ -118,9 +124,22 @@ std::string setup_working_dir(const SetupRequest& request) {
   return list.string();
 }
 
+int aux_index_main(int argc, char** argv) {
+  if (argc < 2) {
+    std::fprintf(stderr, "usage: focussing --aux-index DESDIR AUXDIR...\n");
+    return 2;
+  }
+  const std::vector<std::string> dirs(argv + 1, argv + argc);
+  const auto entries = scan_aux_products(dirs);
+  write_aux_index(entries, slash(fs::absolute(argv[0])));
+  std::printf("%zu auxiliary products indexed in %s%s\n", entries.size(), slash(fs::absolute(argv[0])).c_str(),
+              std::string(kAuxIndexFile).c_str());
+  return 0;
+}
+
 int setup_main(int argc, char** argv) {
   if (argc < 1) {
-    std::fprintf(stderr, "usage: focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--data DIR] [--trace] "
+    std::fprintf(stderr, "usage: focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--data DIR] [--aux DIR]... [--trace] "
                          "[--arg N=VALUE]...\n");
     return 2;
   }
@@ -137,6 +156,8 @@ int setup_main(int argc, char** argv) {
         req.mode = value();
       } else if (a == "--data") {
         req.dataDir = value();
+      } else if (a == "--aux") {
+        req.auxDirs.push_back(value());
       } else if (a == "--trace") {
         req.tracing = true;
       } else if (a == "--arg") {

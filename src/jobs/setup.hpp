@@ -13,6 +13,7 @@ struct SetupRequest {
   std::string dataDir;        // shipped data folder; empty: the build's own
   std::vector<std::string> arguments;  // job arguments; missing ones are "NotOK" or defaults
   bool tracing = false;
+  std::vector<std::string> auxDirs;  // archives of ASA_INS/ASA_XCA/ASA_XCH to index
 };
 
 /// Create the layout; returns the job list path. Existing parameter files are kept.
@@ -23,6 +24,9 @@ std::string command_for(const std::string& mode, const std::string& listPath);
 
 /// `focussing --setup DIR [--mode M] [--data DIR] [--trace] [--arg N=VALUE ...]`
 int setup_main(int argc, char** argv);
+
+/// `focussing --aux-index DESDIR AUXDIR...`: index an auxiliary archive for DESDIR.
+int aux_index_main(int argc, char** argv);
 
 /// The shipped data folder of this build (parameter files, catalogues, templates).
 std::string default_data_dir();

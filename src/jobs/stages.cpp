@@ -43,11 +43,4 @@ int get_coords(procparm&, sarpar&) { return stage_not_built("get_coords"); }
 int IMwritepars(const std::string&, const sarpar&, const procparm&, const enviauxfiles&) {
   return stage_not_built("IMwritepars");
 }
-int find_aux(const std::string&, const std::string&, std::string_view kind, std::string&) {
-  base::TracePrintf("find_aux: no auxiliary index lookup in this build for %.*s\n", static_cast<int>(kind.size()),
-                    kind.data());
-  note_failed_stage("find_aux");
-  return kStageRejected;
-}
-
 }  // namespace sar::jobs

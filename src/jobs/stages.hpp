@@ -58,7 +58,5 @@ int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az);
 int dest_buffer(sarpar& par, procparm& proc);
 int get_coords(procparm& proc, sarpar& par);
 int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const enviauxfiles& files);
-/// Auxiliary lookup by the product's sensing start: `kind` is "ASA_INS" or "ASA_XCA".
-int find_aux(const std::string& product, const std::string& desDir, std::string_view kind, std::string& result);
 
 }  // namespace sar::jobs

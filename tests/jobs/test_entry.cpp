@@ -126,13 +126,21 @@ const EntryCase kCases[] = {
        return kIm + list_of(j, with_header(a));
      },
      456962, 7, "DOR_VOR", nullptr},
-    {"ins_lookup_fails",
+    {"ins_lookup_fails_without_index",
+     [](ScratchJob& j) {
+       auto a = im_args(j);
+       a[2] = "NotOK";
+       fs::remove(j.dir() / "des" / "ASA_AUX_list.dat");
+       return kIm + list_of(j, with_header(a));
+     },
+     130560, 2, "find_aux()", nullptr},
+    {"ins_found_in_index",
      [](ScratchJob& j) {
        auto a = im_args(j);
        a[2] = "NotOK";
        return kIm + list_of(j, with_header(a));
      },
-     130560, 2, "find_aux()", nullptr},
+     130560, 2, "IMprocessor()", nullptr},
 };
 
 class Entry : public ::testing::TestWithParam<EntryCase> {};
