@@ -143,6 +143,8 @@ const EntryCase kCases[] = {
      130560, 2, "IMprocessor()", nullptr},
 };
 
+void PrintTo(const EntryCase& c, std::ostream* os) { *os << c.name; }
+
 class Entry : public ::testing::TestWithParam<EntryCase> {};
 
 TEST_P(Entry, EndsWithTheHostsCodeStatusAndRecord) {
