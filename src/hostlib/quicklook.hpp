@@ -1,0 +1,50 @@
+#pragma once
+// Quick-look GeoTIFF: an 8-bit amplitude rendering of a complex image, reduced by averaging
+// power over blocks, scaled robustly (the median amplitude sets the grey level), and tied to
+// the ground by the geographic coordinates of the image corners (WGS84).
+#include <array>
+#include <complex>
+#include <cstdint>
+#include <functional>
+#include <span>
+#include <string>
+
+namespace sar::hostlib {
+
+/// Geographic position of an image corner, degrees.
+struct GeoCorner {
+  double latitude = 0.0;
+  double longitude = 0.0;
+};
+
+struct QuickLookRequest {
+  int maxWidth = 1024;        // output fits in maxWidth x maxHeight, aspect kept
+  int maxHeight = 1024;
+  double scale = 1.0;         // brightness factor: grey = scale * amplitude / median * maxValue / 4
+  double rangeSpacing = 1.0;  // metres per input sample, for the aspect ratio
+  double azimuthSpacing = 1.0;  // metres per input line
+  int maxValue = 254;         // brightest grey; 0 is kept for "no data"
+  /// Corners in the order near-early, far-early, near-late, far-late (first line first
+  /// sample, first line last sample, last line first sample, last line last sample).
+  std::array<GeoCorner, 4> corners{};
+  bool georeferenced = true;
+};
+
+/// Reads input line `line` (0-based) into `row` (samples values); false on failure.
+using ComplexRowSource = std::function<bool(int line, std::span<std::complex<float>> row)>;
+
+struct QuickLookResult {
+  int width = 0;
+  int height = 0;
+  double medianAmplitude = 0.0;
+};
+
+/// Render `lines` x `samples` complex samples to `outPath`. Returns 0, or 10 when the input
+/// cannot be read or the file cannot be written (nothing is left behind then).
+int write_quicklook_geotiff(const std::string& outPath, int lines, int samples, const ComplexRowSource& source,
+                            const QuickLookRequest& request, QuickLookResult* result = nullptr);
+
+/// Output size for an input of `lines` x `samples` under `request` (each at least 1).
+std::array<int, 2> quicklook_size(int lines, int samples, const QuickLookRequest& request);
+
+}  // namespace sar::hostlib
