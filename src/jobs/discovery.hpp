@@ -1,0 +1,28 @@
+#pragma once
+// Finding the orbit file that covers a product, in a folder of orbit files.
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace sar::jobs {
+
+/// An orbit product found by its header.
+struct OrbitCandidate {
+  std::string path;
+  std::string name;  // MPH product name
+  int preference = 0;  // 0 DOR_VOR, 1 DOR_POR, 2 AUX_FPO, 3 AUX_FRO
+  double start = 0.0;  // validity, sec85
+  double stop = 0.0;
+};
+
+/// Orbit products below `dir`, typed by their MPH product name.
+std::vector<OrbitCandidate> scan_orbit_products(const std::string& dir);
+
+/// The orbit whose validity strictly holds `sensingStart` (sec85): precise before preliminary
+/// (DOR_VOR, DOR_POR, AUX_FPO, AUX_FRO), then the newest issue. nullopt when none covers it.
+std::optional<OrbitCandidate> choose_orbit(const std::vector<OrbitCandidate>& candidates, double sensingStart);
+
+/// Sensing start (sec85) of an ENVISAT product, from its MPH; nullopt when unreadable.
+std::optional<double> product_sensing_start(const std::string& product);
+
+}  // namespace sar::jobs
