@@ -8,6 +8,7 @@
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "base/run_services.hpp"
+#include "io/cell_types.hpp"
 #include "jobs/drivers.hpp"
 
 namespace sar::jobs {
@@ -57,6 +58,9 @@ int focussing_entry(std::string command) {
   } catch (const base::ProcessExit& e) {
     return e.status;
   }
+
+  // Rasters are written in the byte order the configuration asks for.
+  io::set_raster_settings({io::byte_order_from_name(base::env_lookup("VANTERRA_DEFAULT_BYTE_ORDER").value_or(""))});
 
   command = base::cut_at_host_separator(command);
   if (base::init_ckerr_locking() != 0) {

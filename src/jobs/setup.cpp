@@ -100,7 +100,7 @@ std::string setup_working_dir(const SetupRequest& request) {
         << slash(des) << "\n"                // processing core description files
         << slash(des) << "\n"                // further description files
         << slash(des) << "\n"                // XML schemas
-        << "m\n"                             // byte order of written files: big-endian
+        << "LSBFirst\n"                      // byte order of written rasters ("MSBFirst": big-endian)
         << (request.tracing ? "ACTIVE" : "INACTIVE") << "\n"
         << "\n"                              // reserved
         << "NaN\n";                          // null value of rasters
