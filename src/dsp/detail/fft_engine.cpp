@@ -1,0 +1,253 @@
+#include "dsp/detail/fft_engine.hpp"
+
+#include <algorithm>
+#include <atomic>
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <thread>
+#include <utility>
+
+#ifdef _OPENMP
+#include <omp.h>
+#endif
+
+namespace sar::dsp::detail {
+namespace {
+
+// A chunk holds about this many samples (2 MiB): large enough that FFTW's loop overhead
+// vanishes, small enough that the normalisation pass finds the chunk in cache.
+constexpr std::int64_t kChunkSamples = std::int64_t{1} << 18;
+// Chunks are whole multiples of this many transforms, so that every chunk start keeps the
+// SIMD alignment of the array start (8 samples = 64 bytes).
+constexpr int kChunkQuantum = 8;
+// Below this many samples a stage runs on the calling thread alone.
+constexpr std::int64_t kParallelSamples = std::int64_t{1} << 17;
+
+int default_threads() {
+#ifdef _OPENMP
+  return std::max(1, omp_get_max_threads());
+#else
+  return std::max(1, static_cast<int>(std::thread::hardware_concurrency()));
+#endif
+}
+
+std::atomic<int> g_threads{0};
+std::atomic<unsigned> g_flags{FFTW_MEASURE};
+
+// The planner lock outlives the cache: it is constructed first (the cache's constructor asks
+// for it), so plans destroyed while the cache is torn down at exit can still take it.
+std::mutex& planner_mutex() {
+  static std::mutex m;
+  return m;
+}
+
+struct PlanCache {
+  PlanCache() {
+    std::lock_guard lock(planner_mutex());
+    fftwf_init_threads();
+  }
+  std::map<PlanKey, std::shared_ptr<const FftwPlan>> plans;
+};
+
+PlanCache& cache() {
+  static PlanCache c;
+  return c;
+}
+
+// Aligned scratch of FFTW's allocator, freed on scope exit.
+struct Scratch {
+  explicit Scratch(std::size_t bytes) : p(static_cast<unsigned char*>(fftwf_malloc(bytes))) {}
+  ~Scratch() { fftwf_free(p); }
+  Scratch(const Scratch&) = delete;
+  Scratch& operator=(const Scratch&) = delete;
+  unsigned char* p;
+};
+
+std::int64_t extent(const BatchShape& s) {
+  return static_cast<std::int64_t>(s.howmany - 1) * s.dist + static_cast<std::int64_t>(s.n - 1) * s.stride + 1;
+}
+
+// Runs fn(i) for i in [0, count) on up to `threads` threads.
+template <class Fn>
+void parallel_for(int count, int threads, Fn&& fn) {
+  threads = std::min(threads, count);
+  if (threads <= 1) {
+    for (int i = 0; i < count; ++i) fn(i);
+    return;
+  }
+#ifdef _OPENMP
+#pragma omp parallel for num_threads(threads) schedule(static)
+  for (int i = 0; i < count; ++i) fn(i);
+#else
+  std::vector<std::jthread> workers;
+  workers.reserve(static_cast<std::size_t>(threads - 1));
+  auto slice = [&](int t) {
+    const int lo = static_cast<int>(static_cast<std::int64_t>(count) * t / threads);
+    const int hi = static_cast<int>(static_cast<std::int64_t>(count) * (t + 1) / threads);
+    for (int i = lo; i < hi; ++i) fn(i);
+  };
+  for (int t = 1; t < threads; ++t) workers.emplace_back(slice, t);
+  slice(0);
+#endif
+}
+
+void scale_samples(fcomplex* p, std::int64_t count, double f) {
+  float* v = reinterpret_cast<float*>(p);
+  const std::int64_t m = 2 * count;
+  for (std::int64_t i = 0; i < m; ++i) v[i] = static_cast<float>(static_cast<double>(v[i]) * f);
+}
+
+}  // namespace
+
+int engine_threads() {
+  const int t = g_threads.load(std::memory_order_relaxed);
+  return t > 0 ? t : default_threads();
+}
+
+void set_engine_threads(int threads) { g_threads.store(threads > 0 ? threads : 0, std::memory_order_relaxed); }
+
+unsigned planner_flags() { return g_flags.load(std::memory_order_relaxed); }
+
+void set_planner_flags(unsigned flags) { g_flags.store(flags, std::memory_order_relaxed); }
+
+int alignment_of(const fcomplex* p) {
+  return fftwf_alignment_of(const_cast<float*>(reinterpret_cast<const float*>(p)));
+}
+
+FftwPlan::FftwPlan(const PlanKey& key) {
+  const BatchShape& s = key.shape;
+  if (s.n < 1 || s.howmany < 1 || s.stride < 1 || s.dist < 1) return;
+  const std::size_t bytes = static_cast<std::size_t>(extent(s)) * sizeof(fcomplex) + 64;
+  // Planning with FFTW_MEASURE overwrites its arrays: plan on scratch with the caller's
+  // alignment class so that the plan is valid for the caller's arrays later.
+  Scratch in(bytes);
+  Scratch out(key.inPlace ? 0 : bytes);
+  if (!in.p || (!key.inPlace && !out.p)) return;
+  auto* pin = reinterpret_cast<fftwf_complex*>(in.p + key.alignIn);
+  auto* pout = key.inPlace ? pin : reinterpret_cast<fftwf_complex*>(out.p + key.alignOut);
+  int n = s.n;
+  std::lock_guard lock(planner_mutex());
+  fftwf_plan_with_nthreads(key.threads);
+  plan_ = fftwf_plan_many_dft(1, &n, s.howmany, pin, nullptr, s.stride, s.dist, pout, nullptr, s.stride, s.dist,
+                              s.sign, key.flags);
+}
+
+FftwPlan::~FftwPlan() {
+  if (!plan_) return;
+  std::lock_guard lock(planner_mutex());
+  fftwf_destroy_plan(plan_);
+}
+
+void FftwPlan::execute(const fcomplex* in, fcomplex* out) const {
+  // c2c out-of-place plans preserve their input (FFTW's default), so the cast is sound.
+  fftwf_execute_dft(plan_, reinterpret_cast<fftwf_complex*>(const_cast<fcomplex*>(in)),
+                    reinterpret_cast<fftwf_complex*>(out));
+}
+
+std::shared_ptr<const FftwPlan> cached_plan(const PlanKey& key) {
+  PlanCache& c = cache();
+  {
+    std::lock_guard lock(planner_mutex());
+    auto it = c.plans.find(key);
+    if (it != c.plans.end()) return it->second;
+  }
+  // Planned outside the cache lock's scope; FftwPlan takes the planner lock itself. Two
+  // threads planning the same key both plan, and the first to insert wins.
+  auto plan = std::make_shared<const FftwPlan>(key);
+  if (!plan->valid()) return nullptr;
+  std::lock_guard lock(planner_mutex());
+  auto [it, inserted] = c.plans.emplace(key, plan);
+  return it->second;
+}
+
+std::size_t cached_plan_count() {
+  PlanCache& c = cache();
+  std::lock_guard lock(planner_mutex());
+  return c.plans.size();
+}
+
+void clear_plan_cache() {
+  std::map<PlanKey, std::shared_ptr<const FftwPlan>> old;
+  {
+    std::lock_guard lock(planner_mutex());
+    old.swap(cache().plans);
+  }
+  // `old` dies here, outside the lock: each plan's destructor takes the lock itself.
+}
+
+std::shared_ptr<const Stage> Stage::make(const BatchShape& shape, bool inPlace) {
+  if (shape.n < 1 || shape.howmany < 1 || shape.stride < 1 || shape.dist < 1) return nullptr;
+  int chunk = shape.howmany;
+  const std::int64_t perChunk = kChunkSamples / shape.n;
+  if (perChunk < shape.howmany) {
+    chunk = static_cast<int>(std::max<std::int64_t>(kChunkQuantum, perChunk / kChunkQuantum * kChunkQuantum));
+    chunk = std::min(chunk, shape.howmany);
+  }
+  auto stage = std::make_shared<Stage>(shape, chunk);
+  const int threads = engine_threads();
+  auto full = cached_plan(stage->key_for(chunk, inPlace, 0, 0, threads));
+  if (!full) return nullptr;
+  stage->warm_.push_back(std::move(full));
+  if (const int rest = shape.howmany % chunk; rest != 0) {
+    auto tail = cached_plan(stage->key_for(rest, inPlace, 0, 0, threads));
+    if (!tail) return nullptr;
+    stage->warm_.push_back(std::move(tail));
+  }
+  return stage;
+}
+
+int Stage::planner_threads_for(int threads) const {
+  // A stage that is one chunk cannot be spread over chunks: let FFTW split it when large.
+  const bool single = chunk_ == shape_.howmany;
+  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
+  return (single && samples >= kParallelSamples) ? threads : 1;
+}
+
+PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int threads) const {
+  PlanKey k;
+  k.shape = shape_;
+  k.shape.howmany = howmany;
+  k.inPlace = inPlace;
+  k.alignIn = alignIn;
+  k.alignOut = inPlace ? alignIn : alignOut;
+  k.threads = planner_threads_for(threads);
+  k.flags = planner_flags();
+  return k;
+}
+
+void Stage::run(const fcomplex* in, fcomplex* out, double scale) const {
+  const bool inPlace = in == out;
+  const int ai = alignment_of(in);
+  const int ao = alignment_of(out);
+  const int threads = engine_threads();
+  const int chunks = (shape_.howmany + chunk_ - 1) / chunk_;
+  const int rest = shape_.howmany % chunk_;
+  auto full = cached_plan(key_for(chunk_, inPlace, ai, ao, threads));
+  auto tail = rest != 0 ? cached_plan(key_for(rest, inPlace, ai, ao, threads)) : nullptr;
+  if (!full || (rest != 0 && !tail)) return;
+
+  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
+  const int workers = (chunks > 1 && samples >= kParallelSamples) ? threads : 1;
+  const std::int64_t step = static_cast<std::int64_t>(chunk_) * shape_.dist;
+  parallel_for(chunks, workers, [&](int c) {
+    const std::int64_t offset = step * c;
+    const bool last = c == chunks - 1 && rest != 0;
+    const int count = last ? rest : chunk_;
+    (last ? *tail : *full).execute(in + offset, out + offset);
+    if (scale == 1.0) return;
+    fcomplex* base = out + offset;
+    if (shape_.stride == 1) {
+      for (int t = 0; t < count; ++t) scale_samples(base + static_cast<std::int64_t>(t) * shape_.dist, shape_.n, scale);
+    } else if (shape_.dist == 1) {
+      for (int e = 0; e < shape_.n; ++e) scale_samples(base + static_cast<std::int64_t>(e) * shape_.stride, count, scale);
+    } else {
+      for (int t = 0; t < count; ++t)
+        for (int e = 0; e < shape_.n; ++e)
+          scale_samples(base + static_cast<std::int64_t>(t) * shape_.dist + static_cast<std::int64_t>(e) * shape_.stride,
+                        1, scale);
+    }
+  });
+}
+
+}  // namespace sar::dsp::detail

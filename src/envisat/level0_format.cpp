@@ -1,0 +1,179 @@
+// Byte layer of ASAR level 0 products.
+#include "envisat/level0_format.hpp"
+
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <string_view>
+#include <vector>
+
+#include "base/convert.hpp"
+#include "base/errors.hpp"
+#include "envisat/product_types.hpp"
+
+namespace sar::envisat {
+
+namespace {
+
+constexpr std::array<ModeInfo, 6> kModes = {{
+    {"IM", 1, 84, 1556, 1, 6},
+    {"WS", 5, 91, 1563, 15, 4},
+    {"APC", 2, 103, 1543, 1, 6},
+    {"APH", 2, 104, 1544, 1, 6},
+    {"APV", 2, 164, 1549, 1, 6},
+    {"GM", 5, 171, 1387, 15, 4},
+}};
+
+int u16(HeadBytes h, std::size_t at) { return (int{h[at]} << 8) | int{h[at + 1]}; }
+std::uint32_t u32(HeadBytes h, std::size_t at) {
+  return (std::uint32_t{h[at]} << 24) | (std::uint32_t{h[at + 1]} << 16) | (std::uint32_t{h[at + 2]} << 8) |
+         std::uint32_t{h[at + 3]};
+}
+
+std::string fmt(const char* format, int a, int b) {
+  char text[128];
+  std::snprintf(text, sizeof text, format, a, b);
+  return text;
+}
+
+// Millionths of a degree as a signed decimal text ("+0039574766"); nullopt-like NaN-free: 0 when
+// the text holds no number, the latitude is an annotation and not worth failing for.
+double parse_latitude(std::string_view text) {
+  std::string s(text);
+  char* end = nullptr;
+  const double v = std::strtod(s.c_str(), &end);
+  return end == s.c_str() ? 0.0 : v;
+}
+
+}  // namespace
+
+const ModeInfo& mode_info(int mode) { return kModes.at(static_cast<std::size_t>(mode)); }
+bool is_alternating(int mode) { return mode == kModeAPC || mode == kModeAPH || mode == kModeAPV; }
+bool is_burst_mode(int mode) { return mode == kModeWS || mode == kModeGM; }
+
+PacketHead decode_packet_head(HeadBytes h) {
+  PacketHead p;
+  p.days = u32(h, l0::kSensingTime);
+  p.seconds = u32(h, l0::kSensingTime + 4);
+  p.microseconds = u32(h, l0::kSensingTime + 8);
+  p.time = sar::base::mjd2sec85(h.data() + l0::kSensingTime);
+  p.processId = ((h[l0::kProcessId] & 7) << 8) + h[l0::kProcessId + 1];
+  p.sequenceCount = ((h[l0::kSequenceCount] & 63) << 8) + h[l0::kSequenceCount + 1];
+  p.packetLength = u16(h, l0::kPacketLength);
+  p.fieldHeaderLength = u16(h, l0::kFieldHeaderLength);
+  p.modeId = h[l0::kModeId];
+  p.modeCounter = (int{h[l0::kModeCounter]} << 16) + (int{h[l0::kModeCounter + 1]} << 8) + h[l0::kModeCounter + 2];
+  p.beamCode = h[l0::kBeamCode] >> 2;
+  const int flags = h[l0::kFlags];
+  p.echo = (flags & 0x80) != 0;
+  p.noise = (flags & 0x40) != 0;
+  p.calibration = (flags & 0x30) == 0x30;
+  p.cyclePosition = ((flags & 15) << 8) + h[l0::kCyclePosition + 1];
+  p.priCode = u16(h, l0::kPriCode);
+  p.swstCode = u16(h, l0::kSwstCode);
+  p.swlCode = u16(h, l0::kSwlCode);
+  const int pol = h[l0::kPolarisationRow];
+  p.txV = (pol & 0x40) != 0;
+  p.rxV = (pol & 0x20) != 0;
+  p.calibrationRow = pol & 31;
+  p.pulseLengthCode = (int{h[l0::kPulseLength]} << 2) + (h[l0::kPulseLength + 1] >> 6);
+  p.chirpBandwidthCode = h[l0::kChirpBandwidth];
+  return p;
+}
+
+int check_packet_header(HeadBytes head, int mode, std::string* message) {
+  const ModeInfo& m = mode_info(mode);
+  const PacketHead p = decode_packet_head(head);
+  int score = 0;
+  std::string last;
+  const int counterLow = ((head[l0::kModeCounter + 1] & 63) << 8) + head[l0::kModeCounter + 2];
+  if (counterLow != p.sequenceCount) {
+    score += l0::kScoreCounter;
+    last = fmt("Counter ERROR: MODE COUNTER=%d, SEQ_COUNT=%d.\n", counterLow, p.sequenceCount);
+  }
+  if (p.processId != m.processId) {
+    score += l0::kScoreProcessId;
+    last = fmt("ApplicationID ERROR: read=%d, expected=%d\n", p.processId, m.processId);
+  }
+  if (p.modeId != m.modeId) {
+    score += l0::kScoreModeId;
+    last = fmt("ModeID ERROR: read=%d, expected=%d\n", p.modeId, m.modeId);
+  }
+  if (p.fieldHeaderLength != l0::kFieldHeaderBytes) {
+    score += l0::kScoreFieldHeader;
+    last = fmt("Header length ERROR: read=%d, expected=%d\n", p.fieldHeaderLength, l0::kFieldHeaderBytes);
+  }
+  const int swath = p.beamCode - m.beamOffset;
+  if (swath < 0 || swath > m.maxSwath) {
+    score += l0::kScoreSwath;
+    last = fmt("Swath %d out of range.\n", swath, 0);
+  }
+  if (message) *message = last;
+  return score;
+}
+
+Level0Header read_level0_header(const std::string& path) {
+  namespace fs = std::filesystem;
+  using sar::base::fatal;
+  namespace ec = sar::base::ec;
+  std::error_code err;
+  if (!fs::is_regular_file(path, err)) fatal(ec::kImageMissing, {path, "level 0 product not found"});
+  const auto size = fs::file_size(path, err);
+  if (err) fatal(ec::kFileIo, {path, "size of the level 0 product cannot be read"});
+
+  Level0Header h;
+  h.fileSize = static_cast<std::int64_t>(size);
+  if (h.fileSize < l0::kFirstMdsr) {
+    char where[96];
+    std::snprintf(where, sizeof where, "%lld bytes, headers need %lld", static_cast<long long>(h.fileSize),
+                  static_cast<long long>(l0::kFirstMdsr));
+    fatal(ec::kFileIo, {path, "level 0 product shorter than its headers", where});
+  }
+  std::vector<char> bytes(static_cast<std::size_t>(l0::kFirstMdsr));
+  std::ifstream in(path, std::ios::binary);
+  if (!in.read(bytes.data(), static_cast<std::streamsize>(bytes.size())))
+    fatal(ec::kFileIo, {path, "level 0 headers cannot be read"});
+  const std::string_view mph(bytes.data(), static_cast<std::size_t>(l0::kMphSize));
+  const std::string_view sph(bytes.data() + l0::kMphSize, static_cast<std::size_t>(l0::kSphSize));
+
+  // The product name as the typing reads it: up to the first blank or quote.
+  std::string_view name = mph.substr(kMphProductOffset, kMphProductLength);
+  name = name.substr(0, std::min(name.find_first_of(" \"\n"), name.size()));
+  h.product = std::string(name);
+  const std::array<int, 5> level0Types = {kAsaIm0, kAsaWs0, kAsaApc, kAsaAph, kAsaApv};
+  for (int t : level0Types)
+    if (h.product.starts_with(product_type_prefix(t))) h.productType = t;
+  if (h.productType == 0) fatal(ec::kBadArguments, {path, "not an ASAR level 0 product", h.product});
+
+  h.mode = -1;
+  for (int m = 0; m < static_cast<int>(kModes.size()); ++m) {
+    const std::string_view letters = kModes[static_cast<std::size_t>(m)].letters;
+    if (sph.substr(l0::kSphModeLetters, letters.size()) == letters) {
+      h.mode = m;
+      break;
+    }
+  }
+  const bool modeMatchesType = (h.mode == kModeIM && h.productType == kAsaIm0) ||
+                               (h.mode == kModeWS && h.productType == kAsaWs0) ||
+                               (is_alternating(h.mode) && (h.productType == kAsaApc || h.productType == kAsaAph ||
+                                                           h.productType == kAsaApv));
+  if (!modeMatchesType)
+    fatal(ec::kBadArguments, {path, "level 0 SPH mode letters do not match the product",
+                              std::string(sph.substr(l0::kSphModeLetters, 3))});
+  h.channels = mode_info(h.mode).channels;
+
+  const double startLat = parse_latitude(sph.substr(l0::kSphStartLat, l0::kSphLatWidth));
+  const double stopLat = parse_latitude(sph.substr(l0::kSphStopLat, l0::kSphLatWidth));
+  h.sceneCentreLatitude = (startLat + stopLat) * 5e-7;
+
+  const std::string_view pol = sph.substr(l0::kSphPolarisation, l0::kSphPolarisationWidth);
+  const std::array<std::string_view, 4> pols = {"H/H  ", "V/V  ", "H/V  ", "V/H  "};
+  for (int k = 0; k < 4; ++k)
+    if (pol == pols[static_cast<std::size_t>(k)]) h.polarizationType = k;
+  const char digit = sph[l0::kSphSwathDigit];
+  if (digit >= '0' && digit <= '9') h.swathDigit = digit - '0';
+  return h;
+}
+
+}  // namespace sar::envisat

@@ -1,0 +1,128 @@
+#pragma once
+// The test-product simulator: from a scene of point targets it writes an ENVISAT ASAR image
+// mode level 0 product, a DOR_VOR orbit file and a truth file, so that every later stage can be
+// checked against known geometry.
+//
+// Signal model. The packet of line l is stamped with the transmit time t_l = t_first + l / PRF of
+// the pulse whose echoes it holds (stop and go: the satellite is taken at S(t_l) for the whole
+// echo). A target at slant range R(t_l) returns the transmitted up-chirp
+//   exp(j pi K (u - Tp/2)^2), 0 <= u < Tp, u = tau - 2 R / c, K = B / Tp
+// times exp(-j 4 pi R / lambda), times the two-way azimuth pattern of a uniform antenna of
+// length L, sinc^2(L sin(theta) / lambda), with sin(theta) the cosine of the angle between the
+// line of sight and the Earth-fixed velocity (the antenna is steered to zero Doppler). Sample k
+// of a line lies at the two-way time
+//   tau_k = SWST / fs + rank / PRF - range_gate_bias + k / fs.
+// The sum over targets is multiplied by the receive gain g(k) that the decoder divides by, white
+// Gaussian noise is added, the result is quantised to 8 bits (levels at half-integers, -127.5 to
+// 127.5) and packed 8:4 with the simulator's FBAQ table.
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "simulator/orbit_model.hpp"
+
+namespace sar::simulator {
+
+struct Target {
+  Geodetic position;
+  double amplitude = 30.0;  // echo amplitude at beam centre, ADC counts
+};
+
+enum class Fault {
+  kLostPackets,    // five packets missing from the stream a third of the way in
+  kCorruptHeader,  // the head of the packet at the middle scores as lost synchronisation
+  kWrongModeId,    // one packet with a wrong mode identifier (a tolerated head error)
+  kSequenceWrap,   // the 14-bit source sequence count wraps at the middle of the product
+  kSwstChange,     // the sampling window start moves by 24 samples two thirds of the way in
+  kTruncated,      // the file ends inside a packet at about 85 % of the stream
+};
+
+/// Fault name as the command line spells it: "lost", "corrupt-header", "mode-id", "seq-wrap",
+/// "swst-change", "truncated". `fault_from_name` throws std::invalid_argument for other names.
+const char* fault_name(Fault fault);
+Fault fault_from_name(const std::string& name);
+
+/// Nominal image mode acquisition parameters (swath IS2 by default).
+struct ImParameters {
+  int beam_code = 2;
+  double sampling_frequency = 19207680.0;  // Hz
+  double carrier_frequency = 5.331004416e9;  // Hz
+  int pri_code = 11624;                    // PRF = fs / PRI code, 1652.4 Hz
+  int pulse_code = 521;                    // pulse length = code / fs, 27.1 us
+  int bandwidth_code = 255;                // bandwidth = code x 16 MHz / 255
+  double range_gate_bias = 5.099499844618549e-07;  // s
+  double antenna_length = 10.0;            // m
+  double incidence_deg = 23.0;             // at the scene centre
+  int calibration_swl = 640;               // samples of a periodic calibration packet
+  // Receive gain model g(k) = 10^(0.05 (a exp(-x/c2) + b exp(-x/c5) + d)), x = k / fs in us,
+  // a = c0 T + c1, b = c3 T + c4, d = c6 T + c7.
+  double gain_t = 5.0;
+  double gain_c[8] = {-0.004739, 0.403, 25.0, -0.004232, 0.4697, 175.0, 0.0006683, -0.06206};
+};
+
+struct SimulationConfig {
+  std::string out_dir = ".";
+  int lines = 512;     // packets from the first echo to the last packet
+  int samples = 1024;  // complex samples of an echo line (SWL code)
+  std::vector<Target> targets;
+  double noise_db = 20.0;  // noise power of a complex sample, dB relative to 1 count^2; below -100: none
+  std::vector<Fault> faults;
+  std::string scene_time = "02-MAR-2008 10:00:00.000000";  // zero-Doppler time of the first target
+  bool ascending = false;
+  int orbit_number = 31400;  // absolute orbit at the scene time
+  int first_counter = -1;    // mode packet counter of the first packet; -1: chosen
+  uint64_t seed = 1;
+  ImParameters im;
+  double orbit_margin = 7200.0;  // s of orbit file before and after the scene
+};
+
+/// What one target looks like in the product.
+struct TargetTruth {
+  Target target;
+  Vec3 ecef;
+  double zero_doppler_time = 0.0;  // sec85
+  double slant_range = 0.0;        // m, at zero Doppler
+  double range_time = 0.0;         // two-way, s: the echo's leading edge
+  double azimuth_line = 0.0;       // (zero Doppler time - first line time) x PRF
+  double range_sample = 0.0;       // (range time - near range time) x fs, first SWST
+  double doppler_rate = 0.0;       // Hz/s at zero Doppler
+  double incidence_deg = 0.0;
+  double look_deg = 0.0;
+};
+
+struct SimulationTruth {
+  std::string level0_path, orbit_path, truth_path, product_name, orbit_name;
+  double first_line_time = 0.0;  // sec85, microsecond stamp of the first packet (an echo)
+  int line_count = 0;            // packets from the first to the last, lost ones included
+  int echo_lines = 0;
+  std::vector<int> calibration_lines;  // line indices of periodic calibration packets
+  double prf = 0.0;
+  double pulse_length = 0.0;
+  double chirp_bandwidth = 0.0;
+  double wavelength = 0.0;
+  int swath_rank = 0;
+  int swst_code = 0;
+  double near_range_time = 0.0;
+  int first_counter = 0;
+  int last_counter = 0;
+  std::vector<TargetTruth> targets;
+  // Faults; -1 when not injected.
+  std::vector<int> lost_lines;
+  int corrupt_header_line = -1;
+  int wrong_mode_line = -1;
+  int sequence_wrap_line = -1;  // first line whose sequence count is 0 again
+  int swst_change_line = -1;
+  int swst_code_after_change = 0;
+  long long truncated_at_byte = -1;
+  int last_whole_line = -1;  // last line whose record is complete in a truncated file
+  long long full_size = 0;   // TOT_SIZE of the MPH
+};
+
+/// Runs the simulation and writes the three files into `config.out_dir`. Throws
+/// std::runtime_error or std::invalid_argument on bad input or a failed write.
+SimulationTruth run_simulation(const SimulationConfig& config);
+
+/// Receive gain g(k) of the model in `im`, for k in [0, count).
+std::vector<double> receive_gain(const ImParameters& im, int count);
+
+}  // namespace sar::simulator

@@ -1,0 +1,38 @@
+#pragma once
+// The truth file of a simulated product, in profile syntax (sections in brackets, "key = value"
+// lines; the lines before the first section are a comment). Times are written twice: as time
+// text "dd-MMM-yyyy hh:mm:ss.uuuuuu" and as sec85 with nine decimals. Lists are "{a b c}", an
+// empty list "{}". Keys:
+//
+// [product]     level0_file, orbit_file, product_name, orbit_name, mode (IM), swath (IS2),
+//               polarization (H/H), full_size (bytes the MPH announces)
+// [acquisition] first_line_time, first_line_time_sec85 (stamp of the first packet, an echo),
+//               line_count (packets from the first to the last, lost ones included),
+//               echo_lines, calibration_lines (line indices of periodic calibration pulses),
+//               first_counter, last_counter (mode packet counters), prf, pri_code, swst_code,
+//               swl_code, line_samples, sampling_frequency, carrier_frequency, wavelength,
+//               pulse_code, pulse_length, bandwidth_code, chirp_bandwidth, range_gate_bias,
+//               swath_rank, beam_code, near_range_time (two-way time of sample 0 for swst_code),
+//               antenna_length, noise_db, doppler_centroid (0: the beam is steered to zero
+//               Doppler), range_resolution (c / 2B, m, slant), azimuth_resolution (L / 2, m),
+//               echo_convention (where the echo of a target lies in the line)
+// [orbit]       epoch, epoch_sec85, semi_major_axis, inclination, period, ascending (0 or 1),
+//               absolute_orbit, ascending_node_time, ascending_node_time_sec85
+// [target_N]    (N from 1) latitude, longitude, height, amplitude, x, y, z (Earth-fixed),
+//               zero_doppler_time, zero_doppler_time_sec85, slant_range, range_time (two-way
+//               time of the echo's leading edge), azimuth_line (fractional line of zero Doppler),
+//               range_sample (fractional sample of the leading edge at swst_code),
+//               doppler_rate (Hz/s), incidence, look (degrees)
+// [faults]      faults (names), lost_lines, corrupt_header_line, wrong_mode_line,
+//               sequence_wrap_line, swst_change_line, swst_code_after_change,
+//               truncated_at_byte, last_whole_line (-1 where the fault was not injected)
+#include <string>
+
+#include "simulator/simulator.hpp"
+
+namespace sar::simulator {
+
+void write_truth_file(const SimulationTruth& truth, const SimulationConfig& config, const OrbitModel& orbit,
+                      const std::string& path);
+
+}  // namespace sar::simulator
