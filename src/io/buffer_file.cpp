@@ -46,19 +46,9 @@ int BufferFile::refreshParameters() {
   return st;
 }
 
-int64_t BufferFile::line_pitch() const {
-  const int size = cell_size(cellType_);
-  if (size == 0 || samples_ < 0 || rowPrefix_ < 0) return -1;
-  return static_cast<int64_t>(samples_) * size + rowPrefix_;
-}
+int64_t BufferFile::line_pitch() const { return raster_line_pitch(samples_, cellType_, rowPrefix_); }
 
-int64_t BufferFile::line_offset(int64_t line) const {
-  const int64_t pitch = line_pitch();
-  int64_t out = 0;
-  if (pitch < 0 || line < 0 || headerOffset_ < 0) return -1;
-  if (__builtin_mul_overflow(line, pitch, &out) || __builtin_add_overflow(out, headerOffset_, &out)) return -1;
-  return out;
-}
+int64_t BufferFile::line_offset(int64_t line) const { return raster_line_offset(line, line_pitch(), headerOffset_); }
 
 bool BufferFile::exists() const {
   std::error_code ec;

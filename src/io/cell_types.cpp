@@ -191,4 +191,18 @@ int32_t byte_order_from_name(std::string_view name) { return name == "MSBFirst" 
 
 std::string_view byte_order_name(int32_t order) { return order == kBigEndian ? "MSBFirst" : "LSBFirst"; }
 
+int64_t raster_line_pitch(int32_t samples, int32_t type, int32_t rowPrefix) {
+  const int size = cell_size(type);
+  if (size == 0 || samples < 0 || rowPrefix < 0) return -1;
+  // At most (2^31 - 1) * 16 + 2^31 - 1: always fits.
+  return static_cast<int64_t>(samples) * size + rowPrefix;
+}
+
+int64_t raster_line_offset(int64_t line, int64_t pitch, int64_t headerOffset) {
+  int64_t out = 0;
+  if (pitch < 0 || line < 0 || headerOffset < 0) return -1;
+  if (__builtin_mul_overflow(line, pitch, &out) || __builtin_add_overflow(out, headerOffset, &out)) return -1;
+  return out;
+}
+
 }  // namespace sar::io

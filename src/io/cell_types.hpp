@@ -33,6 +33,13 @@ inline constexpr int32_t kBigEndian = 1;
 bool cell_type_known(int32_t type);  // 0..9
 /// Bytes per cell, 0 for an unknown or unset type.
 int cell_size(int32_t type);
+
+/// Bytes from one line's start to the next: samples of `type` plus the row prefix; -1 for an
+/// unknown type or negative sizes.
+int64_t raster_line_pitch(int32_t samples, int32_t type, int32_t rowPrefix);
+/// File offset of `line` under a header of `headerOffset` bytes; -1 when out of range or when
+/// the product does not fit in 64 bits.
+int64_t raster_line_offset(int64_t line, int64_t pitch, int64_t headerOffset);
 /// 2 for the complex types, 1 for the real ones, 0 for an unknown type.
 int cell_parts(int32_t type);
 bool cell_is_complex(int32_t type);

@@ -52,20 +52,9 @@ int DataFile::refreshParameters() {
 
 // ------------------------------------------------------------------------------ geometry
 
-int64_t DataFile::line_pitch() const {
-  const int size = cell_size(cellType);
-  if (size == 0 || pixels < 0 || rowPrefix < 0) return -1;
-  // At most (2^31 - 1) * 16 + 2^31 - 1: always fits.
-  return static_cast<int64_t>(pixels) * size + rowPrefix;
-}
+int64_t DataFile::line_pitch() const { return raster_line_pitch(pixels, cellType, rowPrefix); }
 
-int64_t DataFile::line_offset(int64_t line) const {
-  const int64_t pitch = line_pitch();
-  int64_t out = 0;
-  if (pitch < 0 || line < 0 || headerOffset < 0) return -1;
-  if (!mul_ok(line, pitch, out) || !add_ok(out, headerOffset, out)) return -1;
-  return out;
-}
+int64_t DataFile::line_offset(int64_t line) const { return raster_line_offset(line, line_pitch(), headerOffset); }
 
 int64_t DataFile::raster_bytes() const { return lines < 0 ? -1 : line_offset(lines); }
 
