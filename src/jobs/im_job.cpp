@@ -120,12 +120,13 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
   return 0;
 }
 
-int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, enviauxfiles& files, StageFlags& flags) {
+int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, extconf& extra, enviauxfiles& files,
+                StageFlags& flags) {
   base::Frame frame("IMprocessor");
   const std::string dir = par.outputDir;
 
   if (flags[kStageExtract]) {
-    if (int st = frame.check(envi_extract(files, par))) return st;
+    if (int st = frame.check(envi_extract(files, par, extra))) return st;
     if (int st = frame.check(envi_orbit(files.orbit, par, proc))) return st;
     if (int st = frame.check(envi_rgpattern(files.xca, files.ins, par, proc))) return st;
     if (int st = frame.check(envi_syntchirp(par, proc))) return st;
@@ -187,6 +188,11 @@ int main_focussing_asar_im(const std::string& listPath) {
   procparm proc;
   dcestconf dc;
   azimuthconf az;
+  // The whole product, echoes only; the side tables live as long as the job.
+  extconf extra;
+  extra.skip_percent = 0;
+  extra.extract_percent = 100;
+  extra.extract_kind = envisat::kExtractEchoes;
   enviauxfiles files;
   StageFlags flags{1, 1, 0, 1, 1, 1, 1, 1};
 
@@ -229,7 +235,7 @@ int main_focussing_asar_im(const std::string& listPath) {
   par.reportPath = par.outputDir + "/report.bin";
 
   flags[kStageCleanup] = 1;
-  if (IMprocessor(par, proc, dc, az, files, flags) != 0)
+  if (IMprocessor(par, proc, dc, az, extra, files, flags) != 0)
     base::fatal(base::ec::kStageFailed, {"IMprocessor()", failed_stage()});
 
   const std::string headerPath = slcPath + "_hdr";

@@ -14,8 +14,9 @@ inline constexpr std::string_view kImParameterFile = "parameters_IM.hdr";
 int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az,
                enviauxfiles& files, StageFlags& flags);
 
-/// Run the stages that the flags ask for, in order.
-int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, enviauxfiles& files, StageFlags& flags);
+/// Run the stages that the flags ask for, in order. `extra` is the extraction request.
+int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, extconf& extra, enviauxfiles& files,
+                StageFlags& flags);
 
 /// Directory part of a path: up to the last '/' or '\', "." when there is none.
 std::string directory_of(const std::string& path);

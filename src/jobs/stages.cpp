@@ -1,7 +1,12 @@
 #include "jobs/stages.hpp"
 
+#include <vector>
+
+#include "base/convert.hpp"
 #include "base/diagnostics.hpp"
 #include "base/run_services.hpp"
+#include "envisat/extract.hpp"
+#include "envisat/table_builder.hpp"
 
 namespace sar::jobs {
 namespace {
@@ -21,8 +26,24 @@ int stage_not_built(std::string_view name) {
   return kStageRejected;
 }
 
+int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
+  base::Frame frame("envi_extract");
+  std::vector<sarpar> channels{par};
+  const int st = envisat::envi_extract(files.level0, files.ins, files.extracted, channels, extra,
+                                       envisat::timeline_table_builder());
+  if (st != 0) {
+    note_failed_stage("envi_extract");
+    return frame.check(st);
+  }
+  // Stripmap jobs hold one channel; the record keeps the job's paths and takes the rest.
+  par = channels.front();
+  std::string first;
+  if (base::sec852myascii(par.azimuthStartTime, first) != 0) first = "(no time)";
+  base::LogPrintf("EXTR: %d lines of %d samples from %s\n", par.lines, par.samples, first.substr(0, 27).c_str());
+  return 0;
+}
+
 // Stages still to come. Each later stage replaces its line here with the real call.
-int envi_extract(const enviauxfiles&, sarpar&) { return stage_not_built("envi_extract"); }
 int envi_orbit(const std::string&, sarpar&, procparm&) { return stage_not_built("envi_orbit"); }
 int envi_rgpattern(const std::string&, const std::string&, sarpar&, procparm&) {
   return stage_not_built("envi_rgpattern");

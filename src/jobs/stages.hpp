@@ -37,13 +37,16 @@ enum ImStage : std::size_t {
 using StageFlags = std::array<int32_t, 8>;
 
 using envisat::enviauxfiles;
+using envisat::extconf;
 using envisat::sarpar;
 using stripmap::azimuthconf;
 using stripmap::procparm;
 using doppler::dcestconf;
 
 // Stages of the stripmap chain, in the order the IM job calls them.
-int envi_extract(const enviauxfiles& files, sarpar& par);
+/// Level 0 extraction of the single channel of a stripmap product into `par.extrPath`, with the
+/// timeline table of the product's mode; `extra` is the request and receives the side tables.
+int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra);
 int envi_orbit(const std::string& orbitPath, sarpar& par, procparm& proc);
 int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, procparm& proc);
 int envi_syntchirp(sarpar& par, procparm& proc);

@@ -57,7 +57,8 @@ TEST(Protocol, ValueOf100DoesNotStopTheRun) {
   const std::string cmd = im_command(job);
   rewrite_working_file(job, "100");
   job.run(cmd);
-  EXPECT_EQ(job.error_code(), 130560);  // went on to the first missing stage
+  // Went on into the extraction, which stops where the truncated product ends.
+  EXPECT_EQ(job.error_code(), 1305606);
 }
 
 TEST(Protocol, ConfigurationFaults) {
@@ -99,7 +100,7 @@ TEST(Protocol, ParameterFileKeys) {
   };
   for (Case c : {Case{"missing_mandatory_key", "Azblk", 1, -1}, Case{"missing_overlap", "AzimuthOverlap", 1, -1},
                  Case{"missing_pol_weights", "Pol_Weights", 1, -1},
-                 Case{"missing_report_level", "Report_level", 2, 130560}}) {
+                 Case{"missing_report_level", "Report_level", 20, 1305606}}) {  // on into the extraction
     SCOPED_TRACE(c.name);
     ScratchJob job(std::string("params_") + c.name);
     const std::string cmd = im_command(job);

@@ -131,11 +131,9 @@ TEST(Standalone, RunsFocussingAndSumsUpItsErrorRecord) {
   r.orbit = kVor;
   r.outDir = (job.dir() / "out").string();
   const StandaloneOutcome o = run_standalone(r, focussing_exe(), nullptr);
-  // Until the focuser's first stage stands, the job ends there with its record.
-  EXPECT_EQ(o.status, 2);
-  EXPECT_NE(o.summary.find("A PROCESSING STAGE FAILED [EC : 130560] IMprocessor() envi_extract"),
-            std::string::npos)
-      << o.summary;
+  // The real product ends inside its first packet: the extraction stops with the file error.
+  EXPECT_EQ(o.status, 20);
+  EXPECT_NE(o.summary.find("File input/output error [EC : 1305606]"), std::string::npos) << o.summary;
   EXPECT_NE(o.summary.find("Vanterra.log"), std::string::npos);
   EXPECT_TRUE(o.products.empty());
   EXPECT_TRUE(fs::exists(fs::path(o.workDir) / "Vanterra.log"));

@@ -1,9 +1,12 @@
 // sarsim: writes a simulated ENVISAT ASAR image mode level 0 product of point targets, its
-// DOR_VOR orbit file and a truth file.
+// DOR_VOR orbit file, the matching ASA_INS and ASA_XCA products and a truth file.
 //
 //   sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]
 //          [--fault NAME]... [--time "dd-MMM-yyyy hh:mm:ss.uuuuuu"] [--ascending] [--seed S]
-//          [--first-counter C]
+//          [--first-counter C] [--ins-template FILE] [--xca-template FILE] [--no-aux]
+//
+// The ASA_INS and ASA_XCA are patched copies of real products (by default those of the sample
+// archive the build was configured with); --no-aux writes neither.
 //
 // Faults: lost, corrupt-header, mode-id, seq-wrap, swst-change, truncated.
 #include <cstdio>
@@ -21,9 +24,16 @@ void usage() {
   std::fputs(
       "usage: sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]\n"
       "              [--fault lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated]...\n"
-      "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n",
+      "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
+      "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n",
       stderr);
 }
+
+// Real products the auxiliary files are copied from, unless the command line names others.
+const char* const kInsTemplate =
+    SARSIM_REAL_DATA_DIR "/ASA_INS_AX/ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959";
+const char* const kXcaTemplate =
+    SARSIM_REAL_DATA_DIR "/ASA_XCA_AX/ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000";
 
 double number(const std::string& text, const char* what) {
   char* end = nullptr;
@@ -53,6 +63,8 @@ sar::simulator::Target parse_target(const std::string& text) {
 
 int main(int argc, char** argv) {
   sar::simulator::SimulationConfig config;
+  config.ins_template = kInsTemplate;
+  config.xca_template = kXcaTemplate;
   bool have_out = false;
   try {
     for (int i = 1; i < argc; ++i) {
@@ -82,6 +94,13 @@ int main(int argc, char** argv) {
         config.seed = static_cast<uint64_t>(number(value(), "seed"));
       } else if (arg == "--first-counter") {
         config.first_counter = static_cast<int>(number(value(), "counter"));
+      } else if (arg == "--ins-template") {
+        config.ins_template = value();
+      } else if (arg == "--xca-template") {
+        config.xca_template = value();
+      } else if (arg == "--no-aux") {
+        config.ins_template.clear();
+        config.xca_template.clear();
       } else if (arg == "--help" || arg == "-h") {
         usage();
         return 0;
@@ -92,7 +111,10 @@ int main(int argc, char** argv) {
     if (!have_out) throw std::invalid_argument("--out is required");
     if (config.targets.empty()) config.targets.push_back({{45.0, 10.0, 0.0}, 30.0});
     const sar::simulator::SimulationTruth truth = sar::simulator::run_simulation(config);
-    std::printf("%s\n%s\n%s\n", truth.level0_path.c_str(), truth.orbit_path.c_str(), truth.truth_path.c_str());
+    std::printf("%s\n%s\n", truth.level0_path.c_str(), truth.orbit_path.c_str());
+    if (!truth.ins_path.empty()) std::printf("%s\n", truth.ins_path.c_str());
+    if (!truth.xca_path.empty()) std::printf("%s\n", truth.xca_path.c_str());
+    std::printf("%s\n", truth.truth_path.c_str());
     return 0;
   } catch (const std::invalid_argument& e) {
     std::fprintf(stderr, "sarsim: %s\n", e.what());

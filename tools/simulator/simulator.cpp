@@ -10,6 +10,7 @@
 #include <stdexcept>
 
 #include "base/convert.hpp"
+#include "simulator/aux_files.hpp"
 #include "simulator/fbaq_encoder.hpp"
 #include "simulator/header_text.hpp"
 #include "simulator/level0_packet.hpp"
@@ -284,6 +285,10 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
     truth.product_name = buffer;
   }
   truth.level0_path = c.out_dir + "/" + truth.product_name;
+  const AuxValidity validity = aux_validity_around(truth.first_line_time);
+  if (!c.ins_template.empty())
+    truth.ins_path = write_ins_file(c.ins_template, im, truth.swath_rank, validity, c.out_dir);
+  if (!c.xca_template.empty()) truth.xca_path = write_xca_file(c.xca_template, validity, c.out_dir);
 
   // Headers.
   const double node_time = orbit.ascending_node_before(truth.first_line_time);
@@ -341,6 +346,7 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
   std::vector<float> iq(2 * static_cast<std::size_t>(c.samples));
   std::vector<uint8_t> payload;
   long long written = static_cast<long long>(kPacketAreaOffset);
+  if (c.keep_echoes) truth.echoes.assign(static_cast<std::size_t>(c.lines) * static_cast<std::size_t>(c.samples), {});
 
   for (int l = 0; l < c.lines; ++l) {
     const long long counter = first_counter + l;
@@ -377,6 +383,8 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
       for (std::size_t k = 0; k < echo.size(); ++k) {
         std::complex<double> v = echo[k] * gain[k];
         if (noise_sigma > 0.0) v += std::complex<double>(noise_sigma * normal(random), noise_sigma * normal(random));
+        if (c.keep_echoes)
+          truth.echoes[static_cast<std::size_t>(l) * static_cast<std::size_t>(c.samples) + k] = std::complex<float>(v);
         auto adc = [](double x) { return static_cast<float>(std::clamp(std::floor(x) + 0.5, -127.5, 127.5)); };
         iq[2 * k] = adc(v.real());
         iq[2 * k + 1] = adc(v.imag());

@@ -15,6 +15,7 @@
 // The sum over targets is multiplied by the receive gain g(k) that the decoder divides by, white
 // Gaussian noise is added, the result is quantised to 8 bits (levels at half-integers, -127.5 to
 // 127.5) and packed 8:4 with the simulator's FBAQ table.
+#include <complex>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -74,6 +75,11 @@ struct SimulationConfig {
   uint64_t seed = 1;
   ImParameters im;
   double orbit_margin = 7200.0;  // s of orbit file before and after the scene
+  // Real ASA_INS and ASA_XCA products whose patched copies are written beside the level 0
+  // product (see aux_files.hpp); empty: that product is not written.
+  std::string ins_template;
+  std::string xca_template;
+  bool keep_echoes = false;  // keep every line's echo before quantisation in the truth
 };
 
 /// What one target looks like in the product.
@@ -92,6 +98,7 @@ struct TargetTruth {
 
 struct SimulationTruth {
   std::string level0_path, orbit_path, truth_path, product_name, orbit_name;
+  std::string ins_path, xca_path;  // empty when not written
   double first_line_time = 0.0;  // sec85, microsecond stamp of the first packet (an echo)
   int line_count = 0;            // packets from the first to the last, lost ones included
   int echo_lines = 0;
@@ -116,6 +123,10 @@ struct SimulationTruth {
   long long truncated_at_byte = -1;
   int last_whole_line = -1;  // last line whose record is complete in a truncated file
   long long full_size = 0;   // TOT_SIZE of the MPH
+  // With keep_echoes: line_count x samples values, line by line, of the signal the ADC sees
+  // (targets times the receive gain, plus noise), before the 8-bit and the FBAQ quantisation.
+  // Lines of calibration pulses are zero.
+  std::vector<std::complex<float>> echoes;
 };
 
 /// Runs the simulation and writes the three files into `config.out_dir`. Throws

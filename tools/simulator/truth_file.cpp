@@ -59,6 +59,8 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.text("orbit_file", t.orbit_path);
   w.text("product_name", t.product_name);
   w.text("orbit_name", t.orbit_name);
+  w.text("ins_file", t.ins_path);
+  w.text("xca_file", t.xca_path);
   w.text("mode", "IM");
   w.text("swath", "IS" + std::to_string(c.im.beam_code));
   w.text("polarization", "H/H");

@@ -4,7 +4,8 @@
 // text "dd-MMM-yyyy hh:mm:ss.uuuuuu" and as sec85 with nine decimals. Lists are "{a b c}", an
 // empty list "{}". Keys:
 //
-// [product]     level0_file, orbit_file, product_name, orbit_name, mode (IM), swath (IS2),
+// [product]     level0_file, orbit_file, product_name, orbit_name, ins_file, xca_file (the
+//               matching ASA_INS and ASA_XCA, empty when not written), mode (IM), swath (IS2),
 //               polarization (H/H), full_size (bytes the MPH announces)
 // [acquisition] first_line_time, first_line_time_sec85 (stamp of the first packet, an echo),
 //               line_count (packets from the first to the last, lost ones included),

@@ -1,0 +1,51 @@
+// The IM job on a simulated product, through the focussing executable: the extraction stage
+// runs for real and the job stops at the first stage still to come.
+#include <gtest/gtest.h>
+
+#include "base/convert.hpp"
+#include "job_harness.hpp"
+#include "simulator/simulator.hpp"
+
+using namespace sar::test;
+namespace sim = sar::simulator;
+
+TEST(ImJobOnSimulatedProduct, ExtractsTheProductAndStopsAtTheOrbitStage) {
+  ScratchJob job("im_simulated");
+  sim::SimulationConfig c;
+  c.out_dir = (job.dir() / "inputs").string();
+  c.lines = 400;
+  c.samples = 400;
+  c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
+  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
+  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  const sim::SimulationTruth t = sim::run_simulation(c);
+  ASSERT_FALSE(t.ins_path.empty());
+  ASSERT_FALSE(t.xca_path.empty());
+
+  const std::string list = job.layout({t.level0_path, t.orbit_path, t.ins_path, t.xca_path});
+  const RunResult r = job.run("main_focussing_asar_IM#" + list);
+
+  EXPECT_EQ(job.error_code(), 130560) << r.err;
+  EXPECT_EQ(r.status, 2) << r.err;
+  const auto record = job.error_lines();
+  ASSERT_GE(record.size(), 5u) << job.log();
+  EXPECT_EQ(record[3], "IMprocessor()");
+  EXPECT_EQ(record[4], "envi_orbit");
+
+  // The line file of the extraction stays (a failed run leaves its work files). The timeline
+  // leaves out the last packet and, at position 700 of a cycle, one line for the boundary.
+  ASSERT_EQ(t.calibration_lines.size(), 1u);
+  const int lines = t.line_count - 2;
+  const fs::path extr = job.dir() / "EXTR";
+  ASSERT_TRUE(fs::exists(extr)) << job.log();
+  EXPECT_EQ(fs::file_size(extr), static_cast<std::uintmax_t>(lines) * (4 + 8 * static_cast<std::uintmax_t>(c.samples)));
+
+  // The stage states what it extracted: lines, samples and the first line's time.
+  std::string first;
+  ASSERT_EQ(sar::base::sec852myascii(t.first_line_time, first), 0);
+  const std::string log = job.log();
+  EXPECT_NE(log.find("EXTR: " + std::to_string(lines) + " lines of " + std::to_string(c.samples) +
+                     " samples from " + first.substr(0, 27)),
+            std::string::npos)
+      << log;
+}
