@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "header_shape.hpp"
 #include "base/convert.hpp"
 #include "envisat/product_types.hpp"
 #include "simulator/fbaq_encoder.hpp"
@@ -21,23 +22,8 @@ namespace {
 
 constexpr const char* kRealLevel0 = "/ASA_IM__0P_truncated/ASA_IM__0CNPDE20120329_071134_000000163113_00121_52721_6279.N1";
 
-std::string read_all(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(in), {}};
-}
-
-std::vector<std::string> header_shape(const std::string& bytes) {
-  std::vector<std::string> shape;
-  std::size_t start = 0;
-  while (start < bytes.size()) {
-    const std::size_t end = bytes.find('\n', start);
-    const std::size_t stop = end == std::string::npos ? bytes.size() : end + 1;
-    const std::string line = bytes.substr(start, stop - start);
-    shape.push_back(std::to_string(line.size()) + " " + line.substr(0, line.find('=')));
-    start = stop;
-  }
-  return shape;
-}
+using sar::test::header_shape;
+using sar::test::read_all;
 
 unsigned u8(const std::string& b, std::size_t i) { return static_cast<unsigned char>(b[i]); }
 unsigned u16(const std::string& b, std::size_t i) { return (u8(b, i) << 8) | u8(b, i + 1); }

@@ -7,6 +7,7 @@
 #include <iterator>
 #include <string>
 
+#include "header_shape.hpp"
 #include "base/convert.hpp"
 #include "envisat/product_types.hpp"
 #include "simulator/orbit_file.hpp"
@@ -16,24 +17,8 @@ namespace sim = sar::simulator;
 
 namespace {
 
-std::string read_all(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(in), {}};
-}
-
-// Line lengths and keys of a header: two headers agree in structure when these agree.
-std::vector<std::string> header_shape(const std::string& bytes) {
-  std::vector<std::string> shape;
-  std::size_t start = 0;
-  while (start < bytes.size()) {
-    const std::size_t end = bytes.find('\n', start);
-    const std::size_t stop = end == std::string::npos ? bytes.size() : end + 1;
-    const std::string line = bytes.substr(start, stop - start);
-    shape.push_back(std::to_string(line.size()) + " " + line.substr(0, line.find('=')));
-    start = stop;
-  }
-  return shape;
-}
+using sar::test::header_shape;
+using sar::test::read_all;
 
 std::string real_orbit_file() {
   for (const auto& e : std::filesystem::directory_iterator(std::string(SAR_REAL_DATA_DIR) + "/DOR_VOR_AX"))
