@@ -6,6 +6,7 @@
 #include "base/diagnostics.hpp"
 #include "base/run_services.hpp"
 #include "envisat/extract.hpp"
+#include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
 
 namespace sar::jobs {
@@ -43,12 +44,22 @@ int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
   return 0;
 }
 
-// Stages still to come. Each later stage replaces its line here with the real call.
-int envi_orbit(const std::string&, sarpar&, procparm&) { return stage_not_built("envi_orbit"); }
-int envi_rgpattern(const std::string&, const std::string&, sarpar&, procparm&) {
-  return stage_not_built("envi_rgpattern");
+namespace {
+int named(std::string_view stage, int status) {
+  if (status != 0) note_failed_stage(stage);
+  return status;
 }
-int envi_syntchirp(sarpar&, procparm&) { return stage_not_built("envi_syntchirp"); }
+}  // namespace
+
+int envi_orbit(const std::string& orbitPath, sarpar& par, procparm& proc) {
+  return named("envi_orbit", envisat::envi_orbit(orbitPath, par, proc));
+}
+int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, procparm& proc) {
+  return named("envi_rgpattern", envisat::envi_rgpattern(xcaPath, insPath, par, proc));
+}
+int envi_syntchirp(sarpar& par, procparm& proc) { return named("envi_syntchirp", envisat::envi_syntchirp(par, proc)); }
+
+// Stages still to come. Each later stage replaces its line here with the real call.
 int init_buffer(sarpar&, procparm&) { return stage_not_built("init_buffer"); }
 int rangefoc(sarpar&, procparm&) { return stage_not_built("rangefoc"); }
 int EstDopplerENVI(const std::string&, double, double, double, double, double, double, double, double, double,

@@ -9,7 +9,7 @@
 using namespace sar::test;
 namespace sim = sar::simulator;
 
-TEST(ImJobOnSimulatedProduct, ExtractsTheProductAndStopsAtTheOrbitStage) {
+TEST(ImJobOnSimulatedProduct, ExtractsAndPreparesThenStopsAtRangeBuffers) {
   ScratchJob job("im_simulated");
   sim::SimulationConfig c;
   c.out_dir = (job.dir() / "inputs").string();
@@ -30,7 +30,8 @@ TEST(ImJobOnSimulatedProduct, ExtractsTheProductAndStopsAtTheOrbitStage) {
   const auto record = job.error_lines();
   ASSERT_GE(record.size(), 5u) << job.log();
   EXPECT_EQ(record[3], "IMprocessor()");
-  EXPECT_EQ(record[4], "envi_orbit");
+  // Orbit, pattern and replica stand; the in-core range buffer is the first stage to come.
+  EXPECT_EQ(record[4], "init_buffer");
 
   // The line file of the extraction stays (a failed run leaves its work files). The timeline
   // leaves out the last packet and, at position 700 of a cycle, one line for the boundary.

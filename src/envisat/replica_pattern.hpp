@@ -1,0 +1,25 @@
+#pragma once
+// The three steps that complete a stripmap job's record after extraction: the orbit sampled
+// over the scene, the elevation pattern of the channel, and the nominal range chirp.
+#include <string>
+
+#include "envisat/records.hpp"
+#include "stripmap/procparm.hpp"
+
+namespace sar::envisat {
+
+/// Elevation pattern: 201 entries, 0.05 degrees apart.
+inline constexpr int kPatternLength = 201;
+inline constexpr double kPatternStep = 0.05;
+
+/// Five state vectors T/3 apart centred on the scene (T = lines / PRF), the orbit number and
+/// the ascending node time. Returns 0 or the orbit reader's status.
+int envi_orbit(const std::string& orbitPath, sarpar& par, stripmap::procparm& proc);
+/// Pattern of the channel's beam and polarisation from ASA_XCA (dB to linear amplitude), its
+/// centre look angle from ASA_INS. Returns 0, or kFileIo-class failures as raised by the readers.
+int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, stripmap::procparm& proc);
+/// The nominal linear FM replica: N = round(fs * tau / resampling), centred (zero phase in the
+/// middle), every part scaled by B / N.
+int envi_syntchirp(sarpar& par, stripmap::procparm& proc);
+
+}  // namespace sar::envisat
