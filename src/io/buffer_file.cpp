@@ -18,8 +18,6 @@ namespace sar::io {
 
 namespace {
 
-constexpr double kIntMax = 2147483647.0;
-constexpr double kInt64Max = 9.2233720368547758e18;
 
 int failed(std::source_location loc = std::source_location::current()) {
   sar::base::report(sar::base::kReportErrorCallTree, sar::base::kCalledFunctionError, loc);
@@ -34,17 +32,7 @@ BufferFile::BufferFile(std::string name) : BufferFile() { fileName_ = std::move(
 
 BufferFile::~BufferFile() { close(); }
 
-int BufferFile::refreshParameters() {
-  createElementsVector(6);
-  int st = 0;
-  st |= addElementInt("NrOfLinesPerImage", &lines_, 1, 0.0, kIntMax, true);
-  st |= addElementInt("NrOfPixelsPerLine", &samples_, 1, 0.0, kIntMax, true);
-  st |= addElementInt64("HeaderOffset", &headerOffset_, 1, 0.0, kInt64Max, true);
-  st |= addElementInt("RowPrefix", &rowPrefix_, 1, 0.0, kIntMax, true);
-  st |= addElementInt("ByteOrder", &byteOrder_, 1, 0.0, 1.0, true);
-  st |= addElementInt("CellType", &cellType_, 1, 0.0, 9.0, true);
-  return st;
-}
+int BufferFile::refreshParameters() { return add_raster_elements(*this, lines_, samples_, headerOffset_, rowPrefix_, byteOrder_, cellType_); }
 
 int64_t BufferFile::line_pitch() const { return raster_line_pitch(samples_, cellType_, rowPrefix_); }
 

@@ -18,8 +18,6 @@ namespace sar::io {
 
 namespace {
 
-constexpr double kIntMax = 2147483647.0;
-constexpr double kInt64Max = 9.2233720368547758e18;
 
 // A failing stream step leaves the call-tree report and gives 1.
 int failed(std::source_location loc = std::source_location::current()) {
@@ -38,17 +36,7 @@ DataFile::DataFile(std::string name) : DataFile() { fileName = std::move(name); 
 
 DataFile::~DataFile() { close(); }
 
-int DataFile::refreshParameters() {
-  createElementsVector(6);
-  int st = 0;
-  st |= addElementInt("NrOfLinesPerImage", &lines, 1, 0.0, kIntMax, true);
-  st |= addElementInt("NrOfPixelsPerLine", &pixels, 1, 0.0, kIntMax, true);
-  st |= addElementInt64("HeaderOffset", &headerOffset, 1, 0.0, kInt64Max, true);
-  st |= addElementInt("RowPrefix", &rowPrefix, 1, 0.0, kIntMax, true);
-  st |= addElementInt("ByteOrder", &byteOrder, 1, 0.0, 1.0, true);
-  st |= addElementInt("CellType", &cellType, 1, 0.0, 9.0, true);
-  return st;
-}
+int DataFile::refreshParameters() { return add_raster_elements(*this, lines, pixels, headerOffset, rowPrefix, byteOrder, cellType); }
 
 // ------------------------------------------------------------------------------ geometry
 

@@ -12,6 +12,22 @@
 
 namespace sar::io {
 
+int add_raster_elements(metadata::GeneralSAR_BaseXML& header, int32_t& lines, int32_t& pixels,
+                        int64_t& headerOffset, int32_t& rowPrefix, int32_t& byteOrder, int32_t& cellType) {
+  constexpr double kIntMax = 2147483647.0;
+  constexpr double kInt64Max = 9.2233720368547758e18;
+  header.createElementsVector(6);
+  int st = 0;
+  st |= header.addElementInt("NrOfLinesPerImage", &lines, 1, 0.0, kIntMax, true);
+  st |= header.addElementInt("NrOfPixelsPerLine", &pixels, 1, 0.0, kIntMax, true);
+  st |= header.addElementInt64("HeaderOffset", &headerOffset, 1, 0.0, kInt64Max, true);
+  st |= header.addElementInt("RowPrefix", &rowPrefix, 1, 0.0, kIntMax, true);
+  st |= header.addElementInt("ByteOrder", &byteOrder, 1, 0.0, 1.0, true);
+  st |= header.addElementInt("CellType", &cellType, 1, 0.0, 9.0, true);
+  return st;
+}
+
+
 namespace {
 
 struct FileCloser {

@@ -4,6 +4,8 @@
 #include <cstdint>
 #include <string>
 
+#include "metadata/base_xml.hpp"
+
 namespace sar::io {
 
 struct RasterHeader {
@@ -14,6 +16,11 @@ struct RasterHeader {
   int32_t byteOrder = 0;
   int32_t cellType = 0;
 };
+
+/// Registers the six "RasterInfo" keys, bound to the given fields, as the elements of a raster
+/// description's header object. One list for every raster kind, so their headers agree.
+int add_raster_elements(metadata::GeneralSAR_BaseXML& header, int32_t& lines, int32_t& pixels,
+                        int64_t& headerOffset, int32_t& rowPrefix, int32_t& byteOrder, int32_t& cellType);
 
 /// Bytes of the raster the header describes; -1 for negative sizes, an unknown type or a total
 /// beyond 64 bits.
