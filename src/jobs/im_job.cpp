@@ -124,6 +124,7 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
                 StageFlags& flags) {
   base::Frame frame("IMprocessor");
   const std::string dir = par.outputDir;
+  connect_stage_progress();
 
   if (flags[kStageExtract]) {
     if (int st = frame.check(envi_extract(files, par, extra))) return st;

@@ -8,6 +8,8 @@
 #include "envisat/extract.hpp"
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
+#include "stripmap/progress.hpp"
+#include "stripmap/range_focus.hpp"
 
 namespace sar::jobs {
 namespace {
@@ -44,6 +46,11 @@ int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
   return 0;
 }
 
+void connect_stage_progress() {
+  stripmap::stage_progress().open = [](std::string_view label) { base::waitbar_open(label); };
+  stripmap::stage_progress().update = [](double percent) { base::waitbar_update(percent); };
+}
+
 namespace {
 int named(std::string_view stage, int status) {
   if (status != 0) note_failed_stage(stage);
@@ -60,8 +67,8 @@ int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpa
 int envi_syntchirp(sarpar& par, procparm& proc) { return named("envi_syntchirp", envisat::envi_syntchirp(par, proc)); }
 
 // Stages still to come. Each later stage replaces its line here with the real call.
-int init_buffer(sarpar&, procparm&) { return stage_not_built("init_buffer"); }
-int rangefoc(sarpar&, procparm&) { return stage_not_built("rangefoc"); }
+int init_buffer(sarpar& par, procparm& proc) { return named("init_buffer", stripmap::init_buffer(par, proc)); }
+int rangefoc(sarpar& par, procparm& proc) { return named("rangefoc", stripmap::rangefoc(par, proc)); }
 int EstDopplerENVI(const std::string&, double, double, double, double, double, double, double, double, double,
                    procparm&) {
   return stage_not_built("EstDopplerENVI");
@@ -70,7 +77,7 @@ int getnadcpoly(const std::string&, dcestconf&, procparm&) { return stage_not_bu
 int getgeopoly(sarpar&, procparm&) { return stage_not_built("getgeopoly"); }
 int IMCalibration(sarpar&, procparm&) { return stage_not_built("IMCalibration"); }
 int azimuthfoc(sarpar&, procparm&, azimuthconf&) { return stage_not_built("azimuthfoc"); }
-int dest_buffer(sarpar&, procparm&) { return stage_not_built("dest_buffer"); }
+int dest_buffer(sarpar& par, procparm& proc) { return named("dest_buffer", stripmap::dest_buffer(par, proc)); }
 int get_coords(procparm&, sarpar&) { return stage_not_built("get_coords"); }
 int IMwritepars(const std::string&, const sarpar&, const procparm&, const enviauxfiles&) {
   return stage_not_built("IMwritepars");

@@ -43,6 +43,9 @@ using stripmap::azimuthconf;
 using stripmap::procparm;
 using doppler::dcestconf;
 
+/// Routes the focusing stages' progress to the host's progress bar.
+void connect_stage_progress();
+
 // Stages of the stripmap chain, in the order the IM job calls them.
 /// Level 0 extraction of the single channel of a stripmap product into `par.extrPath`, with the
 /// timeline table of the product's mode; `extra` is the request and receives the side tables.

@@ -5,6 +5,8 @@
 #include <cstdint>
 #include <vector>
 
+#include "dsp/fft.hpp"
+
 namespace sar::stripmap {
 
 /// Nine doubles a0..a8: f = a0 + a1 x + a2 y + a3 x y + a4 x^2 + a5 x^3 + a6 x^4,
@@ -55,7 +57,35 @@ struct procparm {
   int32_t Flag_ortog = 0;
   int32_t Flag_swstal = 0;
   int32_t Flag_incore = 0;
+  // FFT length of the range correlation; in core mode also the row pitch of the raw matrix.
+  int32_t paddedLength = 0;
+  // The block buffer, or in core mode the whole matrix (pitch paddedLength while raw, then
+  // rangeSamples after range compression, focusedSamples after azimuth focusing).
+  dsp::cvector matrix;
+  // Per line: window start offset in samples against the earliest window.
+  std::vector<int32_t> lineShifts;
   int32_t Azblk = 0;
+  double equivalentVelocity = 0.0;   // m/s, at the scene's first block
+  double azimuthPixelSpacing = 0.0;  // velocity / PRF, m
+  double rangePixelSpacing = 0.0;    // (c/2) / fs, m
+  double sceneCentroid = 0.0;        // Hz, scene centre line and first near range
+  double firstLineTime = 0.0;        // sec85 of focused line 0
+  double firstSampleTime = 0.0;      // two-way range time of focused sample 0
+};
+
+/// Value of a nine-coefficient Doppler polynomial at range time r and azimuth time t.
+inline double DCeval(const DopplerPoly& a, double r, double t) {
+  const double x = r - a[7];
+  const double y = t - a[8];
+  return a[0] + a[1] * x + a[2] * y + a[3] * x * y + a[4] * x * x + a[5] * x * x * x + a[6] * x * x * x * x;
+}
+
+/// A focused or raw rectangle: azimuth start time (sec85), range start time (two-way s), sizes.
+struct cutrect {
+  double azimuthStart = 0.0;
+  double rangeStart = 0.0;
+  int32_t lines = 0;
+  int32_t samples = 0;
 };
 
 /// Section "AzimuthConf". Bandwidths are fractions of the sampling rate (range) or PRF (azimuth)

@@ -1,0 +1,352 @@
+#include "stripmap/range_focus.hpp"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <system_error>
+
+#include "base/convert.hpp"
+#include "base/diagnostics.hpp"
+#include "base/errors.hpp"
+#include "stripmap/progress.hpp"
+#include "dsp/fft.hpp"
+
+namespace sar::stripmap {
+
+namespace {
+
+using dsp::fcomplex;
+namespace ec = base::ec;
+
+constexpr int kRejected = 10;
+constexpr int kProgressLines = 100;
+
+void reject(const std::string& text) { base::report(base::kReportError, text); }
+
+std::string format(const char* fmt, double a, double b = 0.0, double c = 0.0) {
+  char t[256];
+  std::snprintf(t, sizeof t, fmt, a, b, c);
+  return t;
+}
+
+struct FileCloser {
+  void operator()(std::FILE* f) const {
+    if (f) std::fclose(f);
+  }
+};
+using FilePtr = std::unique_ptr<std::FILE, FileCloser>;
+
+const std::string& raw_path(const sarpar& par) { return par.raw_file.empty() ? par.extrPath : par.raw_file; }
+
+// Sequential reader of the raw line file. Its size is checked against the lines it must hold
+// before anything is read, so a short file is refused at once rather than half processed.
+class RawLines {
+ public:
+  RawLines(const std::string& path, int32_t lines, int32_t samples) : path_(path), samples_(samples) {
+    std::error_code err;
+    const auto size = std::filesystem::file_size(path, err);
+    if (err) base::fatal(ec::kFileIo, {path, "raw line file cannot be opened"});
+    const int64_t need = static_cast<int64_t>(lines) * line_bytes();
+    if (static_cast<int64_t>(size) < need)
+      base::fatal(ec::kFileIo, {path, "raw line file holds fewer lines than the product",
+                                std::to_string(size) + " of " + std::to_string(need) + " bytes"});
+    file_.reset(std::fopen(path.c_str(), "rb"));
+    if (!file_) base::fatal(ec::kFileIo, {path, "raw line file cannot be opened"});
+  }
+  int64_t line_bytes() const { return 4 + 8 * static_cast<int64_t>(samples_); }
+  // Reads one line's time and samples; the samples land in `row`.
+  float read(fcomplex* row) {
+    float time = 0.0f;
+    if (std::fread(&time, 4, 1, file_.get()) != 1 ||
+        std::fread(row, sizeof(fcomplex), static_cast<std::size_t>(samples_), file_.get()) !=
+            static_cast<std::size_t>(samples_))
+      base::fatal(ec::kFileIo, {path_, "read failed in the raw line file"});
+    return time;
+  }
+
+ private:
+  std::string path_;
+  int32_t samples_;
+  FilePtr file_;
+};
+
+// An output raster written under "<path>.part" and renamed when complete; removed otherwise.
+class OutputRaster {
+ public:
+  explicit OutputRaster(std::string path) : path_(std::move(path)), part_(path_ + ".part") {
+    file_.reset(std::fopen(part_.c_str(), "wb"));
+    if (!file_) base::fatal(ec::kFileIo, {path_, "output file cannot be created"});
+  }
+  OutputRaster(const OutputRaster&) = delete;
+  OutputRaster& operator=(const OutputRaster&) = delete;
+  ~OutputRaster() {
+    if (!committed_) {
+      file_.reset();
+      std::error_code err;
+      std::filesystem::remove(part_, err);
+    }
+  }
+  void write(const fcomplex* data, int64_t count) {
+    if (count > 0 && std::fwrite(data, sizeof(fcomplex), static_cast<std::size_t>(count), file_.get()) !=
+                         static_cast<std::size_t>(count))
+      base::fatal(ec::kFileIo, {path_, "write failed"});
+  }
+  void commit() {
+    if (std::fclose(file_.release()) != 0) base::fatal(ec::kFileIo, {path_, "close failed"});
+    std::error_code err;
+    std::filesystem::rename(part_, path_, err);
+    if (err) base::fatal(ec::kFileIo, {path_, "cannot rename " + part_});
+    committed_ = true;
+  }
+
+ private:
+  std::string path_, part_;
+  FilePtr file_;
+  bool committed_ = false;
+};
+
+// Window start offset of a line in samples against the earliest window. A shift outside the
+// window span would write past the output line; it means a broken line file.
+int line_shift(const sarpar& par, const procparm& proc, const RangeSizes& z, float time, int32_t line,
+               int32_t& shift) {
+  shift = 0;
+  if (!proc.Flag_swstal) return 0;
+  const double s = static_cast<double>(base::round_half_away((time - par.nearRangeTime) * par.samplingRate));
+  if (!(s >= 0.0 && s <= z.windowSpan)) {
+    reject("Range line " + std::to_string(line) + format(": window start %.9g s lies outside the product's window"
+                                                          " span (%.9g s + %g samples)",
+                                                          time, par.nearRangeTime, z.windowSpan));
+    return kRejected;
+  }
+  shift = static_cast<int32_t>(s);
+  return 0;
+}
+
+// Reads `count` lines into rows of `pitch` samples (the tail of each row zeroed).
+int load_lines(RawLines& in, const sarpar& par, const procparm& proc, const RangeSizes& z, int32_t first,
+               int32_t count, fcomplex* matrix, int32_t* shifts) {
+  for (int32_t i = 0; i < count; ++i) {
+    fcomplex* row = matrix + static_cast<int64_t>(i) * z.padded;
+    const float t = in.read(row);
+    std::fill(row + z.rawSamples, row + z.padded, fcomplex{});
+    if (int st = line_shift(par, proc, z, t, first + i, shifts[i])) return st;
+  }
+  return 0;
+}
+
+// Correlates `rows` rows of pitch L with the replica and repacks them at the output pitch:
+// row i moves from i L to i (V + W), `shift` zeros first, then the V valid lags, then zeros.
+// The repacking runs in row order in place: row i's destination never reaches past its own
+// source, so each row is copied out before it can be overwritten.
+void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const dsp::cvector& replicaSpectrum,
+                   const int32_t* shifts, int32_t block, int32_t blockLines, int32_t blockCount) {
+  if (rows <= 0) return;
+  const std::span<fcomplex> all(matrix, static_cast<std::size_t>(rows) * z.padded);
+  dsp::fft_c(z.padded, z.padded, rows, rows, 1, 0, all);
+  const fcomplex* h = replicaSpectrum.data();
+  for (int32_t start = 0; start < rows; start += kProgressLines) {
+    const int32_t stop = std::min(rows, start + kProgressLines);
+#pragma omp parallel for schedule(static)
+    for (int32_t r = start; r < stop; ++r) {
+      fcomplex* x = matrix + static_cast<int64_t>(r) * z.padded;
+      for (int32_t k = 0; k < z.padded; ++k) {
+        const double xr = x[k].real(), xi = x[k].imag();
+        const double hr = h[k].real(), hi = h[k].imag();
+        x[k] = fcomplex(static_cast<float>(xr * hr + xi * hi), static_cast<float>(xi * hr - xr * hi));
+      }
+    }
+    const double done = static_cast<double>(block) * blockLines + stop;
+    progress_update(100.0 * done / (static_cast<double>(blockCount) * std::max(blockLines, 1)));
+  }
+  dsp::fft_c(z.padded, z.padded, rows, rows, -1, 0, all);
+
+  std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
+  for (int32_t r = 0; r < rows; ++r) {
+    const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
+    std::copy(src, src + z.valid, line.begin());
+    fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
+    const int32_t s = shifts ? shifts[r] : 0;
+    std::fill(dst, dst + s, fcomplex{});
+    std::copy(line.begin(), line.end(), dst + s);
+    std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
+  }
+}
+
+dsp::cvector replica_spectrum(const procparm& proc, const RangeSizes& z) {
+  dsp::cvector h(static_cast<std::size_t>(z.padded), fcomplex{});
+  std::copy(proc.replica.begin(), proc.replica.begin() + z.replicaLength, h.begin());
+  dsp::fft_c(z.padded, z.padded, 1, 1, 1, 0, h);
+  return h;
+}
+
+}  // namespace
+
+BlockCounters& block_counters() {
+  static BlockCounters counters;
+  return counters;
+}
+
+int range_sizes(const sarpar& par, const procparm& proc, RangeSizes& z) {
+  z = RangeSizes{};
+  z.rawSamples = par.samples;
+  z.replicaLength = proc.replicaLength;
+  if (par.samples <= 0 || par.lines <= 0) {
+    reject("Range focusing: the product holds no raw lines");
+    return kRejected;
+  }
+  if (proc.replicaLength <= 0 || static_cast<std::size_t>(proc.replicaLength) > proc.replica.size()) {
+    reject("Range focusing: no range reference (replica) for the product");
+    return kRejected;
+  }
+  if (proc.replicaLength > par.samples) {
+    reject("Range focusing: the replica (" + std::to_string(proc.replicaLength) + " samples) is longer than a raw line (" +
+           std::to_string(par.samples) + " samples)");
+    return kRejected;
+  }
+  if (!(par.samplingRate > 0.0)) {
+    reject("Range focusing: no range sampling rate");
+    return kRejected;
+  }
+  const double span = static_cast<double>(base::round_half_away((par.far_range_time - par.nearRangeTime) * par.samplingRate));
+  if (!(span >= 0.0 && span < 1e6)) {
+    reject(format("Range focusing: window span of %g samples between %.9g s and %.9g s", span, par.nearRangeTime,
+                  par.far_range_time));
+    return kRejected;
+  }
+  z.windowSpan = static_cast<int32_t>(span);
+  z.padded = dsp::genpow(z.rawSamples + z.windowSpan, 1);
+  z.valid = z.rawSamples - z.replicaLength + 1;
+  z.output = z.valid + z.windowSpan;
+  if (z.padded <= 0) {
+    reject("Range focusing: line too long for the transform");
+    return kRejected;
+  }
+  return 0;
+}
+
+int init_buffer(const sarpar& par, procparm& proc) {
+  base::Frame frame("init_buffer");
+  RangeSizes z;
+  if (int st = frame.check(range_sizes(par, proc, z))) return st;
+  proc.paddedLength = z.padded;
+  proc.rangeSamples = z.output;
+  proc.lines = par.lines;
+  proc.lineShifts.assign(static_cast<std::size_t>(par.lines), 0);
+  proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
+  RawLines in(raw_path(par), par.lines, par.samples);
+  if (int st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data())) {
+    proc.matrix = dsp::cvector();
+    proc.lineShifts.clear();
+    return frame.check(st);
+  }
+  return 0;
+}
+
+int rangefoc(const sarpar& par, procparm& proc) {
+  base::Frame frame("rangefoc");
+  RangeSizes z;
+  if (int st = frame.check(range_sizes(par, proc, z))) return st;
+  const int32_t lines = par.lines;
+  const bool core = proc.Flag_incore != 0;
+  if (core) {
+    if (proc.paddedLength != z.padded || proc.matrix.size() < static_cast<std::size_t>(lines) * z.padded ||
+        proc.lineShifts.size() < static_cast<std::size_t>(lines)) {
+      reject("Range focusing: the raw matrix is not loaded (init_buffer)");
+      return frame.check(kRejected);
+    }
+    proc.Azblk = lines;
+  } else if (proc.Azblk <= 0 || proc.Azblk > lines) {
+    reject("Range focusing: block of " + std::to_string(proc.Azblk) + " lines for a product of " +
+           std::to_string(lines) + " lines");
+    return frame.check(kRejected);
+  }
+  const int32_t blockLines = proc.Azblk;
+  const int32_t full = lines / blockLines;
+  const int32_t rest = lines - full * blockLines;
+  const int32_t shownBlocks = full + (rest > 0 ? 1 : 0);
+  block_counters() = BlockCounters{0, shownBlocks};
+  proc.paddedLength = z.padded;
+  proc.rangeSamples = z.output;
+  proc.lines = lines;
+
+  const dsp::cvector h = replica_spectrum(proc, z);
+  progress_open("Range Focusing");
+
+  if (core) {
+    if (proc.Flag_ortog) {
+      if (int st = frame.check(ortogN(proc.matrix, z.padded, z.rawSamples, lines, 0))) return st;
+    }
+    compress_rows(proc.matrix.data(), lines, z, h, proc.lineShifts.data(), 0, lines, 1);
+    proc.matrix.resize(static_cast<std::size_t>(lines) * z.output);
+    block_counters().current = 1;
+    progress_update(100.0);
+    return 0;
+  }
+
+  RawLines in(raw_path(par), lines, par.samples);
+  OutputRaster out(par.rgfPath);
+  dsp::cvector matrix(static_cast<std::size_t>(blockLines) * z.padded);
+  std::vector<int32_t> shifts(static_cast<std::size_t>(blockLines));
+  // B full blocks and always a final one, which may be empty.
+  for (int32_t b = 0; b <= full; ++b) {
+    const int32_t n = b < full ? blockLines : rest;
+    block_counters().current = b + 1;
+    if (n == 0) continue;
+    if (int st = load_lines(in, par, proc, z, b * blockLines, n, matrix.data(), shifts.data())) return frame.check(st);
+    if (proc.Flag_ortog) {
+      if (int st = frame.check(ortogN(matrix, z.padded, z.rawSamples, n, b))) return st;
+    }
+    compress_rows(matrix.data(), n, z, h, shifts.data(), b, blockLines, shownBlocks);
+    out.write(matrix.data(), static_cast<int64_t>(n) * z.output);
+  }
+  out.commit();
+  progress_update(100.0);
+  return 0;
+}
+
+int dest_buffer(const sarpar& par, procparm& proc) {
+  base::Frame frame("dest_buffer");
+  const auto count = static_cast<int64_t>(proc.focusedLines) * proc.focusedSamples;
+  if (proc.focusedLines <= 0 || proc.focusedSamples <= 0 || static_cast<int64_t>(proc.matrix.size()) < count) {
+    reject("dest_buffer: no focused matrix to write");
+    return frame.check(kRejected);
+  }
+  OutputRaster out(par.slcPath);
+  out.write(proc.matrix.data(), count);
+  out.commit();
+  proc.matrix = dsp::cvector();
+  proc.lineShifts = std::vector<int32_t>();
+  return 0;
+}
+
+int imcutter(const sarpar& par, const procparm& proc, const azimuthconf& az, const cutrect& wanted, cutrect& needed) {
+  const double fs = par.samplingRate, prf = par.prf;
+  const int32_t hr = az.RangeOverlap, ha = az.AzimuthOverlap;
+  needed.azimuthStart = wanted.azimuthStart - az.azimuthShift - ha / prf;
+  needed.rangeStart = wanted.rangeStart - az.rangeShift - hr / fs;
+  needed.samples = wanted.samples + proc.replicaLength + 2 * hr - 1;
+  needed.lines = wanted.lines + 2 * ha;
+  const bool ok = needed.rangeStart >= par.nearRangeTime && needed.azimuthStart >= par.azimuthStartTime &&
+                  needed.lines / prf + needed.azimuthStart <= par.lines / prf + par.azimuthStartTime &&
+                  needed.samples / fs + needed.rangeStart <= par.samples / fs + par.nearRangeTime;
+  if (!ok) {
+    reject("Requested focused block cannot be obtained from the given extracted data matrix.");
+    return kRejected;
+  }
+  return 0;
+}
+
+int imcutter_inv(const sarpar& par, const procparm& proc, const azimuthconf& az, const cutrect& raw, cutrect& focused) {
+  const int32_t hr = az.RangeOverlap, ha = az.AzimuthOverlap;
+  focused.azimuthStart = raw.azimuthStart + az.azimuthShift + ha / par.prf;
+  focused.rangeStart = raw.rangeStart + az.rangeShift + hr / par.samplingRate;
+  focused.samples = raw.samples - proc.replicaLength - 2 * hr + 1;
+  focused.lines = raw.lines - 2 * ha;
+  return 0;
+}
+
+}  // namespace sar::stripmap
