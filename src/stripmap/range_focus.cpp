@@ -13,6 +13,7 @@
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "stripmap/progress.hpp"
+#include "stripmap/raster_files.hpp"
 #include "dsp/fft.hpp"
 
 namespace sar::stripmap {
@@ -72,41 +73,6 @@ class RawLines {
   std::string path_;
   int32_t samples_;
   FilePtr file_;
-};
-
-// An output raster written under "<path>.part" and renamed when complete; removed otherwise.
-class OutputRaster {
- public:
-  explicit OutputRaster(std::string path) : path_(std::move(path)), part_(path_ + ".part") {
-    file_.reset(std::fopen(part_.c_str(), "wb"));
-    if (!file_) base::fatal(ec::kFileIo, {path_, "output file cannot be created"});
-  }
-  OutputRaster(const OutputRaster&) = delete;
-  OutputRaster& operator=(const OutputRaster&) = delete;
-  ~OutputRaster() {
-    if (!committed_) {
-      file_.reset();
-      std::error_code err;
-      std::filesystem::remove(part_, err);
-    }
-  }
-  void write(const fcomplex* data, int64_t count) {
-    if (count > 0 && std::fwrite(data, sizeof(fcomplex), static_cast<std::size_t>(count), file_.get()) !=
-                         static_cast<std::size_t>(count))
-      base::fatal(ec::kFileIo, {path_, "write failed"});
-  }
-  void commit() {
-    if (std::fclose(file_.release()) != 0) base::fatal(ec::kFileIo, {path_, "close failed"});
-    std::error_code err;
-    std::filesystem::rename(part_, path_, err);
-    if (err) base::fatal(ec::kFileIo, {path_, "cannot rename " + part_});
-    committed_ = true;
-  }
-
- private:
-  std::string path_, part_;
-  FilePtr file_;
-  bool committed_ = false;
 };
 
 // Window start offset of a line in samples against the earliest window. A shift outside the

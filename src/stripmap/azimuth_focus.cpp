@@ -1,0 +1,299 @@
+#include "stripmap/azimuth_focus.hpp"
+
+#include <algorithm>
+#include <cmath>
+#include <string>
+#include <vector>
+
+#include "base/diagnostics.hpp"
+#include "stripmap/progress.hpp"
+#include "stripmap/range_focus.hpp"
+#include "stripmap/raster_files.hpp"
+
+namespace sar::stripmap {
+
+namespace {
+
+constexpr int kRejected = 10;
+
+double poly5(const double p[5], double x) { return p[0] + x * (p[1] + x * (p[2] + x * (p[3] + x * p[4]))); }
+
+double spectrum_ky(const wkparm& wk) {
+  const double fd = wk.spectrumCentreFd != 0.0 ? wk.spectrumCentreFd : wk.fd;
+  return 2.0 * kPi * fd / wk.V;
+}
+
+// Block record of a scene from the job's records; lines and samples of the whole matrix.
+wkparm scene_wkparm(const sarpar& par, const procparm& proc, const azimuthconf& az) {
+  wkparm wk;
+  wk.progressFlag = proc.progressFlag;
+  wk.lines = proc.lines;
+  wk.samples = proc.rangeSamples;
+  wk.carrier = par.carrierFrequency;
+  wk.fs = par.samplingRate;
+  wk.prf = par.prf;
+  wk.rangePadding = 1.0;
+  wk.rate = {proc.dopplerRate[0], proc.dopplerRate[1], proc.dopplerRate[4]};
+  wk.rateReference = proc.dopplerRate[7];
+  wk.nearTime = par.nearRangeTime;
+  wk.AntennaLength = az.AntennaLength;
+  wk.azimuthWindowH = az.AzimuthWindowHammingParameter;
+  wk.rangeWindowH = az.RangeWindowHammingParameter;
+  wk.azimuthLookBandwidth = az.AzimuthLookBandwidth;
+  wk.rangeLookBandwidth = az.RangeLookBandwidth;
+  wk.azimuthTransitionBandwidth = az.AzimuthTransitionBandwidth;
+  wk.rangeTransitionBandwidth = az.RangeTransitionBandwidth;
+  wk.WhiteningFlag = az.WhiteningFlag;
+  wk.PerformInterpolation = az.PerformInterpolation;
+  wk.StoltPadding = az.StoltPadding;
+  wk.chirpBandwidth = par.chirp_bandwidth;
+  return wk;
+}
+
+}  // namespace
+
+void WKShifts(const wkparm& wk, double& sa, double& sr) {
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const double dr = kHalfC / wk.fs;
+  sa = wk.PerformInterpolation == 0 ? ky0 * wk.R0 / kx0 : ((wk.samples / 2) * kx0 * dr / kr0 + wk.R0) * ky0 / kx0;
+  if (wk.azimuthShift != static_cast<double>(wk.lines)) sa = wk.V * wk.azimuthShift;
+  sr = (kr0 / kx0 - 1.0) * wk.R0;
+  if (wk.rangeShift != static_cast<double>(wk.samples)) sr = wk.rangeShift * kHalfC;
+  sr += wk.R0;
+  if (wk.PerformInterpolation == 0) sr += (wk.samples / 2) * (kx0 / kr0 - 1.0) * dr;
+}
+
+int focazwk(wkparm& wk, focazwk_result& result) {
+  base::Frame frame("focazwk");
+  if (int st = frame.check(MyComputeEqPar(wk))) return st;
+  int M = 0, Nout = 0;
+  double spacing = 0.0, Ni = 0.0;
+  if (int st = frame.check(OutImagePar(wk, M, spacing, Ni, Nout))) return st;
+  std::vector<double> ky, ky2, rs;
+  KyAxis(wk, ky, ky2, rs);
+  double sa = 0.0, sr = 0.0;
+  WKShifts(wk, sa, sr);
+  result.lines = wk.lines;
+  result.samples = wk.samples;
+  result.rangeSpacing = kHalfC / wk.fs;
+  if (wk.rangePadding != 1.0 && wk.PerformInterpolation > 0) {
+    result.rangeSpacing = spacing;
+    result.samples = Nout;
+  }
+  result.fd = wk.fd;
+  result.azimuthShift = sa / wk.V;
+  result.rangeShift = sr * kTwoOverC;
+  int st = 0;
+  if (wk.PerformInterpolation == 0)
+    st = FastWK(wk, ky, ky2, rs, sa, sr);
+  else if (wk.PerformInterpolation == 1)
+    st = ChirpInterpWK(wk, Ni, M, Nout, ky, ky2, rs, spacing, sa, sr);
+  else
+    st = LSInterpWK(wk, Ni, M, Nout, ky, ky2, spacing, sa, sr);
+  return frame.check(st);
+}
+
+int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const double poly[5], double reference) {
+  base::Frame frame("multirg");
+  const int32_t n = wk.samples, lines = wk.lines;
+  const int32_t Sn = Sb - Ov;
+  if (Sb <= 0 || Ov < 0 || Sn <= 0 || n <= Ov) {
+    base::report(base::kReportError, "Range sub-blocks of " + std::to_string(Sb) + " samples with an overlap of " +
+                                         std::to_string(Ov) + " do not fit a block of " + std::to_string(n) + " samples");
+    return frame.check(kRejected);
+  }
+  const double savedNear = wk.nearTime;
+  const std::span<fcomplex> block = wk.data;
+  wk.fd = poly5(poly, wk.nearTime - reference + (n / wk.fs) / 2);
+  if (int st = frame.check(MyComputeEqPar(wk))) return st;
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const double kd = kx0 - kr0;
+  const int32_t Ns = (n - Ov + Sn - 1) / Sn;
+  dsp::cvector work(static_cast<std::size_t>(Sb) * lines);
+  wk.data = work;
+  wk.samples = Sb;
+  double accum = 0.0, base = 0.0, previousKxc = 0.0;
+  int status = 0;
+  for (int32_t sb = 0; sb < Ns && status == 0; ++sb) {
+    const int32_t o = sb * Sn;
+    const int32_t take = std::min(Sb, n - o);
+    std::fill(work.begin(), work.end(), fcomplex{});
+    for (int32_t l = 0; l < lines; ++l) {
+      const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
+      std::copy(src, src + take, work.begin() + static_cast<std::ptrdiff_t>(l) * Sb);
+    }
+    wk.nearTime = savedNear + o / wk.fs;
+    wk.fd = poly5(poly, wk.nearTime - reference + (Sb / wk.fs) / 2);
+    if ((status = frame.check(MyComputeEqPar(wk))) != 0) break;
+    const double ky = spectrum_ky(wk);
+    const double kxc = std::sqrt(kr0 * kr0 - ky * ky);
+    if (sb == 0 || wk.PerformInterpolation == 0) {
+      wk.rangeShift += (std::cos(block_squint(wk)) - kxc / kr0) * (Ov / 2) / wk.fs;
+      accum = 0.0;
+      base = (kr0 / kxc - 1.0) * wk.R0 * kTwoOverC - wk.rangeShift;
+    } else {
+      const double g = previousKxc / kr0;
+      accum = (kxc / kr0) * (Ov / 2) / wk.fs + (Sb * (1.0 - g) - (1.0 - g / 2.0) * Ov) / wk.fs + accum;
+      wk.rangeShift = (kr0 / kxc - 1.0) * wk.R0 * kTwoOverC - accum - base;
+    }
+    previousKxc = kxc;
+    if ((status = frame.check(focazwk(wk, result))) != 0) break;
+    const int32_t back = std::min(Sn, n - o - Ov);
+    for (int32_t l = 0; l < lines; ++l) {
+      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
+      std::copy(src, src + back, block.data() + static_cast<std::ptrdiff_t>(l) * n + o);
+    }
+  }
+  wk.nearTime = savedNear;
+  wk.samples = n;
+  wk.data = block;
+  if (status != 0) return status;
+  if (kd != 0.0) {
+    for (int32_t l = 0; l < lines; ++l) {
+      fcomplex* row = block.data() + static_cast<std::ptrdiff_t>(l) * n;
+      RngShift(row, n, result.rangeSpacing, kd, row, n, 0.0, 1.0);
+    }
+  }
+  return 0;
+}
+
+int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
+  base::Frame frame("azimuthfoc");
+  const bool core = proc.Flag_incore != 0;
+  const int32_t lines = proc.lines, samples = proc.rangeSamples;
+  const int32_t ha = az.AzimuthOverlap, hr = az.RangeOverlap;
+  const double fs = par.samplingRate, prf = par.prf;
+  if (lines <= 0 || samples <= 0) {
+    base::report(base::kReportError, "Azimuth focusing: no range-compressed lines");
+    return frame.check(kRejected);
+  }
+  if (az.LinesInBlock <= 2 * ha || az.LinesInBlock > lines || lines <= 2 * ha) {
+    base::report(base::kReportError, "Azimuth focusing: blocks of " + std::to_string(az.LinesInBlock) +
+                                         " lines with an overlap of " + std::to_string(2 * ha) +
+                                         " do not fit a scene of " + std::to_string(lines) + " lines");
+    return frame.check(kRejected);
+  }
+  if (samples <= 2 * hr || az.SamplesInBlock <= 2 * hr) {
+    base::report(base::kReportError, "Azimuth focusing: range overlap larger than the block");
+    return frame.check(kRejected);
+  }
+  if (core && proc.matrix.size() < static_cast<std::size_t>(lines) * samples) {
+    base::report(base::kReportError, "Azimuth focusing: the range-compressed matrix is not in memory");
+    return frame.check(kRejected);
+  }
+
+  wkparm wk = scene_wkparm(par, proc, az);
+  const auto& dc = proc.dopplerCentroid;
+  const double fd = DCeval(dc, (samples / 2) / fs + par.nearRangeTime, (lines / 2) / prf + par.azimuthStartTime);
+  wk.fd = fd;
+  wk.spectrumCentreFd = proc.centroidOverride != 0.0 ? proc.centroidOverride : fd;
+  if (int st = frame.check(MyComputeEqPar(wk))) return st;
+  proc.equivalentVelocity = wk.V;
+  proc.azimuthPixelSpacing = wk.V / prf;
+  proc.rangePixelSpacing = kHalfC / fs;
+  proc.sceneCentroid = fd;
+  const double squint = std::asin(kC / par.carrierFrequency * fd / (2.0 * wk.V));
+
+  auto shift_from = [](double w, int32_t count, double rate, double geometric) {
+    if (std::abs(w) < count) return w;
+    const double d = w > 0 ? w - count : count + w;
+    return d / rate + geometric;
+  };
+  const double R = wk.PerformInterpolation == 0
+                       ? wk.R0
+                       : wk.R0 + (samples / 2) * (kC / (2.0 * fs)) * std::cos(squint);
+  wk.azimuthShift = shift_from(az.azimuthShift, lines, prf, std::tan(squint) * R / wk.V);
+  wk.rangeShift = shift_from(az.rangeShift, samples, fs, (1.0 / std::cos(squint) - 1.0) * wk.R0 * kTwoOverC);
+  const double sceneRangeShift = wk.rangeShift, sceneAzimuthShift = wk.azimuthShift;
+
+  const int32_t Lb = az.LinesInBlock;
+  int32_t Ln = Lb - 2 * ha;
+  const int32_t full = (lines - 2 * ha) / Ln;
+  const bool remainder = (lines - 2 * ha) % Ln != 0;
+  block_counters() = BlockCounters{0, full + (remainder ? 1 : 0)};
+  const int32_t So = samples - 2 * hr;
+
+  std::unique_ptr<InputRaster> in;
+  std::unique_ptr<OutputRaster> out;
+  if (!core) {
+    in = std::make_unique<InputRaster>(par.rgfPath, static_cast<int64_t>(lines) * samples * 8, "range-focused file");
+    out = std::make_unique<OutputRaster>(par.slcPath);
+  }
+  dsp::cvector block(static_cast<std::size_t>(samples) * Lb);
+  progress_open("Azimuth Focusing");
+  focazwk_result result;
+  int64_t written = 0;  // focused lines so far (core mode packs them at pitch So)
+  for (int32_t b = 0; b <= full; ++b) {
+    const int32_t l0 = b * Ln;
+    int32_t blockLines = Lb;
+    if (b == full) {
+      blockLines = lines - Ln * full;
+      Ln = blockLines - 2 * ha;
+    }
+    block_counters().current = b + 1;
+    if (blockLines <= 2 * ha) continue;
+    const auto count = static_cast<std::size_t>(blockLines) * samples;
+    if (core) {
+      std::copy_n(proc.matrix.begin() + static_cast<std::ptrdiff_t>(l0) * samples, count, block.begin());
+    } else {
+      in->seek(static_cast<int64_t>(l0) * samples * 8);
+      in->read(block.data(), static_cast<int64_t>(count) * 8);
+    }
+    const double t = (blockLines / 2 + l0) / prf + par.azimuthStartTime - dc[8];
+    const double p[5] = {dc[0] + dc[2] * t, dc[1] + dc[3] * t, dc[4], dc[5], dc[6]};
+    wk.lines = blockLines;
+    wk.samples = samples;
+    wk.data = std::span<fcomplex>(block.data(), count);
+    wk.nearTime = par.nearRangeTime;
+    wk.rangeShift = sceneRangeShift;
+    wk.azimuthShift = sceneAzimuthShift;
+    if (int st = frame.check(multirg(wk, result, az.SamplesInBlock, 2 * hr, p, dc[7]))) return st;
+    for (int32_t l = ha; l < ha + Ln; ++l) {
+      const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * samples;
+      if (core) {
+        std::copy(src, src + So, proc.matrix.begin() + static_cast<std::ptrdiff_t>(written) * So);
+      } else {
+        out->write(src, So);
+      }
+      ++written;
+    }
+    progress_update(100.0 * (b + 1) / std::max(1, full + (remainder ? 1 : 0)));
+  }
+  if (core) proc.matrix.resize(static_cast<std::size_t>(written) * So);
+  if (out) out->commit();
+  proc.focusedSamples = So;
+  proc.focusedLines = static_cast<int32_t>(written);
+  proc.firstSampleTime = par.nearRangeTime - sceneRangeShift + hr / fs;
+  proc.firstLineTime = ha / prf + par.azimuthStartTime + sceneAzimuthShift;
+  proc.outputCentroid = proc.dopplerCentroid;
+  proc.outputRate = proc.dopplerRate;
+  progress_update(100.0);
+  return 0;
+}
+
+double getDCshift(const sarpar& par, const procparm& proc, const azimuthconf& az, double& rangeShift,
+                  double& azimuthShift) {
+  wkparm wk = scene_wkparm(par, proc, az);
+  wk.lines = par.lines;
+  wk.samples = par.samples;
+  wk.nearTime = proc.dopplerRate[7];
+  wk.rateReference = proc.dopplerRate[7];
+  const auto& dc = proc.dopplerCentroid;
+  const double fd = DCeval(dc, (par.samples / 2) / par.samplingRate + dc[7], (par.lines / 2) / par.prf + dc[8]);
+  wk.fd = proc.centroidOverride != 0.0 ? proc.centroidOverride : fd;
+  rangeShift = azimuthShift = 0.0;
+  if (MyComputeEqPar(wk) != 0) return fd;
+  const double squint = std::asin(kC / par.carrierFrequency * fd / (2.0 * wk.V));
+  if (az.azimuthShift == 0.0 && az.rangeShift == 0.0) {
+    const double R = az.PerformInterpolation == 0
+                         ? wk.R0
+                         : wk.R0 + (kC / (2.0 * par.samplingRate)) * (par.samples / 2) * std::cos(squint);
+    azimuthShift = R * std::tan(squint) / wk.V;
+    rangeShift = (1.0 / std::cos(squint) - 1.0) * wk.R0 * kTwoOverC;
+  }
+  return fd;
+}
+
+}  // namespace sar::stripmap

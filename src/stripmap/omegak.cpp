@@ -1,0 +1,436 @@
+#include "stripmap/omegak.hpp"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstdio>
+
+#include "base/diagnostics.hpp"
+#include "dsp/czt.hpp"
+#include "dsp/fft.hpp"
+#include "dsp/filters.hpp"
+
+namespace sar::stripmap {
+
+namespace {
+
+using dcomplex = std::complex<double>;
+
+double sinc(double u) { return u == 0.0 ? 1.0 : std::sin(kPi * u) / (kPi * u); }
+
+fcomplex rotate(fcomplex x, double phase, double weight) {
+  const dcomplex p = std::polar(weight, phase);
+  return fcomplex(static_cast<float>(x.real() * p.real() - x.imag() * p.imag()),
+                  static_cast<float>(x.real() * p.imag() + x.imag() * p.real()));
+}
+
+// Spectral weighting of a block: range and azimuth windows, antenna whitening, and the sums
+// that normalise the image so that a window does not change the mean power of distributed
+// scenes. The look angle is computed for every sample, window or not, so the antenna term
+// always follows the sample it weights.
+struct Weighting {
+  double kr0 = 0.0, B = 0.0, A = 0.0, dky = 0.0, squint = 0.0, Lw = 0.0;
+  double hr = 0.0, ha = 0.0, ar = 0.0, br = 0.0, aaz = 0.0, baz = 0.0;
+  bool whiten = false;
+  bool useRange = false;  // whether this kernel applies the range window
+  double normBand = 0.0;  // |kr - kr0| below this enters the normalisation
+
+  bool active() const { return ha != 0.0 || hr != 0.0 || whiten; }
+
+  static double taper(double d, double a, double b, double h) {
+    const double dd = d - a;
+    if (dd <= 0.0) return 1.0;
+    if (dd < b) return (1.0 - h) * std::cos(kPi * dd / b) + h;
+    return 0.0;
+  }
+  double range_weight(double kr) const {
+    return (useRange && hr != 0.0) ? taper(std::abs(kr - kr0), ar * B, br * B, hr) : 1.0;
+  }
+  // Weight of one sample; adds to the normalisation sums when it lies in the chirp's band.
+  double weight(double kr, double ky, double rangeWeight, double& s1, double& s2) const {
+    if (!active()) return 1.0;
+    const double theta = squint - std::asin(std::clamp(ky / kr, -1.0, 1.0));
+    double w = rangeWeight;
+    if (ha != 0.0) w *= taper(std::abs(theta), aaz * A, baz * A, ha);
+    const double t2 = squint - std::asin(std::clamp((ky - dky) / kr, -1.0, 1.0));
+    const double t3 = squint - std::asin(std::clamp((ky + dky) / kr, -1.0, 1.0));
+    auto g4 = [&](double t) {
+      const double s = sinc(Lw * std::sin(t));
+      return s * s * s * s;
+    };
+    const double G = g4(t2) + g4(t3) + g4(theta);
+    if (whiten) w *= 1.0 / (std::sqrt(G) + 0.0001);
+    if (std::abs(kr - kr0) < normBand) {
+      s1 += G;
+      s2 += w * w * G;
+    }
+    return w;
+  }
+};
+
+Weighting make_weighting(const wkparm& wk, bool useRange) {
+  Weighting w;
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  w.kr0 = kr0;
+  w.B = 4.0 * kPi * wk.fs / kC;
+  w.dky = 2.0 * kPi * wk.prf / wk.V;
+  w.squint = block_squint(wk);
+  w.Lw = wk.AntennaLength * wk.carrier / kC;
+  w.whiten = wk.WhiteningFlag != 0;
+  w.useRange = useRange;
+  w.normBand = (wk.chirpBandwidth / wk.fs) * w.B / 2.0;
+  const double kyc = 2.0 * kPi * wk.fd / wk.V;
+  w.A = std::abs(std::asin(std::clamp((kyc + w.dky / 2) / (kr0 - w.B / 2), -1.0, 1.0)) -
+                 std::asin(std::clamp((kyc - w.dky / 2) / (kr0 + w.B / 2), -1.0, 1.0)));
+  w.ha = wk.azimuthWindowH;
+  if (w.ha != 0.0) {
+    if (wk.azimuthLookBandwidth > wk.prf) {
+      std::printf("Wrong azimuth hamming window parameters: no window applied.\n");
+      w.ha = 0.0;
+    } else {
+      w.aaz = (wk.azimuthLookBandwidth - wk.azimuthTransitionBandwidth) / 2 / wk.prf;
+      w.baz = wk.azimuthTransitionBandwidth / 2 / wk.prf;
+    }
+  }
+  w.hr = wk.rangeWindowH;
+  if (w.hr != 0.0) {
+    if (wk.fs < wk.rangeLookBandwidth) {
+      std::printf("Wrong range hamming window parameters: no window applied. \n");
+      w.hr = 0.0;
+    } else {
+      w.ar = (wk.rangeLookBandwidth - wk.rangeTransitionBandwidth) / 2 / wk.fs;
+      w.br = wk.rangeTransitionBandwidth / 2 / wk.fs;
+    }
+  }
+  return w;
+}
+
+// Normalisation factor from per-line sums, added in line order so that the result does not
+// depend on how lines were shared between threads.
+double normalisation(const Weighting& w, const std::vector<std::array<double, 2>>& sums) {
+  if (!w.active()) return 1.0;
+  double s1 = 0.0, s2 = 0.0;
+  for (const auto& s : sums) {
+    s1 += s[0];
+    s2 += s[1];
+  }
+  return (s1 > 0.0 && s2 > 0.0) ? std::sqrt(s2 / s1) : 1.0;
+}
+
+void scale(std::span<fcomplex> data, double norm) {
+  if (norm == 1.0) return;
+  const auto f = static_cast<float>(1.0 / norm);
+  for (auto& x : data) x *= f;
+}
+
+// kx axis of the mapped grid: kx[i] = kxc - floor(M/2) dkx + i dkx.
+struct KxAxis {
+  double first = 0.0, step = 0.0;
+  double at(int i) const { return first + i * step; }
+};
+
+KxAxis kx_axis(double kx0, int M, double spacing) {
+  KxAxis a;
+  a.step = (2.0 * kPi / spacing) / M;
+  a.first = kx0 - std::floor(M / 2.0) * a.step;
+  return a;
+}
+
+}  // namespace
+
+double block_squint(const wkparm& wk) {
+  const double lambda = kC / wk.carrier;
+  const double fd = wk.spectrumCentreFd != 0.0 ? wk.spectrumCentreFd : wk.fd;
+  return std::asin(std::clamp(lambda * fd / (2.0 * wk.V), -1.0, 1.0));
+}
+
+int MyComputeEqPar(wkparm& wk) {
+  const double Tr = wk.samples / wk.fs;
+  const double lambda = kC / wk.carrier;
+  auto fm = [&](double t) { return wk.rate[0] + wk.rate[1] * t + wk.rate[2] * t * t; };
+  const double t1 = wk.nearTime - wk.rateReference;
+  const double fm1 = fm(t1), fm2 = fm(t1 + Tr);
+  const double p = lambda * wk.fd / 2.0;
+  const double d = 1.0 / fm1 - 1.0 / fm2;
+  const double v2 = p * p + kQuarterC * lambda * Tr / d;
+  if (!(fm1 != 0.0 && fm2 != 0.0 && fm1 != fm2 && v2 > p * p && std::isfinite(v2))) {
+    base::report(base::kReportError, "Doppler rate gives no equivalent velocity for the block");
+    return 1;
+  }
+  wk.V = std::sqrt(v2);
+  const double squint = std::asin(p / wk.V);
+  wk.R0 = -std::cos(squint) * Tr * kHalfC / (1.0 - fm1 / fm2);
+  if (wk.PerformInterpolation == 0) wk.R0 += (kC / (2.0 * wk.fs)) * (wk.samples / 2) * std::cos(squint);
+  return 0;
+}
+
+void WKCentre(const wkparm& wk, double& kr0, double& ky0, double& kx0) {
+  kr0 = 4.0 * kPi * wk.carrier / kC;
+  const double fd = wk.spectrumCentreFd != 0.0 ? wk.spectrumCentreFd : wk.fd;
+  ky0 = 2.0 * kPi * fd / wk.V;
+  kx0 = std::sqrt(kr0 * kr0 - ky0 * ky0);
+}
+
+int OutImagePar(const wkparm& wk, int& M, double& spacing, double& Ni, int& Nout) {
+  const double kr0 = 4.0 * kPi * wk.carrier / kC;
+  const double B = 4.0 * kPi * wk.fs / kC;
+  const double kmin = kr0 - B / 2, kmax = kr0 + B / 2;
+  const double ky0 = 2.0 * kPi * wk.fd / wk.V;
+  const double dky = 2.0 * kPi * wk.prf / wk.V;
+  const double kyU = ky0 + dky / 2, kyL = ky0 - dky / 2;
+  if (kyU > kmin) {
+    std::printf("Squint angle too large: reached geometrical limit.\n");
+    return 1;
+  }
+  const double Bkx = wk.fd > 0.0 ? std::sqrt(kmax * kmax - kyL * kyL) - std::sqrt(kmin * kmin - kyU * kyU)
+                                 : std::sqrt(kmax * kmax - kyU * kyU) - std::sqrt(kmin * kmin - kyL * kyL);
+  const double dr = kC / (2.0 * wk.fs);
+  spacing = std::max(wk.rangePadding * dr, 2.0 * kPi / Bkx);
+  const double squint = std::asin(std::clamp(kC / wk.carrier * wk.fd / (2.0 * wk.V), -1.0, 1.0));
+  Nout = static_cast<int>(std::ceil(wk.samples * dr * std::cos(squint) / spacing));
+  M = dsp::genpow(Nout, 1);
+  if (wk.PerformInterpolation == 1) {
+    Ni = std::trunc(M * (std::sqrt(kmax * kmax - ky0 * ky0) - std::sqrt(kmin * kmin - ky0 * ky0)) * spacing /
+                    (2.0 * kPi));
+  } else if (wk.PerformInterpolation > 1) {
+    const int e = static_cast<int>(std::ceil(wk.samples * wk.StoltPadding / 2));
+    Ni = dsp::genpow(wk.samples + 2 * e, 1);
+  } else {
+    Ni = 0.0;
+  }
+  return 0;
+}
+
+void KyAxis(const wkparm& wk, std::vector<double>& ky, std::vector<double>& ky2, std::vector<double>& rs) {
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const auto n = static_cast<std::size_t>(wk.lines);
+  ky.resize(n);
+  ky2.resize(n);
+  rs.resize(n);
+  const double prf = wk.prf, df = prf / wk.lines;
+  const double b = wk.fd - std::floor(wk.fd / prf) * prf;
+  for (std::size_t i = 0; i < n; ++i) {
+    const double u = prf / 2 + static_cast<double>(i) * df - b;
+    const double v = u - std::floor(u / prf) * prf - prf / 2 + wk.fd;
+    ky[i] = 2.0 * kPi * v / wk.V;
+    ky2[i] = ky[i] * ky[i];
+    rs[i] = kr0 - std::sqrt(kx0 * kx0 + ky2[i]);
+  }
+}
+
+void RngShift(const fcomplex* input, int n, double step, double k, fcomplex* output, int nOut, double x0,
+              double norm) {
+  const double inv = 1.0 / norm;
+  for (int i = 0; i < n; ++i) output[i] = rotate(input[i], k * (i * step + x0), inv);
+  for (int i = n; i < nOut; ++i) output[i] = fcomplex{};
+}
+
+int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2*/, std::span<const double> rs,
+           double sa, double sr) {
+  const int n = wk.samples, L = wk.lines;
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const double B = 4.0 * kPi * wk.fs / kC;
+  const double dr = kC / (2.0 * wk.fs);
+  const double squint = block_squint(wk);
+  Weighting w = make_weighting(wk, true);
+
+  dsp::fft_c(n, n, L, L, 1, 1, wk.data);
+  std::vector<double> kr(static_cast<std::size_t>(n)), wr(static_cast<std::size_t>(n));
+  for (int i = 0; i < n; ++i) {
+    const double k = kr0 + (i - n / 2) * B / n;
+    kr[static_cast<std::size_t>((i + n / 2) % n)] = k;
+  }
+  for (int i = 0; i < n; ++i) wr[static_cast<std::size_t>(i)] = w.range_weight(kr[static_cast<std::size_t>(i)]);
+  std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
+#pragma omp parallel for schedule(static)
+  for (int j = 0; j < L; ++j) {
+    fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+    const double y = ky[static_cast<std::size_t>(j)];
+    double s1 = 0.0, s2 = 0.0;
+    for (int i = 0; i < n; ++i) {
+      const double k = kr[static_cast<std::size_t>(i)];
+      const double phi = (y - ky0) * sa + (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k - kr0) * sr;
+      row[i] = rotate(row[i], phi, w.weight(k, y, wr[static_cast<std::size_t>(i)], s1, s2));
+    }
+  }
+  dsp::fft_c(n, n, L, L, -1, 0, wk.data);
+  const double x0 = -(n / 2) * dr * std::cos(squint);
+#pragma omp parallel for schedule(static)
+  for (int j = 0; j < L; ++j) {
+    fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+    RngShift(row, n, dr, rs[static_cast<std::size_t>(j)], row, n, x0, 1.0);
+  }
+  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
+  return 0;
+}
+
+int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> ky, std::span<const double> /*ky2*/,
+                  std::span<const double> rs, double spacing, double sa, double sr) {
+  const int n = wk.samples, L = wk.lines;
+  const int M2 = static_cast<int>(std::lround(Ni));
+  if (M2 < 2 || M < 1 || Nout > n) {
+    base::report(base::kReportError, "Stolt grid of the block cannot be built");
+    return 1;
+  }
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const double B = 4.0 * kPi * wk.fs / kC;
+  const double dk = B / Ni;
+  const double squint = block_squint(wk);
+  const KxAxis kx = kx_axis(kx0, M, spacing);
+  const Weighting w = make_weighting(wk, false);
+  const double half = std::floor(M2 / 2.0);
+  const double endOffset = (M2 - 1) * dk - half * dk;
+
+  dsp::fft_c(n, n, L, L, 0, 1, wk.data);
+  dsp::czt_plan plan;
+  if (dsp::czt_makep_c(plan, n, M2) != 0) return 1;
+  dsp::fft_plan back;
+  if (dsp::fft_makep_c(back, M, M, 1, 1, -1, 0, 1) != 0) return 1;
+  std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
+
+#pragma omp parallel
+  {
+    dsp::cvector z(static_cast<std::size_t>(M2) + 1), out(static_cast<std::size_t>(M));
+#pragma omp for schedule(dynamic, 16)
+    for (int j = 0; j < L; ++j) {
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      const double y = ky[static_cast<std::size_t>(j)], r = rs[static_cast<std::size_t>(j)];
+      const double e = r - std::trunc(r / dk) * dk;
+      const double s = -half * dk - e;
+      const double lowArg = (s + kr0) * (s + kr0) - y * y, highArg = (endOffset - e + kr0) * (endOffset - e + kr0) - y * y;
+      int i1 = 1, i2 = 0;
+      if (lowArg > 0.0 && highArg > 0.0) {
+        i1 = std::max(0, static_cast<int>(std::ceil((std::sqrt(lowArg) - kx.first) / kx.step)));
+        i2 = std::min(M - 1, static_cast<int>(std::floor((std::sqrt(highArg) - kx.first) / kx.step)) - 1);
+      }
+      if (i1 > i2) {
+        std::fill(row, row + n, fcomplex{});
+        continue;
+      }
+      dsp::pczt_c(plan, std::span<const fcomplex>(row, static_cast<std::size_t>(n)),
+                  std::span<fcomplex>(z.data(), static_cast<std::size_t>(M2)), -2.0 * kPi / Ni, s * (2.0 * kPi / B), 1);
+      z[static_cast<std::size_t>(M2)] = fcomplex{};
+      auto bin = [&](int i) { return (std::sqrt(kx.at(i) * kx.at(i) + y * y) - kr0 - s) / dk; };
+      const int m1 = std::max(0, static_cast<int>(std::floor(bin(i1))));
+      const int m2 = std::min(M2 - 1, static_cast<int>(std::floor(bin(i2))) + 1);
+      double s1 = 0.0, s2 = 0.0;
+      for (int m = m1; m <= m2; ++m) {
+        const double k = kr0 + s + m * dk;
+        const double phi = (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k + r - kr0) * sr;
+        z[static_cast<std::size_t>(m)] = rotate(z[static_cast<std::size_t>(m)], phi, w.weight(k, y, 1.0, s1, s2));
+      }
+      sums[static_cast<std::size_t>(j)] = {s1, s2};
+      std::fill(out.begin(), out.end(), fcomplex{});
+      const double lineTurn = (y - ky0) * sa + (wk.R0 / std::cos(squint)) * r;
+      for (int i = i1; i <= i2; ++i) {
+        const double x = bin(i);
+        const int p = static_cast<int>(std::floor(x));
+        if (p < 0 || p >= M2) continue;
+        const double t = x - p;
+        const dcomplex a = dcomplex(z[static_cast<std::size_t>(p)]) * std::polar(1.0 - t, kPi * t);
+        const dcomplex b = dcomplex(z[static_cast<std::size_t>(p + 1)]) * std::polar(t, -kPi * (1.0 - t));
+        const dcomplex v = (a + b) * std::polar(1.0, lineTurn);
+        out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+      }
+      dsp::pfft_c(back, out);
+      std::copy(out.begin(), out.begin() + Nout, row);
+      std::fill(row + Nout, row + n, fcomplex{});
+    }
+  }
+  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
+  scale(wk.data, normalisation(w, sums));
+  return 0;
+}
+
+int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> ky, std::span<const double> /*ky2*/,
+               double spacing, double sa, double sr) {
+  const int n = wk.samples, L = wk.lines;
+  const int order = wk.PerformInterpolation;
+  const int taps = 2 * order + 1;
+  const int N = static_cast<int>(Ni);
+  if (N < n || M < 1 || Nout > n) {
+    base::report(base::kReportError, "Stolt grid of the block cannot be built");
+    return 1;
+  }
+  std::vector<fcomplex> bank(static_cast<std::size_t>(101 * taps));
+  if (dsp::MakeGLS(bank, taps, 101, 1.0 - wk.StoltPadding) != 0) {
+    base::report(base::kReportError, "Stolt interpolator bank cannot be designed");
+    return 1;
+  }
+  double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
+  WKCentre(wk, kr0, ky0, kx0);
+  const double B = 4.0 * kPi * wk.fs / kC;
+  const double dk = B / N;
+  const double krs = kr0 - std::floor(N / 2.0) * dk;
+  const double kre = krs + (N - 1) * dk;
+  const double dr = kC / (2.0 * wk.fs);
+  const double squint = block_squint(wk);
+  const int P = wk.StoltPadding == 0.0 ? 0 : (N - n) / 2;
+  const double q = std::cos(squint) * P * dr;
+  const KxAxis kx = kx_axis(kx0, M, spacing);
+  const Weighting w = make_weighting(wk, true);
+  std::vector<double> wr(static_cast<std::size_t>(N));
+  for (int m = 0; m < N; ++m) wr[static_cast<std::size_t>(m)] = w.range_weight(krs + m * dk);
+
+  dsp::fft_c(n, n, L, L, 0, 1, wk.data);
+  dsp::fft_plan fwd, back;
+  if (dsp::fft_makep_c(fwd, N, N, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(back, M, M, 1, 1, -1, 0, 1) != 0) return 1;
+  std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
+
+#pragma omp parallel
+  {
+    dsp::cvector buf(static_cast<std::size_t>(N + 2 * order + 2)), out(static_cast<std::size_t>(M));
+#pragma omp for schedule(dynamic, 16)
+    for (int j = 0; j < L; ++j) {
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      const double y = ky[static_cast<std::size_t>(j)];
+      const double lowArg = krs * krs - y * y, highArg = kre * kre - y * y;
+      int i1 = 1, i2 = 0;
+      if (lowArg > 0.0 && highArg > 0.0) {
+        i1 = std::max(0, static_cast<int>(std::ceil((std::sqrt(lowArg) - kx.first) / kx.step)));
+        i2 = std::min(M - 1, static_cast<int>(std::floor((std::sqrt(highArg) - kx.first) / kx.step)) - 1);
+      }
+      if (i1 > i2) {
+        std::fill(row, row + n, fcomplex{});
+        continue;
+      }
+      std::fill(buf.begin(), buf.end(), fcomplex{});
+      fcomplex* line = buf.data() + order;
+      std::copy(row, row + n, line + P);
+      dsp::pfft_c(fwd, std::span<fcomplex>(line, static_cast<std::size_t>(N)));
+      dsp::fftshift(std::span<fcomplex>(line, static_cast<std::size_t>(N)), N, 1);
+      double s1 = 0.0, s2 = 0.0;
+      for (int m = 0; m < N; ++m) {
+        const double k = krs + m * dk;
+        const double phi = (std::sqrt(k * k - y * y) - kx0) * (wk.R0 - q) - (k - kr0) * (sr - P * dr) + (y - ky0) * sa;
+        line[m] = rotate(line[m], phi, w.weight(k, y, wr[static_cast<std::size_t>(m)], s1, s2));
+      }
+      sums[static_cast<std::size_t>(j)] = {s1, s2};
+      std::fill(out.begin(), out.end(), fcomplex{});
+      for (int i = i1; i <= i2; ++i) {
+        const double x = std::abs(std::sqrt(kx.at(i) * kx.at(i) + y * y) - krs) / dk;
+        const auto p = static_cast<int>(std::lround(x));
+        const auto f = static_cast<int>(std::lround(100.0 * (x - p)));
+        if (p < 0 || p >= N) continue;
+        const fcomplex* h = bank.data() + static_cast<std::ptrdiff_t>(f + 50) * taps;
+        // buf index p + t counts from the `order` leading zeros: sample p + t - order of the line.
+        dcomplex acc;
+        for (int t = 0; t < taps; ++t) acc += dcomplex(buf[static_cast<std::size_t>(p + t)]) * dcomplex(h[t]);
+        acc *= std::polar(1.0, (kx.at(i) - kx0) * q);
+        out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(acc.real()), static_cast<float>(acc.imag()));
+      }
+      dsp::pfft_c(back, out);
+      std::copy(out.begin(), out.begin() + Nout, row);
+      std::fill(row + Nout, row + n, fcomplex{});
+    }
+  }
+  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
+  scale(wk.data, normalisation(w, sums));
+  return 0;
+}
+
+}  // namespace sar::stripmap
