@@ -1,5 +1,11 @@
 #include "jobs/im_job.hpp"
 
+#include <complex>
+#include <cstdio>
+#include <span>
+
+#include "hostlib/quicklook.hpp"
+
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -177,6 +183,34 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
   return 0;
 }
 
+// Quick-look of the SLC: amplitude averaged down to the requested size, tied to the ground by the
+// corners that get_coords placed.
+int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
+                    const procparm& proc) {
+  hostlib::QuickLookRequest request;
+  request.maxWidth = width > 0 ? width : 1024;
+  request.maxHeight = height > 0 ? height : 1024;
+  request.scale = scale > 0.0 ? scale : 1.0;
+  request.rangeSpacing = proc.rangePixelSpacing > 0.0 ? proc.rangePixelSpacing : 1.0;
+  request.azimuthSpacing = proc.azimuthPixelSpacing > 0.0 ? proc.azimuthPixelSpacing : 1.0;
+  for (std::size_t i = 0; i < 4; ++i) request.corners[i] = {proc.corners[i].latitude, proc.corners[i].longitude};
+  std::FILE* in = std::fopen(slcPath.c_str(), "rb");
+  if (!in) {
+    note_failed_stage("quick-look: " + slcPath + " cannot be opened");
+    return 10;
+  }
+  const int samples = proc.focusedSamples;
+  auto source = [&](int line, std::span<std::complex<float>> row) {
+    const auto offset = static_cast<long long>(line) * samples * 8;
+    return fseeko(in, static_cast<off_t>(offset), SEEK_SET) == 0 &&
+           std::fread(row.data(), 8, row.size(), in) == row.size();
+  };
+  const int st = hostlib::write_quicklook_geotiff(tifPath, proc.focusedLines, samples, source, request);
+  std::fclose(in);
+  if (st != 0) note_failed_stage("quick-look GeoTIFF " + tifPath);
+  return st;
+}
+
 int main_focussing_asar_im(const std::string& listPath) {
   const std::vector<std::string> args = start_job(listPath, kImTitle, kImBanner, {0, 1, 2, 3, 4});
   const std::string desDir = description_dir();
@@ -249,9 +283,7 @@ int main_focussing_asar_im(const std::string& listPath) {
     const std::string label = base::activity_label();
     base::getAndSetPerc(-1, 0, &label);
     base::getAndSetPerc(-1, 0, nullptr);
-    (void)quickLook1;
-    (void)quickLook2;
-    if (stage_not_built("quick-look GeoTIFF") != 0)
+    if (write_quicklook(slcPath, slcPath + ".tif", std::atof(args[13].c_str()), quickLook1, quickLook2, proc) != 0)
       base::fatal(base::ec::kStageFailed, {"GeoTIFF", failed_stage()});
   }
   return 0;

@@ -8,6 +8,8 @@
 #include "envisat/extract.hpp"
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
+#include "stripmap/azimuth_focus.hpp"
+#include "stripmap/coords.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/range_focus.hpp"
 
@@ -76,9 +78,11 @@ int EstDopplerENVI(const std::string&, double, double, double, double, double, d
 int getnadcpoly(const std::string&, dcestconf&, procparm&) { return stage_not_built("getnadcpoly"); }
 int getgeopoly(sarpar&, procparm&) { return stage_not_built("getgeopoly"); }
 int IMCalibration(sarpar&, procparm&) { return stage_not_built("IMCalibration"); }
-int azimuthfoc(sarpar&, procparm&, azimuthconf&) { return stage_not_built("azimuthfoc"); }
+int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az) {
+  return named("azimuthfoc", stripmap::azimuthfoc(par, proc, az));
+}
 int dest_buffer(sarpar& par, procparm& proc) { return named("dest_buffer", stripmap::dest_buffer(par, proc)); }
-int get_coords(procparm&, sarpar&) { return stage_not_built("get_coords"); }
+int get_coords(procparm& proc, sarpar& par) { return named("get_coords", stripmap::get_coords(proc, par)); }
 int IMwritepars(const std::string&, const sarpar&, const procparm&, const enviauxfiles&) {
   return stage_not_built("IMwritepars");
 }
