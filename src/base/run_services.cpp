@@ -520,6 +520,9 @@ void WriteErrorRecord(int32_t ec, std::span<const std::string> details) {
 
 bool getAndSetPerc(int oldValue, int newValue, const std::string* label) {
   if (oldValue == newValue) return true;
+  // Without run services there is no host to tell, and no working file to stop the run by:
+  // the stages are being used as a library.
+  if (!rs().up) return true;
   std::error_code ec;
   fs::remove(heartbeat_file_path(), ec);
   const std::string wf = working_file_path();

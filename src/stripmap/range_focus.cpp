@@ -122,7 +122,7 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
       for (int32_t k = 0; k < z.padded; ++k) {
         const double xr = x[k].real(), xi = x[k].imag();
         const double hr = h[k].real(), hi = h[k].imag();
-        x[k] = fcomplex(static_cast<float>(xr * hr + xi * hi), static_cast<float>(xi * hr - xr * hi));
+        x[k] = fcomplex(static_cast<float>(xr * hr - xi * hi), static_cast<float>(xi * hr + xr * hi));
       }
     }
     const double done = static_cast<double>(block) * blockLines + stop;
@@ -142,10 +142,30 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
   }
 }
 
-dsp::cvector replica_spectrum(const procparm& proc, const RangeSizes& z) {
+// Offset in samples of the replica's first sample from the leading edge of the pulse. The
+// nominal replica is sampled symmetrically about the pulse centre, so its first sample lies
+// (Tp fs - (n - 1)) / 2 samples into the pulse; correlating with it would put every target that
+// much late. Unknown (0) without a nominal pulse length.
+double replica_lead(const sarpar& par, const RangeSizes& z) {
+  if (!(par.pulse_length > 0.0) || par.resampling_factor > 1) return 0.0;
+  const double lead = (par.pulse_length * par.samplingRate - (z.replicaLength - 1)) / 2.0;
+  return std::abs(lead) < 1.0 ? lead : 0.0;
+}
+
+// Conjugate spectrum of the replica, with the linear phase that moves the correlation peak back
+// by the replica's lead, so that output sample k is two-way time t_near + k / fs.
+dsp::cvector replica_spectrum(const sarpar& par, const procparm& proc, const RangeSizes& z) {
   dsp::cvector h(static_cast<std::size_t>(z.padded), fcomplex{});
   std::copy(proc.replica.begin(), proc.replica.begin() + z.replicaLength, h.begin());
   dsp::fft_c(z.padded, z.padded, 1, 1, 1, 0, h);
+  const double lead = replica_lead(par, z);
+  const int L = z.padded;
+  for (int k = 0; k < L; ++k) {
+    const double f = (k < (L + 1) / 2 ? k : k - L) / static_cast<double>(L);
+    const std::complex<double> c = std::conj(std::complex<double>(h[static_cast<std::size_t>(k)])) *
+                                   std::polar(1.0, 2.0 * 3.14159265358979323846 * f * lead);
+    h[static_cast<std::size_t>(k)] = fcomplex(static_cast<float>(c.real()), static_cast<float>(c.imag()));
+  }
   return h;
 }
 
@@ -239,7 +259,7 @@ int rangefoc(const sarpar& par, procparm& proc) {
   proc.rangeSamples = z.output;
   proc.lines = lines;
 
-  const dsp::cvector h = replica_spectrum(proc, z);
+  const dsp::cvector h = replica_spectrum(par, proc, z);
   progress_open("Range Focusing");
 
   if (core) {

@@ -9,8 +9,10 @@
 // Sizes, for N raw samples, a replica of Lr samples and a window span W = round((t_far -
 // t_near) fs): the correlation length L = genpow(N + W), the valid correlation length
 // V = N - Lr + 1 and the output line V + W samples. Output sample k of a line with shift s holds
-// the correlation of the raw line with the replica at lag k - s: a target whose echo's leading
-// edge lies at raw sample n appears at output sample n + s.
+// the correlation of the raw line with the replica at lag k - s, moved back by the replica's
+// lead (the nominal replica is sampled about the pulse centre, so its first sample lies half a
+// sample into the pulse): a target whose echo's leading edge lies at raw sample n appears at
+// output sample n + s, and output sample k is two-way time t_near + k / fs.
 //
 // Storage modes. File mode reads the raw file and writes the range file (lines x (V + W)
 // complex float, no prefix) in blocks of Azblk lines. Core mode (`init_buffer` first) keeps
