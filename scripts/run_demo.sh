@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
-# Install what is missing, build, then run one IM job end to end in out/demo: simulate a level 0
-# product of point targets (with its orbit and auxiliary files), lay out a working directory,
-# focus, and show what the host would see (log, error record or product files).
+# Install what is missing, build, then run one IM job end to end in out/demo: simulate a
+# full-width level 0 product of point targets over clutter (with its orbit and auxiliary
+# files), lay out a working directory, focus it with the host's entry, measure the targets of
+# the SLC against the simulator's truth and show where the quick-look is.
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
@@ -10,17 +11,18 @@ build="${SAR_BUILD_DIR:-$here/build}"
 demo="$here/out/demo"
 rm -rf "$demo"
 mkdir -p "$demo/input"
-echo "== simulating an IM scene (4096 lines x 2048 samples, three point targets)"
-"$build/tools/sarsim" --out "$demo/input" --lines 4096 --samples 2048 \
-  --target 45.000,10.000,0,1 --target 45.010,10.020,0,2 --target 44.990,10.010,100,1.5 >/dev/null
+echo "== simulating an IM scene (5000 lines x 5616 samples, clutter and four point targets)"
+"$build/tools/sarsim" --out "$demo/input" --lines 5000 --samples 5616 --clutter-db 0 --clutter-contrast low \
+  --target 45.000,10.000,0,6 --target 45.010,10.030,0,6 --target 44.992,9.985,100,5 \
+  --target 45.004,10.060,0,6 >/dev/null
 product=$(ls "$demo"/input/ASA_IM__0*.N1)
 orbit=$(ls "$demo"/input/DOR_VOR_AX*)
 ins=$(ls "$demo"/input/ASA_INS_AX*)
 xca=$(ls "$demo"/input/ASA_XCA_AX*)
 
 exe="$build/src/jobs/focussing"
-"$exe" --setup "$demo" --trace --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
-  --arg 4="$demo/demo" >/dev/null
+"$exe" --setup "$demo" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
+  --arg 4="$demo/demo" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
 
 echo "== running: focussing \"main_focussing_asar_IM#$demo/job.txt\""
 set +e
@@ -28,16 +30,25 @@ VANTERRA_INIT_DIR="$demo" "$exe" "main_focussing_asar_IM#$demo/job.txt"
 status=$?
 set -e
 echo "== exit status: $status"
-echo "== log ($demo/Vanterra.log): extraction and the end of the run"
-grep "EXTR:" "$demo/Vanterra.log" || true
-tail -n 9 "$demo/Vanterra.log"
-if [ -f "$demo/Vanterra.working_error" ]; then
+grep -E "EXTR:|Doppler centroid|SLC:" "$demo/Vanterra.log" || true
+if [ "$status" -ne 0 ]; then
   echo "== error record ($demo/Vanterra.working_error):"
   cat "$demo/Vanterra.working_error"
+  exit "$status"
 fi
-echo "== truth of the simulated scene: $demo/input/truth.txt"
-if ls "$demo"/demo_slc* >/dev/null 2>&1; then
-  ls "$demo"/demo_slc*
-else
-  echo "== no product written yet: the focuser stops at its first stage still to come"
-fi
+
+# Map the truth (raw line of the first packet, sample of the nearest window) onto the SLC grid.
+truth="$demo/input/truth.txt"
+slc_line=$(grep -o "SLC: .*" "$demo/Vanterra.log" | tail -n 1)
+first_line=$(echo "$slc_line" | awk '{print $9}')
+first_sample=$(echo "$slc_line" | awk '{print $13}')
+key() { awk -v k="$1" '$1 == k {print $3; exit}' "$truth"; }
+off_line=$(awk -v a="$first_line" -v b="$(key first_line_time_sec85)" -v p="$(key prf)" 'BEGIN{printf "%.4f", (a-b)*p}')
+off_sample=$(awk -v a="$first_sample" -v b="$(key near_range_time)" -v f="$(key sampling_frequency)" \
+  'BEGIN{printf "%.4f", (a-b)*f}')
+echo "== point targets of the SLC against the truth (sarirf)"
+"$build/tools/sarirf" "$demo/demo_slc" --truth "$truth" --first-line "$off_line" --first-sample "$off_sample" \
+  --json "$demo/irf.json"
+echo "== products:"
+ls -l "$demo"/demo_slc*
+echo "== quick-look: $demo/demo_slc.tif"
