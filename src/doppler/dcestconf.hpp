@@ -1,10 +1,77 @@
 #pragma once
-// Configuration of the Doppler centroid estimator, section "DCestConf" of the parameter file.
+// Configuration of the Doppler centroid estimator, section "DCestConf" of the parameter file,
+// and the working state and results of one estimation.
 #include <array>
+#include <complex>
 #include <cstdint>
+#include <memory>
+#include <span>
 #include <string>
+#include <vector>
 
 namespace sar::doppler {
+
+using fcomplex = std::complex<float>;
+
+/// Nine doubles a0..a8: f = a0 + a1 x + a2 y + a3 x y + a4 x^2 + a5 x^3 + a6 x^4,
+/// x = range time - a7, y = azimuth time - a8. The same layout as the stripmap record's.
+using DopplerPoly = std::array<double, 9>;
+
+/// The WDAR offset before it has been measured.
+inline constexpr double kNoWdarOffset = -9999.9999;
+
+/// Statistics of one grid block. Centroids are in cycles of the PRF.
+struct dcblock {
+  int32_t sample = 0;  ///< centre sample
+  int32_t line = 0;    ///< centre line
+  int32_t valid = 0;   ///< the block statistics were measurable
+  double centroid = 0.0;  ///< fractional centroid, -0.5..0.5
+  double contrast = 0.0;
+  double power = 0.0;      ///< mean power per range bin
+  double noise = 0.0;      ///< noise power per range bin
+  double snr = 0.0;
+  double phaseVariance = 0.0;
+  int32_t good = 0;    ///< valid with a positive SNR: enters the polynomial fit
+  int32_t filled = 0;  ///< centroid taken from neighbours
+};
+
+/// A high-contrast block chosen for the multi-look beat frequency estimator.
+struct mlbfblock {
+  int32_t sample = 0;
+  int32_t line = 0;
+  int32_t spare = 0;
+  std::vector<double> estimates;  ///< one per look pair; candidate ambiguities after the decision
+  std::vector<double> quality;    ///< peak over the largest side value of each beat spectrum
+};
+
+/// A low-contrast block chosen for the wavelength diversity estimator.
+struct wdarblock {
+  int32_t sample = 0;
+  int32_t line = 0;
+  double estimate = 0.0;  ///< absolute centroid in PRF, then candidate ambiguity
+};
+
+/// Trimmed statistics of one set of candidate ambiguities.
+struct ambstats {
+  double mean = 0.0;
+  double std = 0.0;
+  int32_t count = 0;  ///< values kept by the last trim
+  int32_t total = 0;  ///< values in the set
+};
+
+/// Which answer the ambiguity field holds.
+enum class AmbiguityDecision : int32_t {
+  None = 0,              ///< Amb_flag 0: ambiguity 0 by configuration
+  Geometry = 1,          ///< Amb_flag 2: geometric prediction by configuration
+  Mlbf = 2,              ///< beat frequency estimator, reliable
+  Wdar = 3,              ///< wavelength diversity estimator alone (beat frequency unreliable)
+  GeometryFallback = 4,  ///< neither estimator could decide: geometric prediction applied
+};
+
+namespace detail {
+struct WdarState;
+struct MlbfState;
+}  // namespace detail
 
 struct dcestconf {
   int32_t progressFlag = 0;  // copied from the job record
@@ -38,9 +105,39 @@ struct dcestconf {
   int32_t Amb_flag = 0;
   std::array<int32_t, 7> Pol_Weights{};
   // Filled by the job before the estimation.
-  std::string inputPath;
-  std::string outputDir;
-  double wantedPolyPoints = 0.0;
+  std::string inputPath;    ///< range-compressed file (file mode)
+  std::string outputDir;    ///< result directory of DCEST_resume.txt
+  double wantedPolyPoints = 0.0;  ///< platform speed the job hands to the image description, m/s
+  double carrier = 0.0;            ///< radar frequency, Hz
+  double fs = 0.0;                 ///< range sampling rate, Hz
+  double geometricCentroid = 0.0;  ///< Hz at scene centre, from the orbit geometry
+  /// Core mode: the range-compressed matrix, lines x samples of the image description.
+  std::span<const fcomplex> coreMatrix;
+
+  // Working values and results of one estimation.
+  double r0 = 0.0;  ///< theoretic autocorrelation at lag 0
+  double r1 = 0.0;  ///< theoretic autocorrelation at lag 1
+  double wdarOffset = kNoWdarOffset;
+  int32_t ambiguity = 0;
+  int32_t geometricAmbiguity = 0;
+  AmbiguityDecision decision = AmbiguityDecision::None;
+  int32_t gridBlocks = 0;
+  int32_t blocksAcross = 0;
+  int32_t blockRows = 0;
+  int32_t rowsInMemory = 0;
+  int32_t patchesAcross = 0;
+  int32_t patchesDown = 0;
+  std::vector<dcblock> blocks;
+  std::vector<mlbfblock> mlbfBlocks;
+  std::vector<wdarblock> wdarBlocks;
+  std::vector<float> powerMap;     ///< mean power per patch
+  std::vector<float> contrastMap;  ///< mean squared power per patch, then the contrast
+  ambstats mlbfStats;
+  ambstats wdarStats;
+  /// Plane of the phase field: range slope, azimuth slope (cycles per sample, per line), offset.
+  std::array<double, 3> plane{};
+  std::shared_ptr<detail::WdarState> wdar;
+  std::shared_ptr<detail::MlbfState> mlbf;
 };
 
 }  // namespace sar::doppler

@@ -5,6 +5,7 @@
 #include <span>
 
 #include "hostlib/quicklook.hpp"
+#include "jobs/annotation.hpp"
 
 #include <cerrno>
 #include <cstdio>
@@ -148,15 +149,19 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
     if (flags[kStageCleanup]) remove_work_file(par.extrPath);
   }
   if (flags[kStageDoppler]) {
+    // The centroid the geometry predicts at the scene centre: mid-scene azimuth time and the
+    // mid-swath two-way time, with the yaw-steering law of the platform.
     const double wavelength = kSpeedOfLight / par.carrierFrequency;
+    const double midTime = par.azimuthStartTime + par.lines / (2.0 * par.prf);
     const double midRange = 0.5 * par.samples / par.samplingRate + par.nearRangeTime;
-    if (int st = frame.check(EstDopplerENVI(files.orbit, midRange, par.nearRangeTime, kAttitude[0], kAttitude[1],
-                                            wavelength, kAttitude[3], kAttitude[4], kAttitude[5], kAttitude[6], proc)))
+    if (int st = frame.check(EstDopplerENVI(files.orbit, midTime, midRange, kAttitude[0], kAttitude[1], wavelength,
+                                            kAttitude[3], kAttitude[4], kAttitude[5], kAttitude[6], 0.0,
+                                            dc.geometricCentroid)))
       return st;
     dc.inputPath = par.rgfPath;
     dc.outputDir = dir;
     dc.wantedPolyPoints = kWantedPolyPoints;
-    if (int st = frame.check(getnadcpoly(dc.inputPath, dc, proc))) return st;
+    if (int st = frame.check(getnadcpoly(dc.inputPath, dc, par, proc))) return st;
     if (int st = frame.check(getgeopoly(par, proc))) return st;
     if (flags[kStageCleanup]) remove_work_file(dir + "/DCEST_resume.txt");
   }
@@ -274,7 +279,7 @@ int main_focussing_asar_im(const std::string& listPath) {
     base::fatal(base::ec::kStageFailed, {"IMprocessor()", failed_stage()});
 
   const std::string headerPath = slcPath + "_hdr";
-  if (IMwritepars(headerPath, par, proc, files) != 0)
+  if (IMwritepars(headerPath, par, proc, dc, az, extra, files) != 0)
     base::fatal(base::ec::kStageFailed, {"IMwritepars_kelvor()", failed_stage()});
   errno = 0;
 

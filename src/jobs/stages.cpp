@@ -8,8 +8,11 @@
 #include "envisat/extract.hpp"
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
+#include "doppler/dcest.hpp"
+#include "geometry/doppler_geometry.hpp"
 #include "stripmap/azimuth_focus.hpp"
 #include "stripmap/coords.hpp"
+#include "stripmap/geopoly.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/range_focus.hpp"
 
@@ -71,19 +74,54 @@ int envi_syntchirp(sarpar& par, procparm& proc) { return named("envi_syntchirp",
 // Stages still to come. Each later stage replaces its line here with the real call.
 int init_buffer(sarpar& par, procparm& proc) { return named("init_buffer", stripmap::init_buffer(par, proc)); }
 int rangefoc(sarpar& par, procparm& proc) { return named("rangefoc", stripmap::rangefoc(par, proc)); }
-int EstDopplerENVI(const std::string&, double, double, double, double, double, double, double, double, double,
-                   procparm&) {
-  return stage_not_built("EstDopplerENVI");
+int EstDopplerENVI(const std::string& orbitPath, double t, double tau, double term1, double term2, double wavelength,
+                   double p, double q, double r, double s, double a, double& fdc) {
+  return named("EstDopplerENVI", geometry::EstDopplerENVI(orbitPath, t, tau, term1, term2, wavelength, p, q, r, s, a, fdc));
 }
-int getnadcpoly(const std::string&, dcestconf&, procparm&) { return stage_not_built("getnadcpoly"); }
-int getgeopoly(sarpar&, procparm&) { return stage_not_built("getgeopoly"); }
+int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm& proc) {
+  doppler::dcimage image;
+  image.path = input;
+  image.samples = proc.rangeSamples;
+  image.lines = proc.lines;
+  image.prf = par.prf;
+  image.platformSpeed = conf.wantedPolyPoints;  // the job hands over the platform speed there
+  image.rangeTimeOrigin = par.nearRangeTime;
+  image.azimuthTimeOrigin = par.azimuthStartTime;
+  conf.carrier = par.carrierFrequency;
+  conf.fs = par.samplingRate;
+  if (conf.Flag_incore) conf.coreMatrix = std::span<const dsp::fcomplex>(proc.matrix.data(), proc.matrix.size());
+  doppler::DopplerPoly poly{};
+  int st = doppler::getnadcpoly(image, conf, poly);
+  conf.coreMatrix = {};
+  if (st == -1) {
+    // The data hold too little signal for any block estimate (a dark or point-only scene): the
+    // orbit's prediction is the best centroid there is, and the run says so.
+    base::report(base::kReportWarning, "Doppler centroid not measurable from the data: the geometric centroid is used");
+    base::LogPrintf("Doppler centroid from the orbit geometry: %.3f Hz\n", conf.geometricCentroid);
+    poly = doppler::DopplerPoly{};
+    poly[0] = conf.geometricCentroid;
+    poly[7] = par.nearRangeTime;
+    poly[8] = par.azimuthStartTime;
+    st = 0;
+  }
+  named("getnadcpoly", st);
+  if (st == 0) {
+    std::copy(poly.begin(), poly.end(), proc.dopplerCentroid.begin());
+    base::LogPrintf("Doppler centroid at the scene centre: %.3f Hz\n",
+                    stripmap::DCeval(proc.dopplerCentroid, par.nearRangeTime + 0.5 * proc.rangeSamples / par.samplingRate,
+                                     par.azimuthStartTime + 0.5 * proc.lines / par.prf));
+  }
+  return st;
+}
+int getgeopoly(sarpar& par, procparm& proc) { return named("getgeopoly", stripmap::getgeopoly(par, proc)); }
 int IMCalibration(sarpar&, procparm&) { return stage_not_built("IMCalibration"); }
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az) {
-  return named("azimuthfoc", stripmap::azimuthfoc(par, proc, az));
+  const int st = named("azimuthfoc", stripmap::azimuthfoc(par, proc, az));
+  if (st == 0)
+    base::LogPrintf("SLC: %d lines of %d samples, first line %.9f s, first sample %.12g s\n", proc.focusedLines,
+                    proc.focusedSamples, proc.firstLineTime, proc.firstSampleTime);
+  return st;
 }
 int dest_buffer(sarpar& par, procparm& proc) { return named("dest_buffer", stripmap::dest_buffer(par, proc)); }
 int get_coords(procparm& proc, sarpar& par) { return named("get_coords", stripmap::get_coords(proc, par)); }
-int IMwritepars(const std::string&, const sarpar&, const procparm&, const enviauxfiles&) {
-  return stage_not_built("IMwritepars");
-}
 }  // namespace sar::jobs

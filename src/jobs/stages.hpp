@@ -55,14 +55,17 @@ int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpa
 int envi_syntchirp(sarpar& par, procparm& proc);
 int init_buffer(sarpar& par, procparm& proc);
 int rangefoc(sarpar& par, procparm& proc);
-int EstDopplerENVI(const std::string& orbitPath, double midRangeTime, double nearRangeTime, double attitude1,
-                   double attitude2, double wavelength, double a0, double a1, double a2, double a3, procparm& proc);
-int getnadcpoly(const std::string& input, dcestconf& conf, procparm& proc);
+/// Geometric centroid (Hz) at azimuth time t (sec85) and two-way time tau from the orbit and the
+/// attitude law: two carried terms, the wavelength, p, q, r, s (degrees) and the azimuth offset.
+int EstDopplerENVI(const std::string& orbitPath, double t, double tau, double term1, double term2, double wavelength,
+                   double p, double q, double r, double s, double a, double& fdc);
+/// Doppler centroid polynomial of the range-compressed image (file `input`, or the matrix in
+/// core mode) into proc.dopplerCentroid, with its ambiguity.
+int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm& proc);
 int getgeopoly(sarpar& par, procparm& proc);
 int IMCalibration(sarpar& par, procparm& proc);
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az);
 int dest_buffer(sarpar& par, procparm& proc);
 int get_coords(procparm& proc, sarpar& par);
-int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const enviauxfiles& files);
 
 }  // namespace sar::jobs

@@ -183,8 +183,10 @@ TEST(Level0Product, PointTargetEchoLiesWhereTheTruthSaysAndSurvivesQuantisation)
   }
   EXPECT_NEAR(best_lag, target.range_sample, 1.0);
   // Compressed amplitude: the target's amplitude times the pulse samples, within the losses of
-  // 8-bit and 4-bit quantisation.
-  EXPECT_NEAR(best / n, target.target.amplitude, 0.15 * target.target.amplitude);
+  // 8-bit and 4-bit quantisation and of sampling the response off its peak.
+  // The target lies between samples, which costs up to a third of the peak at whole-sample lags.
+  EXPECT_GT(best / n, 0.6 * target.target.amplitude);
+  EXPECT_LT(best / n, 1.15 * target.target.amplitude);
 
   // Azimuth: the phase of the compressed target along the lines is -4 pi R / lambda, a parabola
   // whose vertex is the zero-Doppler line and whose curvature is the Doppler rate.

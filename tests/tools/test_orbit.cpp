@@ -1,6 +1,7 @@
 // Orbit model and DOR_VOR writer of the simulator.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <filesystem>
 #include <fstream>
@@ -10,6 +11,7 @@
 #include "header_shape.hpp"
 #include "base/convert.hpp"
 #include "envisat/product_types.hpp"
+#include "simulator/attitude.hpp"
 #include "simulator/orbit_file.hpp"
 #include "simulator/orbit_model.hpp"
 
@@ -58,6 +60,76 @@ TEST(OrbitModel, IsARealisticEnvisatOrbit) {
     EXPECT_LT((numeric - s.velocity).norm(), 1e-3);
   }
   EXPECT_NEAR(max_lat, 180.0 - 98.55, 0.3);  // geodetic latitude of the highest point
+}
+
+// The radius follows the ellipsoid: the geodetic altitude hardly moves over an orbit while the
+// radius drops by some 21 km towards the poles, and the radial velocity is the ellipsoid's
+// -(a - b) sin^2(i) sin(2u) du/dt, about 22 m/s. The circular orbit keeps neither.
+TEST(OrbitModel, RadiusFollowsTheEllipsoid) {
+  const sim::OrbitModel orbit = sim::OrbitModel::for_scene({45.0, 10.0, 0.0}, kScene, 23.0, false, 31400);
+  const double n = orbit.elements().mean_motion, u0 = orbit.elements().arg_latitude;
+  const double si = std::sin(orbit.elements().inclination_deg * sim::kPi / 180.0);
+  double h_min = 1e9, h_max = -1e9, vr_max = 0.0;
+  for (double dt = 0.0; dt < orbit.period(); dt += 30.0) {
+    const sim::StateVector s = orbit.state_at_offset(dt);
+    const double h = sim::ecef_to_geodetic(s.position).height;
+    h_min = std::min(h_min, h);
+    h_max = std::max(h_max, h);
+    const double u = u0 + n * dt;
+    EXPECT_NEAR(s.position.norm(), orbit.radius(u), 1e-6);
+    const double vr = s.velocity.dot(s.position.unit());
+    EXPECT_NEAR(vr, -(sim::kWgs84A - sim::kWgs84B) * si * si * std::sin(2.0 * u) * n, 1e-6);
+    vr_max = std::max(vr_max, std::abs(vr));
+  }
+  EXPECT_LT(h_max - h_min, 200.0);
+  EXPECT_NEAR(vr_max, 21.8, 0.2);
+  EXPECT_NEAR(orbit.radius(0.0) - orbit.radius(sim::kPi / 2.0), 21385.0 * si * si, 1.0);
+
+  sim::OrbitElements circular = orbit.elements();
+  circular.radius_dip = 0.0;
+  const sim::OrbitModel round(circular);
+  double round_min = 1e9, round_max = -1e9;
+  for (double dt = 0.0; dt < orbit.period(); dt += 30.0) {
+    const sim::StateVector s = round.state_at_offset(dt);
+    EXPECT_NEAR(s.velocity.dot(s.position.unit()), 0.0, 1e-6);
+    const double h = sim::ecef_to_geodetic(s.position).height;
+    round_min = std::min(round_min, h);
+    round_max = std::max(round_max, h);
+  }
+  EXPECT_GT(round_max - round_min, 20e3);
+}
+
+// ENVISAT's yaw-steering law keeps the beam-centre Doppler near zero all round this orbit, at
+// near, mid and far range. Its pitch term answers the radial velocity of an orbit that follows
+// the ellipsoid: the sin(2u) part of the centroid stays within a few hertz, where a circular
+// orbit leaves some 750 Hz. What remains is a cos(u) part of about 29 Hz at mid range from the
+// yaw term (its amplitude p is some 0.015 deg short of cancelling this orbit's Earth rotation).
+TEST(OrbitModel, YawSteeringKeepsTheCentroidNearZeroAllRound) {
+  const double wavelength = sim::kSpeedOfLight / 5.331004416e9;
+  const sim::Attitude steered;  // yaw steering, no squint
+  constexpr int kSteps = 72;
+  for (const bool ascending : {false, true}) {
+    SCOPED_TRACE(ascending ? "ascending" : "descending");
+    const sim::OrbitModel orbit = sim::OrbitModel::for_scene({45.0, 10.0, 0.0}, kScene, 23.0, ascending, 31400);
+    sim::OrbitElements circular = orbit.elements();
+    circular.radius_dip = 0.0;
+    const sim::OrbitModel round(circular);
+    double worst = 0.0, sin2u = 0.0, cosu = 0.0, sin2u_round = 0.0;
+    for (int k = 0; k < kSteps; ++k) {
+      const double t = kScene + k * orbit.period() / kSteps;
+      const double u = sim::argument_of_latitude(orbit, t);
+      for (const double tau : {5.5e-3, 5.75e-3, 6.0e-3})
+        worst = std::max(worst, std::abs(sim::beam_centre_doppler(orbit, steered, t, tau, wavelength)));
+      const double mid = sim::beam_centre_doppler(orbit, steered, t, 5.75e-3, wavelength);
+      sin2u += 2.0 / kSteps * mid * std::sin(2.0 * u);
+      cosu += 2.0 / kSteps * mid * std::cos(u);
+      sin2u_round += 2.0 / kSteps * sim::beam_centre_doppler(round, steered, t, 5.75e-3, wavelength) * std::sin(2.0 * u);
+    }
+    EXPECT_LT(std::abs(sin2u), 8.0);
+    EXPECT_GT(std::abs(sin2u_round), 700.0);
+    EXPECT_LT(std::abs(cosu), 32.0);
+    EXPECT_LT(worst, 40.0);
+  }
 }
 
 TEST(OrbitModel, SceneTargetIsSeenAtZeroDopplerToTheRight) {

@@ -4,6 +4,15 @@
 //   sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]
 //          [--fault NAME]... [--time "dd-MMM-yyyy hh:mm:ss.uuuuuu"] [--ascending] [--seed S]
 //          [--first-counter C] [--ins-template FILE] [--xca-template FILE] [--no-aux]
+//          [--yaw-steering on|off] [--squint-hz F]
+//          [--clutter-db DB] [--clutter-contrast low|high]
+//
+// The beam is steered to zero Doppler unless --yaw-steering on (ENVISAT's yaw steering law)
+// or --squint-hz F (the squint that puts the Doppler centroid at F Hz at the scene centre).
+//
+// --clutter-db DB adds distributed clutter of mean power DB (dB re 1 count^2 per raw sample,
+// before the receive gain) with the beam's centroid; --clutter-contrast chooses a homogeneous
+// scene (low, the default) or one of texture, bright points and a land/water edge (high).
 //
 // The ASA_INS and ASA_XCA are patched copies of real products (by default those of the sample
 // archive the build was configured with); --no-aux writes neither.
@@ -25,7 +34,9 @@ void usage() {
       "usage: sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]\n"
       "              [--fault lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated]...\n"
       "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
-      "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n",
+      "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n"
+      "              [--yaw-steering on|off] [--squint-hz F]\n"
+      "              [--clutter-db DB] [--clutter-contrast low|high]\n",
       stderr);
 }
 
@@ -101,6 +112,16 @@ int main(int argc, char** argv) {
       } else if (arg == "--no-aux") {
         config.ins_template.clear();
         config.xca_template.clear();
+      } else if (arg == "--yaw-steering") {
+        const std::string v = value();
+        if (v != "on" && v != "off") throw std::invalid_argument("--yaw-steering is on or off: " + v);
+        config.attitude.yaw_steering = v == "on";
+      } else if (arg == "--squint-hz") {
+        config.centroid_hz = number(value(), "Doppler centroid");
+      } else if (arg == "--clutter-db") {
+        config.clutter.power_db = number(value(), "clutter power");
+      } else if (arg == "--clutter-contrast") {
+        config.clutter.contrast = sar::simulator::clutter_contrast_from_name(value());
       } else if (arg == "--help" || arg == "-h") {
         usage();
         return 0;

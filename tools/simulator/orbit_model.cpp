@@ -1,5 +1,6 @@
 #include "simulator/orbit_model.hpp"
 
+#include <algorithm>
 #include <stdexcept>
 
 namespace sar::simulator {
@@ -41,14 +42,21 @@ StateVector OrbitModel::state_at_offset(double dt) const {
   const double w = e_.node_longitude + w_rate * dt;
   const double cu = std::cos(u), su = std::sin(u), cw = std::cos(w), sw = std::sin(w);
   const double ci = std::cos(inc), si = std::sin(inc);
-  const double a = e_.semi_major_axis;
-  StateVector s;
-  s.time = e_.epoch + dt;
-  s.position = {a * (cu * cw - su * ci * sw), a * (cu * sw + su * ci * cw), a * su * si};
+  const double r = radius(u);
+  const double r_rate = -e_.radius_dip * si * si * std::sin(2.0 * u) * e_.mean_motion;
+  const Vec3 radial{cu * cw - su * ci * sw, cu * sw + su * ci * cw, su * si};
   const Vec3 du{-su * cw - cu * ci * sw, -su * sw + cu * ci * cw, cu * si};
   const Vec3 dw{-cu * sw - su * ci * cw, cu * cw - su * ci * sw, 0.0};
-  s.velocity = du * (a * e_.mean_motion) + dw * (a * w_rate);
+  StateVector s;
+  s.time = e_.epoch + dt;
+  s.position = radial * r;
+  s.velocity = radial * r_rate + du * (r * e_.mean_motion) + dw * (r * w_rate);
   return s;
+}
+
+double OrbitModel::radius(double u) const {
+  const double si = std::sin(e_.inclination_deg * kDeg), su = std::sin(u);
+  return e_.semi_major_axis - e_.radius_dip * si * si * su * su;
 }
 
 int OrbitModel::absolute_orbit(double sec85) const {
@@ -69,13 +77,16 @@ OrbitModel OrbitModel::for_scene(const Geodetic& target, double time, double inc
   e.orbit_number = orbit_number;
   const Vec3 p = geodetic_to_ecef(target);
   const Vec3 ph = p.unit();
+  const double inc = e.inclination_deg * kDeg;
+  const double lat_c = std::asin(ph.z), lon = std::atan2(ph.y, ph.x);
+  // Radius of the orbit where it passes the target's latitude.
+  const double sin_u = std::min(1.0, std::abs(ph.z) / std::sin(inc));
+  const double orbit_radius = OrbitModel(e).radius(std::asin(sin_u));
   // Earth angle between nadir and target for the wanted incidence (triangle centre, satellite, target).
-  const double look = std::asin(p.norm() / e.semi_major_axis * std::sin(incidence_deg * kDeg));
+  const double look = std::asin(p.norm() / orbit_radius * std::sin(incidence_deg * kDeg));
   const double delta = incidence_deg * kDeg - look;
   // Orbit normal h(W) = (sin i sin W, -sin i cos W, cos i); a right-looking radar has the target
   // on the side opposite to h: h . p = -sin(delta).
-  const double inc = e.inclination_deg * kDeg;
-  const double lat_c = std::asin(ph.z), lon = std::atan2(ph.y, ph.x);
   const double q = (-std::sin(delta) - std::cos(inc) * std::sin(lat_c)) / (std::sin(inc) * std::cos(lat_c));
   if (std::abs(q) > 1.0) throw std::runtime_error("scene latitude out of reach of the orbit");
   for (const double offset : {std::asin(q), kPi - std::asin(q)}) {

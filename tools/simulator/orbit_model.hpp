@@ -1,8 +1,14 @@
 #pragma once
-// A circular, sun-synchronous ENVISAT-like orbit in Earth-fixed coordinates, and the WGS84
-// conversions the scene needs. The orbit is Keplerian with a drifting node: precise enough that
-// an orbit file sampled every 60 s interpolates back to the model far below a millimetre, which
-// is all a test product needs.
+// A sun-synchronous ENVISAT-like orbit in Earth-fixed coordinates, and the WGS84 conversions
+// the scene needs. The argument of latitude u runs uniformly and the node drifts uniformly; the
+// radius follows the ellipsoid as a frozen orbit does,
+//   r(u) = a - d sin^2(i) sin^2(u),   d = equatorial minus polar radius of WGS84,
+// so that the geodetic altitude stays nearly constant and the radial velocity
+//   dr/dt = -d sin^2(i) sin(2u) du/dt
+// reaches about 22 m/s at mid latitudes. That radial motion is what the pitch term of ENVISAT's
+// yaw-steering law answers: on a circular orbit the law would leave a centroid of some 750 Hz.
+// The velocity is the exact time derivative of the position, so an orbit file sampled every
+// 60 s interpolates back to the model far below a millimetre.
 #include <cmath>
 
 namespace sar::simulator {
@@ -43,7 +49,8 @@ struct StateVector {
 /// inclination 98.55 deg, node drifting once a year (sun-synchronous).
 struct OrbitElements {
   double epoch = 0.0;                                  // sec85
-  double semi_major_axis = 7159.49e3;                  // m; altitude about 782 to 800 km
+  double semi_major_axis = 7159.49e3;                  // m; radius over the equator, altitude about 781 km
+  double radius_dip = kWgs84A - kWgs84B;  // m; radius drop from equator to pole over sin^2(i); 0: circular
   double inclination_deg = 98.55;
   double mean_motion = 2.0 * kPi * 501.0 / (35.0 * 86400.0);  // rad/s
   double node_rate = 2.0 * kPi / (365.2422 * 86400.0);        // inertial node drift, rad/s
@@ -60,6 +67,8 @@ class OrbitModel {
   /// State at `dt` seconds after the epoch. Offsets keep full precision near the scene.
   StateVector state_at_offset(double dt) const;
   StateVector state(double sec85) const { return state_at_offset(sec85 - e_.epoch); }
+  /// Orbit radius (m) at the argument of latitude u (rad).
+  double radius(double u) const;
   /// Absolute orbit number at a time; it increases at each ascending node (Z from - to +).
   int absolute_orbit(double sec85) const;
   /// Time of the last ascending node not after `sec85`.

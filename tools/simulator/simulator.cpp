@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <optional>
 #include <random>
 #include <stdexcept>
 
@@ -150,6 +151,37 @@ Fault fault_from_name(const std::string& name) {
   throw std::invalid_argument("unknown fault: " + name);
 }
 
+ClutterGeometry clutter_geometry(const SimulationConfig& c, const SimulationTruth& truth) {
+  if (c.targets.empty()) throw std::invalid_argument("the scene needs at least one target");
+  const double t_scene = base::ascii2sec85(c.scene_time);
+  const OrbitModel orbit = OrbitModel::for_scene(c.targets.front().position, t_scene, c.im.incidence_deg, c.ascending,
+                                                 c.orbit_number);
+  ClutterGeometry g;
+  g.lines = truth.line_count;
+  g.samples = c.samples + std::max(0, truth.swst_change_line >= 0 ? truth.swst_code_after_change - truth.swst_code : 0);
+  g.prf = truth.prf;
+  g.sampling_frequency = c.im.sampling_frequency;
+  g.carrier_frequency = c.im.carrier_frequency;
+  g.pulse_length = truth.pulse_length;
+  g.chirp_bandwidth = truth.chirp_bandwidth;
+  g.near_range_time = truth.near_range_time;
+  g.antenna_length = c.im.antenna_length;
+  const double mid_offset = truth.first_line_time - t_scene + 0.5 * (truth.line_count - 1) / truth.prf;
+  // The beam centre of the attitude as flown, at the middle line.
+  const Attitude attitude = truth.attitude;
+  if (attitude.yaw_steering || attitude.squint_rad != 0.0) {
+    const double t_mid = truth.first_line_time + 0.5 * truth.line_count / truth.prf;
+    const double lambda = kSpeedOfLight / c.im.carrier_frequency;
+    g.doppler_centroid = [orbit, attitude, t_mid, lambda](double tau) {
+      return beam_centre_doppler(orbit, attitude, t_mid, tau, lambda);
+    };
+  } else {
+    g.doppler_centroid = [](double) { return 0.0; };  // steered to zero Doppler
+  }
+  set_orbit_geometry(g, orbit, mid_offset, c.targets.front().position.height);
+  return g;
+}
+
 std::vector<double> receive_gain(const ImParameters& im, int count) {
   const double* c = im.gain_c;
   const double a = c[0] * im.gain_t + c[1], b = c[3] * im.gain_t + c[4], d = c[6] * im.gain_t + c[7];
@@ -180,9 +212,26 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
   const double prf = truth.prf, tp = truth.pulse_length, lambda = truth.wavelength;
   const double rate = truth.chirp_bandwidth / tp;
 
-  // Lines: the first target is seen at zero Doppler at the middle line.
+  // Attitude. A yaw-steered or squinted beam sees the first target away from its zero-Doppler
+  // time; the lines are centred on its crossing of the beam centre, and the squint asked for as
+  // a centroid is solved together with that time.
+  Attitude attitude = c.attitude;
+  const bool steered = attitude.yaw_steering || attitude.squint_rad != 0.0 || c.centroid_hz.has_value();
+  double t_centre = t_scene;
+  if (steered) {
+    const Vec3 first_ecef = geodetic_to_ecef(c.targets.front().position);
+    // The range window is centred on the first target's echo.
+    const double tau_mid = 2.0 * (first_ecef - orbit.state(t_scene).position).norm() / kSpeedOfLight + tp / 2.0;
+    for (int pass = 0; pass < 3; ++pass) {
+      if (c.centroid_hz) attitude.squint_rad = squint_for_centroid(orbit, attitude, t_centre, tau_mid, lambda, *c.centroid_hz);
+      t_centre = beam_centre_time(orbit, attitude, first_ecef, t_centre);
+    }
+  }
+
+  // Lines: the first target crosses the beam centre at the middle line (at zero Doppler when
+  // the beam is steered to zero Doppler).
   const int64_t scene_us = to_mjd_us(t_scene);
-  const int64_t first_us = scene_us - std::llround(0.5 * c.lines / prf * 1e6);
+  const int64_t first_us = to_mjd_us(t_centre) - std::llround(0.5 * c.lines / prf * 1e6);
   truth.first_line_time = from_mjd_us(first_us);
   const double first_offset = static_cast<double>(first_us - scene_us) * 1e-6;  // from the orbit epoch
   truth.line_count = c.lines;
@@ -222,6 +271,18 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
   auto near_of = [&](int swst) { return swst / fs + truth.swath_rank / prf - im.range_gate_bias; };
   truth.near_range_time = near_of(truth.swst_code);
   for (TargetTruth& tt : truth.targets) tt.range_sample = (tt.range_time - truth.near_range_time) * fs;
+
+  // Doppler centroid at the scene centre (middle line, middle sample), and of each target at
+  // its crossing of the beam centre.
+  const double t_mid = truth.first_line_time + 0.5 * c.lines / prf;
+  const double tau_mid = truth.near_range_time + 0.5 * c.samples / fs;
+  if (c.centroid_hz) attitude.squint_rad = squint_for_centroid(orbit, attitude, t_mid, tau_mid, lambda, *c.centroid_hz);
+  truth.attitude = attitude;
+  truth.doppler_centroid = steered ? beam_centre_doppler(orbit, attitude, t_mid, tau_mid, lambda) : 0.0;
+  for (TargetTruth& tt : truth.targets) {
+    tt.beam_centre_time = steered ? beam_centre_time(orbit, attitude, tt.ecef, tt.zero_doppler_time) : tt.zero_doppler_time;
+    tt.doppler_centroid = steered ? target_doppler(orbit, tt.beam_centre_time, tt.ecef, lambda) : 0.0;
+  }
 
   // Faults.
   std::vector<char> lost(static_cast<std::size_t>(c.lines), 0);
@@ -336,6 +397,19 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
   out << build_mph(m)
       << build_sph(c, start, stop, track, static_cast<int>(truth.lost_lines.size()), ds_size, num_dsr, truth.orbit_name);
 
+  // Clutter, made azimuth block by azimuth block as the lines go by.
+  std::optional<ClutterEcho> clutter;
+  if (c.clutter.enabled()) {
+    const ClutterGeometry g = clutter_geometry(c, truth);
+    truth.clutter.present = true;
+    const double last = truth.near_range_time + (c.samples - 1) / fs;
+    truth.clutter.centroid_near = g.doppler_centroid(truth.near_range_time);
+    truth.clutter.centroid_mid = g.doppler_centroid(truth.near_range_time + 0.5 * c.samples / fs);
+    truth.clutter.centroid_far = g.doppler_centroid(last);
+    truth.clutter.ambiguity_mid = static_cast<int>(std::lround(truth.clutter.centroid_mid / prf));
+    clutter.emplace(g, random_reflectivity(c.clutter, g, c.seed ^ 0xC1077E4ull));
+  }
+
   // Packets.
   const std::vector<double> gain = receive_gain(im, c.samples);
   const std::vector<uint8_t> cal_payload = calibration_payload(im.calibration_swl, fs, tp, rate);
@@ -361,12 +435,12 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
     } else {
       std::fill(echo.begin(), echo.end(), std::complex<double>{});
       const StateVector s = orbit.state_at_offset(dt);
-      const double speed = s.velocity.norm();
+      const AntennaFrame beam = antenna_frame_at_offset(orbit, attitude, dt);
       const double near = near_of(swst);
       for (const TargetTruth& tt : truth.targets) {
         const Vec3 d = tt.ecef - s.position;
         const double r = d.norm();
-        const double x = im.antenna_length * d.dot(s.velocity) / (r * speed) / lambda;
+        const double x = im.antenna_length * std::sin(azimuth_off_boresight(beam, tt.ecef)) / lambda;
         if (std::abs(x) > 3.0) continue;
         const double amplitude = tt.target.amplitude * sinc(x) * sinc(x);
         const double delay = 2.0 * r / kSpeedOfLight;
@@ -379,6 +453,11 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
           const double v = u - tp / 2.0;
           echo[static_cast<std::size_t>(k)] += std::polar(amplitude, carrier + kPi * rate * v * v);
         }
+      }
+      if (clutter) {
+        const auto field = clutter->line(l);
+        const std::size_t shift = static_cast<std::size_t>(swst - truth.swst_code);
+        for (std::size_t k = 0; k < echo.size(); ++k) echo[k] += std::complex<double>(field[k + shift]);
       }
       for (std::size_t k = 0; k < echo.size(); ++k) {
         std::complex<double> v = echo[k] * gain[k];

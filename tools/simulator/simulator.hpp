@@ -8,18 +8,24 @@
 // echo). A target at slant range R(t_l) returns the transmitted up-chirp
 //   exp(j pi K (u - Tp/2)^2), 0 <= u < Tp, u = tau - 2 R / c, K = B / Tp
 // times exp(-j 4 pi R / lambda), times the two-way azimuth pattern of a uniform antenna of
-// length L, sinc^2(L sin(theta) / lambda), with sin(theta) the cosine of the angle between the
-// line of sight and the Earth-fixed velocity (the antenna is steered to zero Doppler). Sample k
+// length L, sinc^2(L sin(theta) / lambda), with theta the target's azimuth angle off the beam
+// centre of the attitude (attitude.hpp): by default the antenna is steered to zero Doppler and
+// sin(theta) is the cosine of the angle between the line of sight and the Earth-fixed velocity;
+// with yaw steering or a squint the beam centre is that of the attitude. Sample k
 // of a line lies at the two-way time
 //   tau_k = SWST / fs + rank / PRF - range_gate_bias + k / fs.
-// The sum over targets is multiplied by the receive gain g(k) that the decoder divides by, white
+// The sum over targets, plus the echo of distributed clutter when asked for (clutter.hpp), is
+// multiplied by the receive gain g(k) that the decoder divides by, white
 // Gaussian noise is added, the result is quantised to 8 bits (levels at half-integers, -127.5 to
 // 127.5) and packed 8:4 with the simulator's FBAQ table.
 #include <complex>
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "simulator/attitude.hpp"
+#include "simulator/clutter.hpp"
 #include "simulator/orbit_model.hpp"
 
 namespace sar::simulator {
@@ -80,6 +86,15 @@ struct SimulationConfig {
   std::string ins_template;
   std::string xca_template;
   bool keep_echoes = false;  // keep every line's echo before quantisation in the truth
+  // Antenna attitude (attitude.hpp). By default the beam is steered ideally to zero Doppler;
+  // with yaw steering or a squint the lines are centred on the first target's beam-centre
+  // crossing instead of its zero-Doppler time.
+  Attitude attitude{.yaw_steering = false};
+  // When set, the squint is chosen so that the beam-centre Doppler centroid at the scene centre
+  // (middle line, middle sample) is this many Hz; attitude.squint_rad is then ignored.
+  std::optional<double> centroid_hz;
+  // Distributed clutter added to the echoes of the targets (see clutter.hpp); off by default.
+  ClutterOptions clutter;
 };
 
 /// What one target looks like in the product.
@@ -94,6 +109,16 @@ struct TargetTruth {
   double doppler_rate = 0.0;       // Hz/s at zero Doppler
   double incidence_deg = 0.0;
   double look_deg = 0.0;
+  double beam_centre_time = 0.0;  // sec85 of the crossing of the beam centre
+  double doppler_centroid = 0.0;  // Hz, absolute: the target's Doppler at that crossing
+};
+
+/// The clutter of a product: absolute beam-centre centroid at the middle line for the first,
+/// middle (samples / 2) and last sample of the window, and its ambiguity (whole PRFs) there.
+struct ClutterTruth {
+  bool present = false;
+  double centroid_near = 0.0, centroid_mid = 0.0, centroid_far = 0.0;  // Hz
+  int ambiguity_mid = 0;
 };
 
 struct SimulationTruth {
@@ -127,11 +152,19 @@ struct SimulationTruth {
   // (targets times the receive gain, plus noise), before the 8-bit and the FBAQ quantisation.
   // Lines of calibration pulses are zero.
   std::vector<std::complex<float>> echoes;
+  ClutterTruth clutter;
+  Attitude attitude;              // as flown, with the squint that was chosen
+  double doppler_centroid = 0.0;  // Hz, absolute beam-centre centroid at the scene centre
 };
 
 /// Runs the simulation and writes the three files into `config.out_dir`. Throws
 /// std::runtime_error or std::invalid_argument on bad input or a failed write.
 SimulationTruth run_simulation(const SimulationConfig& config);
+
+/// The clutter geometry of a simulation whose truth holds the acquisition (prf, pulse, range
+/// window): the orbit of the scene at the middle line, the window of `samples` plus the largest
+/// SWST shift of the product. Tests use it to feed their own reflectivity.
+ClutterGeometry clutter_geometry(const SimulationConfig& config, const SimulationTruth& truth);
 
 /// Receive gain g(k) of the model in `im`, for k in [0, count).
 std::vector<double> receive_gain(const ImParameters& im, int count);

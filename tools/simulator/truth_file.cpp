@@ -93,7 +93,9 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.number("near_range_time", t.near_range_time, "%.15e");
   w.number("antenna_length", c.im.antenna_length, "%.3f");
   w.number("noise_db", c.noise_db, "%.3f");
-  w.number("doppler_centroid", 0.0, "%.3f");
+  w.number("doppler_centroid", t.doppler_centroid, "%.3f");
+  w.integer("yaw_steering", t.attitude.yaw_steering ? 1 : 0);
+  w.number("squint", t.attitude.squint_rad, "%.9e");
   w.number("range_resolution", kSpeedOfLight / (2.0 * t.chirp_bandwidth), "%.6f");
   w.number("azimuth_resolution", c.im.antenna_length / 2.0, "%.6f");
   w.text("echo_convention", "up-chirp from the two-way delay 2R/c over pulse_length, stop and go at the packet time");
@@ -124,6 +126,8 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
     w.number("azimuth_line", tt.azimuth_line, "%.6f");
     w.number("range_sample", tt.range_sample, "%.6f");
     w.number("doppler_rate", tt.doppler_rate, "%.6f");
+    w.number("doppler_centroid", tt.doppler_centroid, "%.3f");
+    w.time("beam_centre_time", tt.beam_centre_time);
     w.number("incidence", tt.incidence_deg, "%.6f");
     w.number("look", tt.look_deg, "%.6f");
   }
@@ -142,6 +146,16 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.integer("swst_code_after_change", t.swst_change_line >= 0 ? t.swst_code_after_change : -1);
   w.integer("truncated_at_byte", t.truncated_at_byte);
   w.integer("last_whole_line", t.last_whole_line);
+
+  if (t.clutter.present) {
+    w.section("clutter");
+    w.number("power_db", c.clutter.power_db, "%.3f");
+    w.text("contrast", clutter_contrast_name(c.clutter.contrast));
+    w.number("doppler_centroid_near", t.clutter.centroid_near, "%.6f");
+    w.number("doppler_centroid_mid", t.clutter.centroid_mid, "%.6f");
+    w.number("doppler_centroid_far", t.clutter.centroid_far, "%.6f");
+    w.integer("ambiguity_mid", t.clutter.ambiguity_mid);
+  }
   w.close();
 }
 

@@ -14,8 +14,10 @@
 //               swl_code, line_samples, sampling_frequency, carrier_frequency, wavelength,
 //               pulse_code, pulse_length, bandwidth_code, chirp_bandwidth, range_gate_bias,
 //               swath_rank, beam_code, near_range_time (two-way time of sample 0 for swst_code),
-//               antenna_length, noise_db, doppler_centroid (0: the beam is steered to zero
-//               Doppler), range_resolution (c / 2B, m, slant), azimuth_resolution (L / 2, m),
+//               antenna_length, noise_db, doppler_centroid (Hz, absolute beam-centre centroid
+//               at the middle line and sample; 0 when the beam is steered to zero Doppler),
+//               yaw_steering (0 or 1), squint (rad, positive forward),
+//               range_resolution (c / 2B, m, slant), azimuth_resolution (L / 2, m),
 //               echo_convention (where the echo of a target lies in the line)
 // [orbit]       epoch, epoch_sec85, semi_major_axis, inclination, period, ascending (0 or 1),
 //               absolute_orbit, ascending_node_time, ascending_node_time_sec85
@@ -23,10 +25,17 @@
 //               zero_doppler_time, zero_doppler_time_sec85, slant_range, range_time (two-way
 //               time of the echo's leading edge), azimuth_line (fractional line of zero Doppler),
 //               range_sample (fractional sample of the leading edge at swst_code),
-//               doppler_rate (Hz/s), incidence, look (degrees)
+//               doppler_rate (Hz/s), incidence, look (degrees), doppler_centroid (Hz,
+//               absolute: the target's Doppler as it crosses the beam centre),
+//               beam_centre_time, beam_centre_time_sec85 (that crossing)
 // [faults]      faults (names), lost_lines, corrupt_header_line, wrong_mode_line,
 //               sequence_wrap_line, swst_change_line, swst_code_after_change,
 //               truncated_at_byte, last_whole_line (-1 where the fault was not injected)
+// [clutter]     only with clutter: power_db (mean power of a raw sample before the receive gain,
+//               dB re 1 count^2), contrast (low or high), doppler_centroid_near,
+//               doppler_centroid_mid, doppler_centroid_far (absolute beam-centre centroid, Hz, at
+//               the first, middle and last sample of the window), ambiguity_mid (whole PRFs in
+//               the centroid at mid range, rounded half away from zero)
 #include <string>
 
 #include "simulator/simulator.hpp"

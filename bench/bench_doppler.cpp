@@ -1,0 +1,98 @@
+// Doppler centroid estimation of a range-compressed image mode scene, in core mode: the whole
+// estimator (block statistics, polynomial, WDAR and MLBF on their blocks, result file) and the
+// block statistics alone. A full scene (about 30 000 lines of 5 000 samples, 1.2 GB of samples)
+// is scaled to 8 192 lines of 5 120 samples; items are lines, so items_per_second is lines per
+// second and scales to the full size. The scene repeats a simulated tile of 2 048 lines with a
+// bright near-range part, so that both ambiguity estimators have blocks to work on. Block
+// statistics run on the OpenMP threads (OMP_NUM_THREADS).
+#include <benchmark/benchmark.h>
+
+#include <filesystem>
+#include <vector>
+
+#include "../tests/doppler/test_support.hpp"
+#include "doppler/dcest.hpp"
+
+namespace {
+
+using namespace sar::doppler;
+
+constexpr int kTileLines = 2048;
+constexpr int kLines = 8192;
+constexpr int kSamples = 5120;
+
+struct Scene {
+  testing::SceneSpec spec;
+  std::vector<fcomplex> data;
+  Scene() {
+    spec.lines = kTileLines;
+    spec.samples = kSamples;
+    spec.centroid = 1.6 * spec.prf;
+    spec.centroidSlope = -0.02;
+    spec.highContrast = true;
+    spec.brightFraction = 0.3;
+    spec.brightSpacing = 1024;
+    spec.brightPower = 1000.0;
+    const auto tile = testing::make_scene(spec);
+    testing::clear_reflectivity_cache();
+    data.reserve(static_cast<std::size_t>(kLines) * kSamples);
+    for (int k = 0; k < kLines / kTileLines; ++k) data.insert(data.end(), tile.begin(), tile.end());
+    spec.lines = kLines;
+  }
+};
+
+Scene& scene() {
+  static Scene s;
+  return s;
+}
+
+dcestconf config(int ambFlag) {
+  dcestconf c = testing::estimator_config();
+  c.Amb_flag = ambFlag;
+  c.Nwdarblocks = 40;
+  c.Nbestblocks = 20;
+  c.Nummlbf = 8;
+  c.coreMatrix = scene().data;
+  c.geometricCentroid = scene().spec.centroid;
+  return c;
+}
+
+void BM_EstimateDoppler(benchmark::State& state) {
+  const auto dir = std::filesystem::temp_directory_path() / "bench_doppler";
+  std::filesystem::create_directories(dir);
+  {
+    // Transform plans are made once per shape and process: not part of the estimation.
+    dcestconf c = config(static_cast<int>(state.range(0)));
+    dcimage image = testing::image_of(scene().spec);
+    DopplerPoly poly{};
+    getnadcpoly(image, c, poly);
+  }
+  for (auto _ : state) {
+    dcestconf c = config(static_cast<int>(state.range(0)));
+    c.outputDir = dir.string();
+    dcimage image = testing::image_of(scene().spec);
+    DopplerPoly poly{};
+    if (getnadcpoly(image, c, poly) != 0) state.SkipWithError("estimation failed");
+    benchmark::DoNotOptimize(poly);
+  }
+  state.SetItemsProcessed(state.iterations() * kLines);
+}
+// 1: with WDAR and MLBF; 2: polynomial only, ambiguity from the orbit geometry.
+BENCHMARK(BM_EstimateDoppler)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond)->UseRealTime();
+
+void BM_BlockStatistics(benchmark::State& state) {
+  for (auto _ : state) {
+    dcestconf c = config(1);
+    dcimage image = testing::image_of(scene().spec);
+    c.r0 = bspline3(0.0);
+    c.r1 = bspline3(2.0 * image.platformSpeed / (c.AnLen * image.prf));
+    if (setprocbuf(c, image) != 0 || getnadcbins(c, image) != 0) state.SkipWithError("block statistics failed");
+    benchmark::DoNotOptimize(c.blocks.data());
+  }
+  state.SetItemsProcessed(state.iterations() * kLines);
+}
+BENCHMARK(BM_BlockStatistics)->Unit(benchmark::kMillisecond)->UseRealTime();
+
+}  // namespace
+
+BENCHMARK_MAIN();

@@ -1,0 +1,360 @@
+// PRF ambiguity of the centroid: choice of the blocks for the two estimators from the contrast
+// map, their trimmed statistics and the decision between them and the orbit geometry.
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <fstream>
+#include <numeric>
+#include <vector>
+
+#include "base/diagnostics.hpp"
+#include "doppler/dcest.hpp"
+
+namespace sar::doppler {
+namespace {
+
+constexpr int kHistBins = 1024;
+
+void round_stats(ambstats& s, std::span<const double> values, double low, double high) {
+  double sum = 0.0, sum2 = 0.0;
+  int n = 0;
+  for (double v : values)
+    if (v >= low && v <= high) {
+      sum += v;
+      sum2 += v * v;
+      ++n;
+    }
+  s.count = n;
+  if (n > 0) {
+    s.mean = sum / n;
+    s.std = std::sqrt(std::max(0.0, sum2 / n - s.mean * s.mean));
+  }
+}
+
+}  // namespace
+
+bool agreeing(const ambstats& s, double varthr) {
+  // Trimming up to 45 % from each end finds a tight core in any set, noise included; the core
+  // must also hold a quarter of the votes to count as an answer.
+  return s.count >= std::max(2, (s.total + 3) / 4) && s.std < varthr;
+}
+
+int make_hist(std::span<const double> values, double& step, double& minimum, int bins, std::vector<int>& counts) {
+  counts.assign(static_cast<std::size_t>(std::max(bins, 1)), 0);
+  step = 0.0;
+  minimum = 0.0;
+  bool any = false;
+  float lo = 0.0f, hi = 0.0f;
+  for (double v : values) {
+    if (!std::isfinite(v)) continue;
+    const float f = static_cast<float>(v);
+    lo = any ? std::min(lo, f) : f;
+    hi = any ? std::max(hi, f) : f;
+    any = true;
+  }
+  if (!any) return 0;
+  minimum = lo;
+  // A constant input (step 0) has a single occupied bin.
+  const float fstep = bins > 1 ? (hi - lo) / static_cast<float>(bins - 1) : 0.0f;
+  step = fstep;
+  for (double v : values) {
+    if (!std::isfinite(v)) continue;
+    int bin = 0;
+    if (fstep > 0.0f) {
+      const float q = (static_cast<float>(v) - lo) / fstep;
+      bin = static_cast<int>(std::floor(q + 0.5f));
+      bin = std::clamp(bin, 0, bins - 1);
+    }
+    ++counts[static_cast<std::size_t>(bin)];
+  }
+  return 0;
+}
+
+int getpercentile(std::span<const double> values, double trim, double& low, double& high) {
+  double step = 0.0, minimum = 0.0;
+  std::vector<int> counts;
+  make_hist(values, step, minimum, kHistBins, counts);
+  const double n = static_cast<double>(values.size());
+  if (n <= 0.0 || step == 0.0) {
+    low = high = minimum;
+    return 0;
+  }
+  // Counted in whole values: ten sums of 0.01 fall short of 0.1 in floating point.
+  const double goal = trim * n - 1e-9;
+  int64_t lowCount = 0, highCount = 0;
+  int i = 0, j = 0;
+  while (lowCount < goal && i < kHistBins) lowCount += counts[static_cast<std::size_t>(i++)];
+  while (highCount < goal && j < kHistBins) highCount += counts[static_cast<std::size_t>(kHistBins - 1 - j++)];
+  if (static_cast<double>(lowCount + highCount) >= n) {
+    low = minimum;
+    high = (kHistBins - 1) * step + minimum;
+  } else {
+    // Bin k covers (k - 0.5) step .. (k + 0.5) step above the minimum.
+    low = (i - 0.5) * step + minimum;
+    high = (kHistBins - 0.5 - j) * step + minimum;
+  }
+  return 0;
+}
+
+ambstats trimmed_stats(std::span<const double> values, double varthr) {
+  ambstats last;
+  last.total = static_cast<int32_t>(values.size());
+  if (values.empty()) return last;
+  round_stats(last, values, -HUGE_VAL, HUGE_VAL);
+  double sd = varthr + 1.0;
+  // Trims of 5 %, 10 %, ... 45 % from each end until the spread is acceptable.
+  for (int k = 1; k <= 9 && sd > varthr; ++k) {
+    double low = 0.0, high = 0.0;
+    getpercentile(values, 0.05 * k, low, high);
+    ambstats s = last;
+    round_stats(s, values, low, high);
+    if (s.count < 1) break;  // an emptied set keeps the last statistics
+    last = s;
+    sd = s.std;
+  }
+  return last;
+}
+
+int dcnastd(dcestconf& conf) {
+  std::vector<double> m, w;
+  // An MLBF estimate votes only when its beat peak stands Kthr times above the rest of the
+  // beat spectrum: blocks without a dominant scatterer give a flat spectrum and a random peak.
+  for (const auto& b : conf.mlbfBlocks)
+    for (std::size_t i = 0; i < b.estimates.size(); ++i)
+      if (i < b.quality.size() && b.quality[i] >= conf.Kthr) m.push_back(b.estimates[i]);
+  for (const auto& b : conf.wdarBlocks) w.push_back(b.estimate);
+  conf.mlbfStats = trimmed_stats(m, conf.Varthr);
+  conf.wdarStats = trimmed_stats(w, conf.Varthr);
+  // The votes are counted against every estimate made, voting or not.
+  int32_t all = 0;
+  for (const auto& b : conf.mlbfBlocks) all += static_cast<int32_t>(b.estimates.size());
+  conf.mlbfStats.total = all;
+  return 0;
+}
+
+int sel_no_overlap(std::vector<std::array<int, 2>>& points, std::size_t first, int width, int height, int bw, int bh) {
+  const int hw = bw / 2, hh = bh / 2;
+  int kept = 0;
+  for (std::size_t i = first; i < points.size(); ++i) {
+    auto& p = points[i];
+    bool drop = p[0] - hw < 0 || p[1] - hh < 0 || p[0] - hw + bw > width || p[1] - hh + bh > height;
+    for (std::size_t k = 0; k < i && !drop; ++k) {
+      const auto& q = points[k];
+      if (q[0] < 0) continue;
+      drop = std::abs(q[0] - p[0]) < bw && std::abs(q[1] - p[1]) < bh;
+    }
+    if (drop) {
+      p[0] = -1;
+    } else {
+      ++kept;
+    }
+  }
+  return kept;
+}
+
+int topNpoints(std::span<const float> map, int width, int height, int N, int bw, int bh,
+               std::vector<std::array<int, 2>>& points) {
+  points.clear();
+  if (N < 1 || width < 1 || height < 1) return 0;
+  std::vector<int> order;
+  for (std::size_t k = 0; k < map.size() && k < static_cast<std::size_t>(width) * static_cast<std::size_t>(height); ++k)
+    if (map[k] > 0.0f) order.push_back(static_cast<int>(k));
+  // Highest values first; equal values in map order, so the choice is reproducible.
+  std::stable_sort(order.begin(), order.end(), [&](int a, int b) { return map[static_cast<std::size_t>(a)] > map[static_cast<std::size_t>(b)]; });
+  std::vector<std::array<int, 2>> cand;
+  int accepted = 0;
+  for (std::size_t start = 0; start < order.size() && accepted < N; start += static_cast<std::size_t>(N)) {
+    const std::size_t first = cand.size();
+    for (std::size_t k = start; k < std::min(order.size(), start + static_cast<std::size_t>(N)); ++k) {
+      const int y = order[k] / width;
+      cand.push_back({order[k] - y * width, y});
+    }
+    accepted += sel_no_overlap(cand, first, width, height, bw, bh);
+  }
+  for (const auto& p : cand)
+    if (p[0] >= 0 && static_cast<int>(points.size()) < N) points.push_back(p);
+  return static_cast<int>(points.size());
+}
+
+int read_block(const dcestconf& conf, const dcimage& image, int firstLine, int firstSample,
+               std::vector<fcomplex>& block) {
+  const int ns = conf.Blocks, nl = conf.Blockl;
+  if (firstLine < 0 || firstSample < 0 || static_cast<int64_t>(firstLine) + nl > image.lines ||
+      static_cast<int64_t>(firstSample) + ns > image.samples) {
+    base::report(base::kReportError, "read_block: the block lies outside the image");
+    return 10;
+  }
+  block.assign(static_cast<std::size_t>(ns) * static_cast<std::size_t>(nl), fcomplex(0.0f, 0.0f));
+  const int64_t samples = image.samples;
+  if (conf.Flag_incore) {
+    for (int l = 0; l < nl; ++l) {
+      const fcomplex* src = conf.coreMatrix.data() + (static_cast<int64_t>(firstLine) + l) * samples + firstSample;
+      std::copy(src, src + ns, block.begin() + static_cast<std::ptrdiff_t>(l) * ns);
+    }
+  } else {
+    std::ifstream in(image.path, std::ios::binary);
+    if (!in) {
+      base::report(base::kReportError, "Cannot open the range-compressed file " + image.path);
+      return 2;
+    }
+    for (int l = 0; l < nl; ++l) {
+      const int64_t offset = ((static_cast<int64_t>(firstLine) + l) * samples + firstSample) * 8;
+      in.seekg(static_cast<std::streamoff>(offset));
+      in.read(reinterpret_cast<char*>(block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(ns)),
+              static_cast<std::streamsize>(ns) * 8);
+      if (!in) {
+        base::report(base::kReportError, "The range-compressed file is shorter than its description: " + image.path);
+        return 2;
+      }
+    }
+  }
+  for (auto& v : block)
+    if (!std::isfinite(v.real()) || !std::isfinite(v.imag())) v = fcomplex(0.0f, 0.0f);
+  return 0;
+}
+
+int bestblocksproc(dcestconf& conf, const dcimage& image, std::span<const double> coef) {
+  base::Frame frame("bestblocksproc");
+  std::vector<fcomplex> block;
+  auto corner = [&](int sample, int line, int& top, int& left) {
+    top = std::clamp(line - conf.Blockl / 2, 0, std::max(0, image.lines - conf.Blockl));
+    left = std::clamp(sample - conf.Blocks / 2, 0, std::max(0, image.samples - conf.Blocks));
+  };
+  if (!conf.mlbfBlocks.empty()) {
+    if (int st = frame.check(multimlbf_init(conf))) return st;
+    if (int st = frame.check(cirpZ_init(conf))) {
+      mlbf_free(conf);
+      return st;
+    }
+    const int n = static_cast<int>(conf.mlbfBlocks.size());
+    for (int i = 0; i < n; ++i) {
+      std::printf("\nProcessing MLBF best block %d of %d.\n", i + 1, n);
+      int top = 0, left = 0;
+      corner(conf.mlbfBlocks[static_cast<std::size_t>(i)].sample, conf.mlbfBlocks[static_cast<std::size_t>(i)].line, top, left);
+      int st = read_block(conf, image, top, left, block);
+      if (st == 0) st = multimlbf(conf, block, i);
+      if (frame.check(st)) {
+        mlbf_free(conf);
+        return st;
+      }
+    }
+    mlbf_free(conf);
+  }
+  if (!conf.wdarBlocks.empty()) {
+    if (int st = frame.check(wdar_init(conf))) return st;
+    const int n = static_cast<int>(conf.wdarBlocks.size());
+    for (int i = 0; i < n; ++i) {
+      std::printf("\nProcessing WDAR best block %d of %d.\n", i + 1, n);
+      auto& b = conf.wdarBlocks[static_cast<std::size_t>(i)];
+      int top = 0, left = 0;
+      corner(b.sample, b.line, top, left);
+      int st = read_block(conf, image, top, left, block);
+      if (st == 0) st = wdar_estimate(conf, block, dccycles(coef, b.sample, b.line), b.estimate);
+      if (frame.check(st)) {
+        wdar_free(conf);
+        return st;
+      }
+    }
+    wdar_free(conf);
+  }
+  return 0;
+}
+
+int estambiguity(dcestconf& conf, const dcimage& image, std::span<const double> coef) {
+  base::Frame frame("estambiguity");
+  conf.wdarOffset = kNoWdarOffset;
+  conf.mlbfBlocks.clear();
+  conf.wdarBlocks.clear();
+  conf.mlbfStats = {};
+  conf.wdarStats = {};
+  const double centre = dccycles(coef, image.samples / 2, image.lines / 2);
+  const int ambG = round_half_away(conf.geometricCentroid / image.prf - centre);
+  conf.geometricAmbiguity = ambG;
+  std::printf("Geometric computed DC gives ambiguity: %d \n", ambG);
+  if (conf.Amb_flag == 0) {
+    conf.ambiguity = 0;
+    conf.decision = AmbiguityDecision::None;
+    return 0;
+  }
+  if (conf.Amb_flag == 2) {
+    conf.ambiguity = ambG;
+    conf.decision = AmbiguityDecision::Geometry;
+    return 0;
+  }
+  if (conf.Amb_flag != 1) {
+    base::report(base::kReportError, "Amb_flag must be 0, 1 or 2");
+    return 10;
+  }
+  if (conf.Nbestblocks < 1) {
+    base::report(base::kReportError, "Nbestblocks must be positive for the ambiguity estimators");
+    return 10;
+  }
+  // Until an estimator decides, the field holds what would be applied.
+  conf.ambiguity = ambG;
+  conf.decision = AmbiguityDecision::GeometryFallback;
+
+  const int bw = conf.Blocks / conf.Patchs, bh = conf.Blockl / conf.Patchl;
+  std::vector<std::array<int, 2>> points;
+  topNpoints(conf.contrastMap, conf.patchesAcross, conf.patchesDown, conf.Nbestblocks, bw, bh, points);
+  std::printf("\nFound %d optimal blocks for MBLF estimation.\n", static_cast<int>(points.size()));
+  for (const auto& p : points) {
+    mlbfblock b;
+    b.sample = p[0] * conf.Patchs;
+    b.line = p[1] * conf.Patchl;
+    conf.mlbfBlocks.push_back(std::move(b));
+  }
+  std::vector<float> inverse(conf.contrastMap);
+  for (auto& v : inverse)
+    if (v != 0.0f) v = 1.0f / v;
+  topNpoints(inverse, conf.patchesAcross, conf.patchesDown, conf.Nwdarblocks, bw, bh, points);
+  std::printf("\nFound %d optimal blocks for WDAR estimation.\n", static_cast<int>(points.size()));
+  for (const auto& p : points) conf.wdarBlocks.push_back({p[0] * conf.Patchs, p[1] * conf.Patchl, 0.0});
+
+  if (int st = frame.check(bestblocksproc(conf, image, coef))) return st;
+
+  // Absolute centroids less the fractional polynomial: candidate ambiguities.
+  for (auto& b : conf.mlbfBlocks) {
+    const double p = dccycles(coef, b.sample, b.line);
+    for (auto& e : b.estimates) e -= p;
+  }
+  for (auto& b : conf.wdarBlocks) b.estimate -= dccycles(coef, b.sample, b.line);
+  dcnastd(conf);
+
+  const bool mlbfReliable = agreeing(conf.mlbfStats, conf.Varthr);
+  const bool wdarReliable = agreeing(conf.wdarStats, conf.Varthr);
+  if (!mlbfReliable) {
+    if (wdarReliable) {
+      conf.ambiguity = round_half_away(conf.wdarStats.mean);
+      conf.decision = AmbiguityDecision::Wdar;
+      std::printf("\nWDAR results (NO offset correction!): mean %f, std %f , amb %d.\n", conf.wdarStats.mean,
+                  conf.wdarStats.std, conf.ambiguity);
+      return 0;
+    }
+    if (conf.wdarBlocks.empty()) {
+      std::printf("No WDAR blocks available. \n");
+    } else {
+      std::printf("\nWDAR results (NO offset correction!): mean %f, std %f , amb %d.\n", conf.wdarStats.mean,
+                  conf.wdarStats.std, round_half_away(conf.wdarStats.mean));
+    }
+    std::printf("Ambiguity estimators cannot decide: geometric ambiguity %d applied.\n", ambG);
+    return 1;
+  }
+  const int ambM = round_half_away(conf.mlbfStats.mean);
+  if (conf.wdarBlocks.empty() || conf.wdarStats.count < 1) {
+    std::printf("\nNo WDAR blocks available. Offset frequency estimation unavailable. \n");
+  } else {
+    const double offset = static_cast<float>(conf.wdarStats.mean) - ambM;
+    for (auto& b : conf.wdarBlocks) b.estimate -= offset;
+    conf.wdarOffset = offset;
+    conf.wdarStats.mean -= offset;
+    std::printf("\nWDAR results: mean %f, std %f, Nest %d, amb %d.\n", conf.wdarStats.mean, conf.wdarStats.std,
+                conf.wdarStats.count, round_half_away(conf.wdarStats.mean));
+  }
+  conf.ambiguity = ambM;
+  conf.decision = AmbiguityDecision::Mlbf;
+  std::printf("\nMLBF results: mean %f, std %f, Nest %d, amb %d.\n", conf.mlbfStats.mean, conf.mlbfStats.std,
+              conf.mlbfStats.count, ambM);
+  return 0;
+}
+
+}  // namespace sar::doppler

@@ -1,0 +1,280 @@
+// The ambiguous centroid polynomial: rating of the blocks, filling of the bad ones, the dominant
+// plane of the phase field by a two-dimensional transform, the weighted fit of the residual,
+// the ambiguity and the conversion to hertz.
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <numbers>
+#include <vector>
+
+#include "base/diagnostics.hpp"
+#include "doppler/dcest.hpp"
+#include "dsp/fft.hpp"
+#include "dsp/fitting.hpp"
+
+namespace sar::doppler {
+namespace {
+
+constexpr double kPi = std::numbers::pi;
+constexpr double kTwoPi = 2.0 * kPi;
+constexpr double kSixteenPi2 = 157.91367041742973;
+
+/// Trapezoidal refinement of the integral of g over [0, 1]: each round doubles the points,
+/// until two rounds agree to 1e-6 relative; at most 20 rounds. False when it does not settle.
+template <class G>
+bool trapezoid(const G& g, double& result) {
+  double s = 0.5 * (g(0.0) + g(1.0));
+  double old = -1e60;
+  int points = 1;
+  for (int round = 1; round <= 20; ++round) {
+    if (round > 1) {
+      const double h = 1.0 / points;
+      double sum = 0.0;
+      for (int i = 0; i < points; ++i) sum += g((i + 0.5) * h);
+      s = 0.5 * (s + sum * h);
+      points *= 2;
+    }
+    if (std::fabs(s - old) < 1e-6 * std::fabs(old)) {
+      result = s;
+      return true;
+    }
+    old = s;
+  }
+  return false;
+}
+
+/// Size of the plane-search grid for precision p (cycles), at least covering n blocks.
+int grid_size(double p, int n) {
+  auto pow2above = [](double v) {
+    const int e = v >= 1.0 ? static_cast<int>(std::trunc(std::log2(v))) + 1 : 1;
+    return 1 << std::min(e, 24);
+  };
+  int size = p > 0.0 ? pow2above(std::floor(1.0 / p)) : 2;
+  if (size < n) size = pow2above(static_cast<double>(n));
+  return size;
+}
+
+}  // namespace
+
+double dccycles(std::span<const double> c, double x, double y) {
+  return c[0] + c[1] * x + c[2] * y + c[3] * x * y + c[4] * x * x + c[5] * x * x * x + c[6] * x * x * x * x;
+}
+
+int getkrstd(const dcimage& image, dcestconf& conf) {
+  base::Frame frame("getkrstd");
+  const double u = 2.0 * image.platformSpeed / (conf.AnLen * image.prf);
+  const double b0 = bspline3(0.0);
+  const double r1 = bspline3(u) / b0;
+  const double r2 = bspline3(2.0 * u) / b0;
+  for (auto& b : conf.blocks) {
+    const double s = b.snr;
+    auto g = [&](double x) {
+      const double num = r1 * std::sin(kTwoPi * x) + 2.0 * r2 * std::sin(2.0 * kTwoPi * x);
+      const double den = 1.0 / s + 1.0 + 2.0 * (r1 * std::cos(kTwoPi * x) + r2 * std::cos(2.0 * kTwoPi * x));
+      const double q = num / den;
+      return q * q;
+    };
+    double integral = 0.0;
+    if (!(s > 0.0) || !trapezoid(g, integral) || !(integral > 0.0) || !std::isfinite(integral)) {
+      std::printf("\nfunction getkrstd(): anomalous FAILURE (snr=%f) <==\n", s);
+      return -1;
+    }
+    const double n = b.contrast > 0.0 ? static_cast<double>(conf.Blockl) * conf.Blocks / b.contrast : 1.0;
+    b.phaseVariance = 1.0 / (integral * n * kSixteenPi2);
+  }
+  return 0;
+}
+
+int unwrapdcbin(dcestconf& conf, std::array<double, 3>& plane) {
+  base::Frame frame("unwrapdcbin");
+  const int nc = conf.blocksAcross;
+  const int nr = conf.blockRows;
+  const int pr = grid_size(conf.Fftrgprc, nc);
+  const int pa = grid_size(conf.Fftazprc, nr);
+  dsp::cvector grid(static_cast<std::size_t>(pr) * static_cast<std::size_t>(pa), dsp::fcomplex(0.0f, 0.0f));
+  for (int r = 0; r < nr; ++r)
+    for (int c = 0; c < nc; ++c) {
+      const double f = conf.blocks[static_cast<std::size_t>(r) * nc + c].centroid;
+      grid[static_cast<std::size_t>(r) * pr + c] =
+          dsp::fcomplex(static_cast<float>(std::cos(kTwoPi * f)), static_cast<float>(std::sin(kTwoPi * f)));
+    }
+  if (int st = frame.check(dsp::fft_c(pr, pr, pa, pa, 1, 1, grid))) return st;
+  std::size_t best = 0;
+  float bestMag = -1.0f;
+  for (std::size_t k = 0; k < grid.size(); ++k) {
+    const float m = std::abs(grid[k]);
+    if (m > bestMag) {
+      bestMag = m;
+      best = k;
+    }
+  }
+  int ia = static_cast<int>(best / static_cast<std::size_t>(pr));
+  int ir = static_cast<int>(best % static_cast<std::size_t>(pr));
+  if (ia > pa / 2) ia -= pa;
+  if (ir > pr / 2) ir -= pr;
+  const double azSlope = static_cast<double>(ia) / pa / conf.Blockl;
+  const double rgSlope = static_cast<double>(ir) / pr / conf.Blocks;
+  const dcblock& first = conf.blocks.front();
+  const double peakPhase = std::atan2(grid[best].imag(), grid[best].real()) / kTwoPi;
+  plane = {rgSlope, azSlope, peakPhase - (first.sample * rgSlope + first.line * azSlope)};
+  return 0;
+}
+
+int getdccoef(dcestconf& conf, const std::array<double, 3>& plane, std::span<double> coef) {
+  base::Frame frame("getdccoef");
+  std::vector<double> xs, ys, res, sig;
+  for (const auto& b : conf.blocks) {
+    if (!b.good) continue;
+    const double pl = plane[2] + plane[0] * b.sample + plane[1] * b.line;
+    // Phase of exp(j 2 pi f) exp(-j 2 pi plane) from sine and cosine products: no wrap.
+    const double c = std::cos(kTwoPi * b.centroid) * std::cos(kTwoPi * pl) + std::sin(kTwoPi * b.centroid) * std::sin(kTwoPi * pl);
+    const double s = std::sin(kTwoPi * b.centroid) * std::cos(kTwoPi * pl) - std::cos(kTwoPi * b.centroid) * std::sin(kTwoPi * pl);
+    xs.push_back(b.sample);
+    ys.push_back(b.line);
+    res.push_back(std::atan2(s, c) / kTwoPi);
+    sig.push_back(b.phaseVariance > 0.0 ? std::sqrt(b.phaseVariance) : 1.0);
+  }
+  if (xs.size() <= 7) {
+    base::report(base::kReportError, "Too few good blocks for the Doppler centroid polynomial");
+    return 10;
+  }
+  std::array<double, 7> a{};
+  std::array<int, 7> mask{};
+  bool any = false;
+  for (int j = 0; j < 7; ++j) {
+    mask[static_cast<std::size_t>(j)] = conf.Pol_Weights[static_cast<std::size_t>(j)] != 0 ? 1 : 0;
+    any = any || mask[static_cast<std::size_t>(j)];
+  }
+  if (any) {
+    std::vector<double> index(xs.size());
+    for (std::size_t i = 0; i < index.size(); ++i) index[i] = static_cast<double>(i);
+    dsp::RowMatrixXd covar;
+    double chisq = 0.0;
+    const dsp::IndexedBasisFunction basis = [&](int i, double, std::span<double> f) {
+      const double x = xs[static_cast<std::size_t>(i)], y = ys[static_cast<std::size_t>(i)];
+      f[0] = 1.0;
+      f[1] = x;
+      f[2] = y;
+      f[3] = x * y;
+      f[4] = x * x;
+      f[5] = x * x * x;
+      f[6] = x * x * x * x;
+    };
+    if (int st = frame.check(dsp::lfit_modOBX(index, res, sig, a, mask, covar, chisq, basis))) return st;
+  }
+  const std::array<double, 7> terms = {plane[2] + a[0], a[1] + plane[0], a[2] + plane[1], a[3], a[4], a[5], a[6]};
+  for (std::size_t j = 0; j < 7; ++j) coef[j] = terms[j] * conf.Pol_Weights[j];
+  return 0;
+}
+
+int ratesnr(dcestconf& conf) {
+  double noise = 0.0;
+  int valid = 0;
+  for (const auto& b : conf.blocks)
+    if (b.valid) {
+      noise += b.noise;
+      ++valid;
+    }
+  noise = valid > 0 ? noise / valid : 0.0;
+  for (auto& b : conf.blocks) {
+    b.filled = 0;
+    if (noise <= 0.0) {
+      // No noise can be told: every valid block is as good as any other.
+      b.snr = b.valid ? 1e10 : 0.001;
+    } else {
+      b.snr = b.valid ? (b.power - noise) / noise : 0.001;
+    }
+    b.good = b.valid && b.snr > 0.0;
+  }
+  return 0;
+}
+
+int fillblocks(dcestconf& conf, const dcimage& image) {
+  auto& blocks = conf.blocks;
+  // Bad blocks take the mean of the good ones around them, in growing windows. Centroids are
+  // averaged as phasors: 0.49 and -0.49 PRF lie 0.02 PRF apart and their mean is 0.5, not 0.
+  const double limit = std::hypot(image.samples / 2.0, image.lines / 2.0);
+  for (auto& b : blocks) {
+    if (b.good) continue;
+    double dx = conf.Blocks, dy = conf.Blockl;
+    for (;;) {
+      double sumC = 0.0, sumS = 0.0, sumSnr = 0.0;
+      int n = 0;
+      for (const auto& o : blocks) {
+        if (&o == &b || !o.good || !o.valid) continue;
+        if (std::abs(o.sample - b.sample) > dx || std::abs(o.line - b.line) > dy) continue;
+        sumC += std::cos(kTwoPi * o.centroid);
+        sumS += std::sin(kTwoPi * o.centroid);
+        sumSnr += o.snr;
+        ++n;
+      }
+      if (n > 0) {
+        b.centroid = (sumC == 0.0 && sumS == 0.0) ? 0.0 : std::atan2(sumS, sumC) / kTwoPi;
+        b.snr = sumSnr / n;
+        b.filled = 1;
+        break;
+      }
+      if (std::hypot(dx, dy) >= limit) {
+        base::report(base::kReportError, "No valid Doppler block to fill the grid from");
+        return -1;
+      }
+      dx += conf.Blocks;
+      dy += conf.Blockl;
+    }
+  }
+  // Blocks without statistics take the contrast of the nearest valid block (first on a tie).
+  for (auto& b : blocks) {
+    if (b.valid) continue;
+    double bestD = 0.0;
+    const dcblock* nearest = nullptr;
+    for (const auto& o : blocks) {
+      if (!o.valid) continue;
+      const double d = std::hypot(static_cast<double>(o.sample - b.sample), static_cast<double>(o.line - b.line));
+      if (!nearest || d < bestD) {
+        nearest = &o;
+        bestD = d;
+      }
+    }
+    if (nearest) b.contrast = nearest->contrast;
+  }
+  return 0;
+}
+
+int dcnapoly(const dcimage& image, dcestconf& conf, DopplerPoly& poly) {
+  base::Frame frame("dcnapoly");
+  if (conf.blocks.empty()) return 10;
+  ratesnr(conf);
+  if (int st = frame.check(fillblocks(conf, image))) return st;
+
+  // Phase variances, dominant plane, fit of the residual.
+  if (int st = frame.check(getkrstd(image, conf))) return st;
+  if (int st = frame.check(unwrapdcbin(conf, conf.plane))) return st;
+  std::array<double, 7> c{};
+  if (int st = frame.check(getdccoef(conf, conf.plane, c))) return st;
+
+  // The ambiguity field always holds the value that is applied: an unresolved ambiguity leaves
+  // the geometric fallback in it and is reported.
+  const int st = estambiguity(conf, image, c);
+  if (st == 1) {
+    std::printf("\nWARNING: unresolved ambiguity!\n");
+  } else if (st != 0) {
+    return frame.check(st);
+  }
+  c[0] += conf.ambiguity;
+
+  // Cycles of the PRF over sample and line indices to hertz over seconds.
+  const double prf = image.prf, fs = conf.fs;
+  for (auto& v : c) v *= prf;
+  c[1] *= fs;
+  c[2] *= prf;
+  c[3] *= prf * fs;
+  c[4] *= fs * fs;
+  c[5] *= fs * fs * fs;
+  c[6] *= fs * fs * fs * fs;
+  for (std::size_t i = 0; i < 7; ++i) poly[i] = c[i];
+  poly[7] = image.rangeTimeOrigin;
+  poly[8] = image.azimuthTimeOrigin;
+  return 0;
+}
+
+}  // namespace sar::doppler

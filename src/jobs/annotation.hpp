@@ -1,0 +1,60 @@
+#pragma once
+// The annotation of a focused stripmap product.
+//
+// At the end of a job, what it knows about the product goes into the profile file
+// R_slc_hdr (sections OrbitCorrection, StateVectorData, InitialGeometry, Processing,
+// ChannelInfo, RasterInfo, Sensor, RegistrationCoordinates, SwathInfo), which is then converted
+// into the description R_slc.sml; the SLC raster also gets its header R_slc.hdr.
+//
+// The annotation describes the SLC grid: its first line and sample are those of the focused
+// image (after the block overlaps), its sizes the focused sizes, and its times come from
+// procparm's first line and first sample times. Doppler polynomials are written as range
+// polynomials at the first line time. The pass direction follows the sign of the satellite's
+// Earth-fixed z velocity at the scene centre.
+#include <string>
+#include <string_view>
+
+#include "jobs/stages.hpp"
+
+namespace sar::jobs {
+
+/// Suggested looks for a square ground pixel: rangeGround = pixelSpacingRg / sin(incidence),
+/// azimuthGround = pixelSpacingAz / sin(fixedAngle) (degrees, magnitudes); only the finer
+/// direction is multilooked, by the truncated ratio. Returns 0.
+int ComputeSuggestedLooks(double pixelSpacingRg, double pixelSpacingAz, double incidence, double fixedAngle,
+                          int& rangeLooks, int& azimuthLooks, double& rangeGroundSpace, double& azimuthGroundSpace);
+
+/// UTM zone of a longitude in degrees (brought into -180..180 by one turn at most); the
+/// antimeridian itself belongs to zone 60. 0 for a longitude that is not a number.
+int utm_zone(double longitude);
+
+/// "H/H", "V/V", "H/V", "V/H" by sarpar's code; "" for another code.
+std::string_view polarisation_text(int code);
+
+/// True when the satellite moves north (Earth-fixed z velocity above 0) at `time` (sec85),
+/// from procparm's five state vectors.
+bool pass_is_ascending(const procparm& proc, double time);
+
+/// The literals that tell the stripmap products apart.
+struct AnnotationProduct {
+  std::string_view originData = "ENVISAT_IM0";
+  std::string_view sceneDataPrefix = "ENVISAT-1|ENVISAT_IM0|";
+  bool writePrfExtracted = true;
+};
+
+/// Writes the profile annotation `headerPath` (an older file there is replaced) and syncs it.
+/// 0, or 1 when the file cannot be written.
+int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, const procparm& proc,
+                              const azimuthconf& az, const AnnotationProduct& product = {});
+
+/// Converts the annotation into the description beside it (base of headerPath + ".sml"),
+/// replacing an older description. 0, or 1 (missing key table, unreadable annotation, failed
+/// write).
+int convert_annotation(const std::string& headerPath);
+
+/// The product annotation of the IM job: the profile annotation, the raster header of the SLC
+/// (headerPath without "_hdr", + ".hdr") and the description. 0, or 1 with a report.
+int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const dcestconf& dc,
+                const azimuthconf& az, const extconf& extra, const enviauxfiles& files);
+
+}  // namespace sar::jobs

@@ -1,0 +1,126 @@
+// The IM job end to end on a simulated product, through the focussing executable: every point
+// target of the truth file must be found in the SLC at its zero-Doppler time and slant range
+// (mapped through the annotation's first line and first sample times), with the resolution the
+// processed bands predict, and the corners must geolocate the SLC grid.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <fstream>
+#include <regex>
+
+#include "analyser/irf.hpp"
+#include "base/profile.hpp"
+#include "job_harness.hpp"
+#include "simulator/simulator.hpp"
+
+using namespace sar::test;
+namespace sim = sar::simulator;
+
+namespace {
+
+constexpr double kPi = 3.14159265358979323846;
+
+// Replaces "Key = value" lines of a parameter file.
+void set_parameters(const fs::path& file, const std::vector<std::pair<std::string, std::string>>& values) {
+  std::string text = slurp(file);
+  for (const auto& [key, value] : values) {
+    const std::regex line("(^|\n)" + key + " = [^\n]*");
+    ASSERT_TRUE(std::regex_search(text, line)) << key;
+    text = std::regex_replace(text, line, "$1" + key + " = " + value);
+  }
+  std::ofstream(file, std::ios::binary) << text;
+}
+
+double sinc(double u) { return u == 0.0 ? 1.0 : std::sin(kPi * u) / (kPi * u); }
+
+// -3 dB width in lines of the azimuth response with the whole PRF processed and the two-way
+// antenna pattern as the only weighting.
+double azimuth_width(double prf, double velocity, double antenna) {
+  const int n = 2048;
+  auto response = [&](double x) {
+    double re = 0.0;
+    for (int i = 0; i < n; ++i) {
+      const double f = (i - n / 2) * prf / n;
+      const double g = sinc(antenna * f / (2.0 * velocity));
+      re += g * g * std::cos(2 * kPi * (i - n / 2) * x / n);
+    }
+    return re * re;
+  };
+  const double peak = response(0.0);
+  double lo = 0.0, hi = 2.0;
+  for (int it = 0; it < 50; ++it) {
+    const double mid = 0.5 * (lo + hi);
+    (response(mid) > 0.5 * peak ? lo : hi) = mid;
+  }
+  return 2.0 * lo;
+}
+
+}  // namespace
+
+TEST(ImJobEndToEnd, FocusesSimulatedTargetsWhereTheTruthPutsThem) {
+  ScratchJob job("im_e2e");
+  sim::SimulationConfig c;
+  c.out_dir = (job.dir() / "inputs").string();
+  c.lines = 4200;
+  c.samples = 1400;
+  // The platform's own yaw-steering law: the centroid the orbit predicts is then the scene's.
+  c.attitude.yaw_steering = true;
+  c.noise_db = -10.0;
+  c.targets = {{{45.0, 10.0, 0.0}, 30.0}, {{45.02, 10.03, 0.0}, 25.0}, {{44.985, 9.99, 0.0}, 25.0}};
+  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
+  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  const sim::SimulationTruth t = sim::run_simulation(c);
+  const std::string root = (job.dir() / "out").string();
+  const std::string list = job.layout({t.level0_path, t.orbit_path, t.ins_path, t.xca_path, root, "512", "512",
+                                       "NotOK", "NotOK", "NotOK", "NotOK", "NotOK", "OK", "1.0"});
+  set_parameters(job.dir() / "des" / "parameters_IM.hdr",
+                 {{"LinesInBlock", "4096"}, {"AzimuthOverlap", "2400"}, {"SamplesInBlock", "1024"},
+                  {"RangeOverlap", "256"}, {"RangeWindowHammingParameter", "0"},
+                  {"AzimuthWindowHammingParameter", "0"}, {"Azblk", "1000"}});
+  const RunResult r = job.run("main_focussing_asar_IM#" + list);
+  ASSERT_EQ(r.status, 0) << r.err << job.log();
+
+  const std::string slc = root + "_slc";
+  ASSERT_TRUE(fs::exists(slc));
+  ASSERT_TRUE(fs::exists(slc + "_hdr"));
+  EXPECT_TRUE(fs::exists(slc + ".tif"));
+  EXPECT_FALSE(fs::exists(slc + ".part"));
+
+  // The SLC grid from the job's own log line (sizes and first times).
+  const std::string log = job.log();
+  std::smatch m;
+  ASSERT_TRUE(std::regex_search(log, m, std::regex("SLC: ([0-9]+) lines of ([0-9]+) samples, first line ([-0-9.e+]+) s, "
+                                                   "first sample ([-0-9.e+]+) s")))
+      << log;
+  const int lines = std::stoi(m[1]), samples = std::stoi(m[2]);
+  const double firstLine = std::stod(m[3]), firstSample = std::stod(m[4]);
+  ASSERT_EQ(fs::file_size(slc), static_cast<std::uintmax_t>(lines) * samples * 8);
+  std::vector<std::complex<float>> image(static_cast<std::size_t>(lines) * samples);
+  std::ifstream(slc, std::ios::binary).read(reinterpret_cast<char*>(image.data()),
+                                            static_cast<std::streamsize>(image.size() * 8));
+
+  const double fs_ = 19207680.0;
+  const double theoryRg = 0.886 * fs_ / t.chirp_bandwidth;
+  sar::analyser::ComplexImageView view{image, lines, samples, samples, 0, 0};
+  sar::analyser::AnalyserOptions opt;
+  int measured = 0;
+  for (const auto& target : t.targets) {
+    const double line = (target.zero_doppler_time - firstLine) * t.prf;
+    const double sample = (target.range_time - firstSample) * fs_;
+    if (line < 20 || line > lines - 20 || sample < 20 || sample > samples - 20) continue;
+    const auto irf = sar::analyser::measure_point(view, line, sample, opt);
+    ASSERT_TRUE(irf.valid) << irf.problem;
+    EXPECT_NEAR(irf.peak_line, line, 0.1);
+    EXPECT_NEAR(irf.peak_sample, sample, 0.1);
+    EXPECT_NEAR(irf.res_rg_px, theoryRg, 0.1 * theoryRg);
+    const double velocity = target.doppler_rate != 0.0
+                                ? std::sqrt(-target.doppler_rate * t.wavelength * target.slant_range / 2.0)
+                                : 7000.0;
+    const double theoryAz = azimuth_width(t.prf, velocity, 10.0);
+    EXPECT_NEAR(irf.res_az_px, theoryAz, 0.1 * theoryAz);
+    EXPECT_LT(irf.pslr_rg_db, -11.8);
+    EXPECT_LT(irf.pslr_az_db, -11.8);
+    ++measured;
+  }
+  EXPECT_GE(measured, 2);
+}
