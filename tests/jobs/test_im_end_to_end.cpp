@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstdio>
 #include <fstream>
 #include <regex>
 
@@ -110,6 +111,14 @@ TEST(ImJobEndToEnd, FocusesSimulatedTargetsWhereTheTruthPutsThem) {
     if (line < 20 || line > lines - 20 || sample < 20 || sample > samples - 20) continue;
     const auto irf = sar::analyser::measure_point(view, line, sample, opt);
     ASSERT_TRUE(irf.valid) << irf.problem;
+    std::printf("SLC IRF: line %.3f (%+.3f) sample %.3f (%+.3f) az %.3f px (theory %.3f) rg %.3f px (theory %.3f) "
+                "PSLR az %.2f rg %.2f ISLR az %.2f rg %.2f\n",
+                irf.peak_line, irf.peak_line - line, irf.peak_sample, irf.peak_sample - sample, irf.res_az_px,
+                azimuth_width(t.prf, target.doppler_rate != 0.0
+                                         ? std::sqrt(-target.doppler_rate * t.wavelength * target.slant_range / 2.0)
+                                         : 7000.0,
+                              10.0),
+                irf.res_rg_px, theoryRg, irf.pslr_az_db, irf.pslr_rg_db, irf.islr_az_db, irf.islr_rg_db);
     EXPECT_NEAR(irf.peak_line, line, 0.1);
     EXPECT_NEAR(irf.peak_sample, sample, 0.1);
     EXPECT_NEAR(irf.res_rg_px, theoryRg, 0.1 * theoryRg);

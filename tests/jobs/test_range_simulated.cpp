@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -94,6 +95,8 @@ TEST(RangeCompressionOfSimulatedTargets, PeaksAtTrueRangeWithTheBandsResolution)
       const auto m = sar::analyser::measure_cut(cut, expected, 16);
       ASSERT_TRUE(m.valid) << m.problem;
       // Within a line the target moves by its range walk over half a line at most.
+      std::printf("range IRF: line %.1f expected %.3f peak %.3f width %.4f (theory %.4f) PSLR %.2f ISLR %.2f\n", line,
+                  expected, m.peak, m.resolution, theory, m.pslr_db, m.islr_db);
       EXPECT_NEAR(m.peak, expected, 0.05) << "target at line " << line;
       EXPECT_NEAR(m.resolution, theory, 0.05 * theory);
       EXPECT_NEAR(m.pslr_db, -13.26, 1.0);
