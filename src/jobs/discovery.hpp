@@ -25,4 +25,13 @@ std::optional<OrbitCandidate> choose_orbit(const std::vector<OrbitCandidate>& ca
 /// Sensing start (sec85) of an ENVISAT product, from its MPH; nullopt when unreadable.
 std::optional<double> product_sensing_start(const std::string& product);
 
+/// choose_orbit, with a one-line `error` when none covers `sensingStart`: it names the date,
+/// the folder `where`, and the nearest validity ending before and starting after the date.
+std::optional<OrbitCandidate> pick_orbit(const std::vector<OrbitCandidate>& candidates, double sensingStart,
+                                         const std::string& where, std::string& error);
+
+/// The orbit file below `dir` that covers the sensing start of `product`; nullopt with a
+/// one-line `error` when the product's date cannot be read or no file covers it.
+std::optional<OrbitCandidate> find_orbit_for(const std::string& product, const std::string& dir, std::string& error);
+
 }  // namespace sar::jobs

@@ -8,6 +8,7 @@
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "base/run_services.hpp"
+#include "dsp/fft.hpp"
 #include "io/cell_types.hpp"
 #include "jobs/drivers.hpp"
 
@@ -61,6 +62,10 @@ int focussing_entry(std::string command) {
 
   // Rasters are written in the byte order the configuration asks for.
   io::set_raster_settings({io::byte_order_from_name(base::env_lookup("VANTERRA_DEFAULT_BYTE_ORDER").value_or(""))});
+
+  // A rerun of a job must give the same bytes: transform plans are chosen by estimate, not by
+  // timing candidates, whose choice (and rounding) can change from run to run.
+  dsp::set_fft_planning(dsp::FftPlanning::Estimate);
 
   command = base::cut_at_host_separator(command);
   if (base::init_ckerr_locking() != 0) {

@@ -1,23 +1,30 @@
 #include "jobs/standalone.hpp"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <mutex>
+#include <optional>
 #include <sstream>
 #include <stdexcept>
 #include <thread>
 
-#include "base/convert.hpp"
 #include "base/run_services.hpp"
+#include "jobs/batch.hpp"
 #include "jobs/discovery.hpp"
 #include "jobs/setup.hpp"
+
+extern char** environ;
 
 namespace sar::jobs {
 namespace fs = std::filesystem;
@@ -27,22 +34,41 @@ namespace {
 struct ModeRow {
   const char* name;   // command-line mode
   const char* setup;  // setup mode
-  bool built;         // the processing chain stands
+  const char* title;  // what it focuses
+  bool orbit;         // the job takes an orbit file
 };
-constexpr ModeRow kModes[] = {
-    {"im", "IM", true}, {"ap", "AP", false}, {"ws", "WS", false}, {"rs", "RS", false}, {"wss", "WSS", false}};
+constexpr ModeRow kModes[] = {{"im", "IM", "ENVISAT ASAR image mode level 0 (ASA_IM__0P)", true},
+                              {"ap", "AP", "ENVISAT ASAR alternating polarisation level 0 (ASA_AP__0P)", true},
+                              {"ws", "WS", "ENVISAT ASAR wide swath level 0 (ASA_WS__0P)", true},
+                              {"rs", "RS", "RADARSAT-1 CEOS raw product", false},
+                              {"wss", "WSS", "ENVISAT ASAR wide swath single-look level 1 (ASA_WSS_1P), multilooked", true}};
 
-const ModeRow* find_mode(const std::string& m) {
+const ModeRow* find_mode(std::string_view m) {
   for (const auto& r : kModes)
     if (m == r.name) return &r;
   return nullptr;
 }
 
+// Log text of a stage that this build does not hold.
+constexpr std::string_view kStageNotBuilt = "stage not available in this build";
+// Width at which the error record wraps a detail.
+constexpr std::size_t kRecordDetailWidth = 48;
+
 std::vector<std::string> read_lines(const fs::path& p) {
   std::vector<std::string> out;
   std::ifstream in(p);
-  for (std::string l; std::getline(in, l);) out.push_back(l);
+  for (std::string l; std::getline(in, l);) {
+    if (!l.empty() && l.back() == '\r') l.pop_back();
+    out.push_back(l);
+  }
   return out;
+}
+
+std::string read_text(const fs::path& p) {
+  std::ifstream in(p, std::ios::binary);
+  std::ostringstream s;
+  s << in.rdbuf();
+  return s.str();
 }
 
 std::string trim(const std::string& s) {
@@ -51,9 +77,11 @@ std::string trim(const std::string& s) {
   return s.substr(b, s.find_last_not_of(" \t\r") - b + 1);
 }
 
-StandaloneOutcome fail(std::string message, int status = 2) {
+StandaloneOutcome bad_request(std::string message) {
   StandaloneOutcome o;
-  o.status = status;
+  o.status = kExitBadRequest;
+  o.result = StandaloneResult::kBadRequest;
+  o.error = message;
   o.summary = "sarfocus: " + std::move(message);
   return o;
 }
@@ -62,6 +90,7 @@ StandaloneOutcome fail(std::string message, int status = 2) {
 class ProgressView {
  public:
   explicit ProgressView(std::FILE* out) : out_(out), tty_(out && ::isatty(::fileno(out))) {}
+  bool active() const { return out_ != nullptr; }
   void show(int percent, const std::string& label) {
     if (!out_ || (percent == last_ && label == label_)) return;
     last_ = percent;
@@ -69,8 +98,8 @@ class ProgressView {
     const int p = std::clamp(percent, 0, 100);
     if (tty_) {
       const int filled = p * 30 / 100;
-      std::fprintf(out_, "\r[%s%s] %3d%% %-50.50s", std::string(filled, '#').c_str(),
-                   std::string(30 - filled, ' ').c_str(), p, label.c_str());
+      std::fprintf(out_, "\r[%s%s] %3d%% %-50.50s", std::string(static_cast<std::size_t>(filled), '#').c_str(),
+                   std::string(static_cast<std::size_t>(30 - filled), ' ').c_str(), p, label.c_str());
     } else {
       std::fprintf(out_, "%3d%% %s\n", p, label.c_str());
     }
@@ -87,49 +116,373 @@ class ProgressView {
   std::string label_;
 };
 
+// Runs focussing in `workDir`. Everything the child needs is built before the fork: between
+// fork and exec a threaded parent's child may only make async-signal-safe calls.
 int run_child(const std::string& exe, const std::string& command, const fs::path& workDir, int threads,
-              const fs::path& workingFile, ProgressView& view) {
+              ProgressView& view) {
+  std::vector<std::string> env;
+  for (char** e = environ; e && *e; ++e) {
+    const std::string_view v(*e);
+    if (v.rfind("VANTERRA_INIT_DIR=", 0) == 0 || (threads > 0 && v.rfind("OMP_NUM_THREADS=", 0) == 0)) continue;
+    env.emplace_back(v);
+  }
+  env.push_back("VANTERRA_INIT_DIR=" + workDir.string());
+  if (threads > 0) env.push_back("OMP_NUM_THREADS=" + std::to_string(threads));
+  std::vector<char*> envp;
+  for (auto& e : env) envp.push_back(e.data());
+  envp.push_back(nullptr);
+  std::string exeCopy = exe, commandCopy = command;
+  char* argv[] = {exeCopy.data(), commandCopy.data(), nullptr};
+  const std::string outPath = (workDir / "focussing.out").string();
+  const std::string dir = workDir.string();
+  const fs::path workingFile = workDir / base::kDefaultWorkingFile;
+
   const pid_t pid = ::fork();
   if (pid < 0) return -1;
   if (pid == 0) {
-    ::setenv("VANTERRA_INIT_DIR", workDir.c_str(), 1);
-    if (threads > 0) ::setenv("OMP_NUM_THREADS", std::to_string(threads).c_str(), 1);
-    const int fd = ::open((workDir / "focussing.out").c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    const int fd = ::open(outPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
     if (fd >= 0) {
       ::dup2(fd, 1);
       ::dup2(fd, 2);
-      ::close(fd);
+      if (fd > 2) ::close(fd);
     }
-    if (::chdir(workDir.c_str()) != 0) ::_exit(127);
-    ::execl(exe.c_str(), exe.c_str(), command.c_str(), static_cast<char*>(nullptr));
+    if (::chdir(dir.c_str()) != 0) ::_exit(127);
+    ::execve(argv[0], argv, envp.data());
     ::_exit(127);
   }
   int raw = 0;
   for (;;) {
     const pid_t r = ::waitpid(pid, &raw, WNOHANG);
-    if (r == pid) break;
-    const auto lines = read_lines(workingFile);
-    if (lines.size() >= 2 && !lines[0].empty() && lines[0][0] != '-')
-      view.show(std::atoi(lines[0].c_str()), trim(lines[1]));
-    std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    if (r == pid || (r < 0 && errno != EINTR)) break;
+    if (view.active()) {
+      const auto lines = read_lines(workingFile);
+      // "0" and "-" stand in the working file until the job has said what it does.
+      if (lines.size() >= 2 && !lines[0].empty() && lines[0][0] != '-' && trim(lines[1]) != "-")
+        view.show(std::atoi(lines[0].c_str()), trim(lines[1]));
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));
   }
   view.done();
   return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw);
 }
 
-bool writable_dir(const fs::path& dir) {
-  std::error_code ec;
-  fs::create_directories(dir, ec);
-  const fs::path probe = dir / ".sarfocus_write_probe";
-  {
-    std::ofstream f(probe);
-    if (!f) return false;
+// Why a directory that exists cannot take new files; empty when it can. A directory without
+// any write permission counts as read-only even for root, who could write into it anyway.
+std::string unwritable_reason(const fs::path& dir) {
+  struct stat st {};
+  if (::stat(dir.c_str(), &st) != 0) return std::strerror(errno);
+  if (!S_ISDIR(st.st_mode)) return dir.string() + " is not a directory";
+  if (::access(dir.c_str(), W_OK | X_OK) != 0 || (st.st_mode & (S_IWUSR | S_IWGRP | S_IWOTH)) == 0)
+    return "read-only";
+  const std::string probe = (dir / ".sarfocus_write_probe").string();
+  const int fd = ::open(probe.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+  if (fd < 0) {
+    if (errno == EEXIST) return {};  // another run is probing at this moment
+    return std::strerror(errno);
   }
-  fs::remove(probe, ec);
-  return true;
+  ::close(fd);
+  ::unlink(probe.c_str());
+  return {};
+}
+
+// Make the output folder; the folders it had to create are listed (deepest last) so that a
+// request refused later leaves nothing behind.
+std::string prepare_output(const fs::path& out, std::vector<fs::path>& created) {
+  fs::path existing = out;
+  std::vector<fs::path> missing;
+  std::error_code ec;
+  while (!fs::exists(existing, ec) && existing.has_relative_path()) {
+    missing.push_back(existing);
+    existing = existing.parent_path();
+  }
+  if (std::string why = unwritable_reason(existing); !why.empty())
+    return "output directory " + out.string() + " is not writable: " + why;
+  for (auto it = missing.rbegin(); it != missing.rend(); ++it) {
+    if (!fs::create_directory(*it, ec) && ec)
+      return "output directory " + out.string() + " is not writable: " + ec.message();
+    created.push_back(*it);
+  }
+  return {};
+}
+
+void remove_if_empty(const fs::path& dir) {
+  std::error_code ec;
+  if (fs::is_directory(dir, ec) && fs::is_empty(dir, ec)) fs::remove(dir, ec);
+}
+
+// Undo what a refused or unbuilt run put into the output folder.
+void clean_up(const fs::path& work, const fs::path& out, const std::vector<fs::path>& created) {
+  std::error_code ec;
+  fs::remove_all(work, ec);
+  remove_if_empty(out / ".sarfocus");
+  for (auto it = created.rbegin(); it != created.rend(); ++it) remove_if_empty(*it);
+}
+
+// The job arguments of a mode (see the job list's table of arguments).
+std::vector<std::string> job_arguments(const ModeRow& mode, const std::string& product, const std::string& orbit,
+                                       const std::string& root, const StandaloneRequest& req) {
+  std::vector<std::string> a(14, "NotOK");
+  const std::string w = std::to_string(req.quickLookWidth), h = std::to_string(req.quickLookHeight);
+  const std::string m = mode.setup;
+  if (m == "RS") {
+    a[0] = product;
+    a[2] = root;
+    a[3] = w;
+    a[4] = h;
+  } else if (m == "WSS") {
+    a[0] = product;
+    a[1] = root;
+    a[2] = orbit;
+  } else {
+    a[0] = product;
+    a[1] = orbit;
+    a[4] = root;
+    a[5] = w;
+    a[6] = h;
+    if (m == "WS") a[8] = a[9] = "0";
+  }
+  a[12] = req.quickLook ? "OK" : "NotOK";
+  a[13] = "1.0";
+  return a;
+}
+
+// The error record as one line: primary text, secondary text with the code, then the details
+// (a detail longer than a record line continues on the next one).
+std::string record_text(const std::vector<std::string>& record) {
+  if (record.size() < 3) return "no error record";
+  const std::string second = trim(record[2]);
+  std::string text = trim(record[1]) + (!second.empty() && second.front() == '[' ? " " : ": ") + second;
+  bool continues = false;
+  for (std::size_t i = 3; i < record.size(); ++i) {
+    const std::string t = trim(record[i]);
+    if (t.empty()) break;
+    text += (continues ? "" : " ") + t;
+    continues = record[i].size() == kRecordDetailWidth;
+  }
+  return text;
+}
+
+// The stage that the log reports as not built, or empty.
+std::string unbuilt_stage(const std::string& log) {
+  const auto at = log.find(kStageNotBuilt);
+  if (at == std::string::npos || at < 2) return {};
+  std::size_t end = at;
+  while (end > 0 && (log[end - 1] == ' ' || log[end - 1] == ':')) --end;
+  std::size_t begin = end;
+  while (begin > 0 && log[begin - 1] != ' ' && log[begin - 1] != '\n') --begin;
+  return log.substr(begin, end - begin);
+}
+
+std::string now_text() {
+  const std::time_t t = std::time(nullptr);
+  std::tm tm{};
+  ::localtime_r(&t, &tm);
+  char buf[32];
+  std::strftime(buf, sizeof buf, "%Y-%m-%d %H:%M:%S", &tm);
+  return buf;
+}
+
+// One file moved into the output folder; a rename where it can, else a copy.
+bool move_into(const fs::path& from, const fs::path& to, std::string& error) {
+  std::error_code ec;
+  fs::rename(from, to, ec);
+  if (!ec) return true;
+  fs::copy_file(from, to, fs::copy_options::overwrite_existing, ec);
+  if (!ec) fs::remove(from, ec);
+  if (ec) error = "cannot move " + from.string() + " into " + to.parent_path().string() + ": " + ec.message();
+  return !ec;
+}
+
+std::string quick_look_text(const StandaloneRequest& req) {
+  return req.quickLook ? std::to_string(req.quickLookWidth) + "x" + std::to_string(req.quickLookHeight) : "no";
+}
+
+std::mutex& preparation_lock() {
+  static std::mutex m;
+  return m;
+}
+
+struct Prepared {
+  const ModeRow* mode = nullptr;
+  fs::path out, work;
+  std::string stem, command;
+  std::vector<fs::path> created;
+};
+
+// Everything before the job runs: inputs checked, the output folder made, the working
+// directory laid out. An outcome is returned when nothing is to be run.
+std::optional<StandaloneOutcome> prepare(const StandaloneRequest& req, Prepared& p) {
+  p.mode = find_mode(req.mode);
+  if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (im, ap, ws, rs or wss)");
+  std::error_code ec;
+  if (req.product.empty() || !(p.mode->setup == std::string("RS") ? fs::exists(req.product, ec)
+                                                                    : fs::is_regular_file(req.product, ec)))
+    return bad_request("product not found: " + req.product);
+  const std::string product = fs::absolute(req.product).string();
+
+  std::string orbit = "NotOK";
+  if (!req.orbit.empty() && p.mode->orbit) {
+    if (fs::is_directory(req.orbit, ec)) {
+      std::string why;
+      const auto chosen = find_orbit_for(product, req.orbit, why);
+      if (!chosen) return bad_request(why);
+      orbit = fs::absolute(chosen->path).string();
+    } else if (fs::is_regular_file(req.orbit, ec)) {
+      orbit = fs::absolute(req.orbit).string();
+    } else {
+      return bad_request("orbit not found: " + req.orbit);
+    }
+  }
+  if (!req.auxDir.empty() && !fs::is_directory(req.auxDir, ec))
+    return bad_request("auxiliary folder not found: " + req.auxDir);
+
+  std::vector<std::string> overrides;
+  if (!req.paramsFile.empty()) {
+    std::ifstream in(req.paramsFile);
+    if (!in) return bad_request("parameter file not found: " + req.paramsFile);
+    std::string section;
+    for (std::string l; std::getline(in, l);) {
+      const std::string t = trim(l);
+      if (!t.empty() && t.front() == '[') section = trim(t.substr(1, t.find(']') - 1));
+      else if (t.find('=') != std::string::npos && !section.empty()) overrides.push_back(section + "." + t);
+    }
+  }
+  overrides.insert(overrides.end(), req.params.begin(), req.params.end());
+
+  p.out = fs::absolute(req.outDir).lexically_normal();
+  if (p.out.has_relative_path() && !p.out.has_filename()) p.out = p.out.parent_path();
+  p.stem = product_stem(product);
+  p.work = working_dir_for(p.out.string(), product);
+  if (std::string why = prepare_output(p.out, p.created); !why.empty()) {
+    clean_up(p.work, p.out, p.created);
+    return bad_request(why);
+  }
+  if (req.skipComplete && outputs_complete(req)) {
+    StandaloneOutcome o;
+    o.result = StandaloneResult::kSkipped;
+    o.workDir = p.work.string();
+    o.slc = (p.out / (p.stem + "_slc")).string();
+    for (const auto& line : read_lines(p.work / kCompletionMarker))
+      if (line.rfind("output = ", 0) == 0) {
+        const std::string rest = line.substr(9);
+        o.products.push_back((p.out / rest.substr(0, rest.rfind(' '))).string());
+      }
+    o.summary = "sarfocus: skipped, the outputs of an earlier run are complete: " + o.slc;
+    return o;
+  }
+
+  SetupRequest setup;
+  setup.dir = p.work.string();
+  setup.mode = p.mode->setup;
+  setup.tracing = req.tracing;
+  if (!req.auxDir.empty()) setup.auxDirs.push_back(fs::absolute(req.auxDir).string());
+  setup.arguments = job_arguments(*p.mode, product, orbit, (p.work / p.stem).string(), req);
+  try {
+    fs::remove_all(p.work);  // an earlier run's files, its completion marker first of all
+    const std::string list = setup_working_dir(setup);
+    p.command = command_for(p.mode->setup, list);
+  } catch (const std::exception& e) {
+    clean_up(p.work, p.out, p.created);
+    return bad_request(std::string("cannot lay out the working directory: ") + e.what());
+  }
+  const std::string parameterFile = setup.mode == "WSS" ? "parameters_multilook.hdr"
+                                                        : "parameters_" + std::string(p.mode->setup) + ".hdr";
+  if (std::string why = apply_parameter_overrides((p.work / "des" / parameterFile).string(), overrides);
+      !why.empty()) {
+    clean_up(p.work, p.out, p.created);
+    return bad_request(why);
+  }
+  return std::nullopt;
+}
+
+// Products into the output folder, work files away, then the marker: a run that stops in
+// between leaves no marker, so the product counts as not done.
+std::string finish_success(const StandaloneRequest& req, const Prepared& p, StandaloneOutcome& o) {
+  std::vector<fs::path> made;
+  std::error_code ec;
+  for (const auto& e : fs::directory_iterator(p.work, ec)) {
+    const std::string name = e.path().filename().string();
+    if (e.is_regular_file() && name.rfind(p.stem + "_", 0) == 0) made.push_back(e.path());
+  }
+  std::sort(made.begin(), made.end());
+  std::string error;
+  std::ostringstream marker;
+  marker << "sarfocus completion marker, written after the products were moved into the output folder\n"
+         << "mode = " << p.mode->name << "\nproduct = " << fs::absolute(req.product).string()
+         << "\nquicklook = " << quick_look_text(req) << "\nfinished = " << now_text() << "\n";
+  for (const auto& from : made) {
+    const fs::path to = p.out / from.filename();
+    if (!move_into(from, to, error)) return error;
+    o.products.push_back(to.string());
+    marker << "output = " << to.filename().string() << " " << fs::file_size(to, ec) << "\n";
+    if (to.filename().string() == p.stem + "_slc") o.slc = to.string();
+  }
+  // The job's rasters of intermediate steps are of no use once the products stand.
+  for (const auto& e : fs::directory_iterator(p.work, ec)) {
+    const std::string name = e.path().filename().string();
+    const bool keep = e.is_directory() || name.rfind("Vanterra", 0) == 0 || name == "job.txt" ||
+                      name == "focussing.out" || name == "DCEST_resume.txt";
+    if (!keep) fs::remove(e.path(), ec);
+  }
+  const fs::path tmp = p.work / (std::string(kCompletionMarker) + ".tmp");
+  {
+    std::ofstream out(tmp, std::ios::trunc);
+    out << marker.str();
+    if (!out.flush()) return "cannot write the completion marker in " + p.work.string();
+  }
+  fs::rename(tmp, p.work / kCompletionMarker, ec);
+  if (ec) return "cannot write the completion marker in " + p.work.string() + ": " + ec.message();
+  return {};
 }
 
 }  // namespace
+
+std::string product_stem(const std::string& product) {
+  fs::path p(product);
+  if (!p.has_filename()) p = p.parent_path();
+  return p.stem().string();
+}
+
+std::string working_dir_for(const std::string& outDir, const std::string& product) {
+  return (fs::absolute(outDir).lexically_normal() / ".sarfocus" / product_stem(product)).string();
+}
+
+std::string output_dir_problem(const std::string& outDir) {
+  fs::path existing = fs::absolute(outDir).lexically_normal();
+  std::error_code ec;
+  while (!fs::exists(existing, ec) && existing.has_relative_path()) existing = existing.parent_path();
+  if (std::string why = unwritable_reason(existing); !why.empty())
+    return "output directory " + fs::absolute(outDir).string() + " is not writable: " + why;
+  return {};
+}
+
+bool known_mode(std::string_view mode) { return find_mode(mode) != nullptr; }
+
+bool outputs_complete(const StandaloneRequest& req) {
+  const fs::path out = fs::absolute(req.outDir).lexically_normal();
+  const fs::path work = working_dir_for(out.string(), req.product);
+  const std::string stem = product_stem(req.product);
+  std::vector<std::string> required = {stem + "_slc", stem + "_slc_hdr"};
+  if (req.quickLook) required.push_back(stem + "_slc.tif");
+  bool modeOk = false, productOk = false;
+  std::size_t found = 0;
+  for (const auto& line : read_lines(work / kCompletionMarker)) {
+    const auto eq = line.find(" = ");
+    if (eq == std::string::npos) continue;
+    const std::string key = line.substr(0, eq), value = line.substr(eq + 3);
+    if (key == "mode") modeOk = value == req.mode;
+    if (key == "product") productOk = fs::path(value).filename() == fs::path(req.product).filename();
+    const auto blank = value.rfind(' ');
+    if (key != "output" || blank == std::string::npos) continue;
+    const std::string name = value.substr(0, blank);
+    if (std::find(required.begin(), required.end(), name) == required.end()) continue;
+    std::error_code ec;
+    const auto size = fs::file_size(out / name, ec);
+    if (ec || std::to_string(size) != value.substr(blank + 1)) return false;
+    ++found;
+  }
+  return modeOk && productOk && found == required.size();
+}
 
 std::string apply_parameter_overrides(const std::string& parameterFile, const std::vector<std::string>& overrides) {
   std::vector<std::string> lines = read_lines(parameterFile);
@@ -166,118 +519,232 @@ std::string apply_parameter_overrides(const std::string& parameterFile, const st
 }
 
 StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string& focussingExe, std::FILE* progress) {
-  const ModeRow* mode = find_mode(req.mode);
-  if (!mode) return fail("unknown mode '" + req.mode + "' (im, ap, ws, rs or wss)");
-  if (!fs::is_regular_file(req.product)) return fail("product not found: " + req.product);
-  if (!mode->built)
-    return fail("mode '" + req.mode + "' is not available in this build yet (only im runs end to end)", 3);
-
-  std::string orbit = "NotOK";
-  if (!req.orbit.empty()) {
-    if (fs::is_directory(req.orbit)) {
-      const auto start = product_sensing_start(req.product);
-      if (!start) return fail("cannot read the sensing start of " + req.product);
-      const auto chosen = choose_orbit(scan_orbit_products(req.orbit), *start);
-      if (!chosen) {
-        std::string when;
-        base::sec852myascii(*start, when);
-        return fail("no orbit file in " + req.orbit + " covers the product's sensing start " + when);
-      }
-      orbit = chosen->path;
-    } else if (fs::is_regular_file(req.orbit)) {
-      orbit = req.orbit;
-    } else {
-      return fail("orbit not found: " + req.orbit);
-    }
+  Prepared p;
+  {
+    // Layout and discovery touch shared folders (the output folder, the shipped data); one
+    // product at a time prepares, the jobs themselves then run side by side.
+    std::lock_guard<std::mutex> lock(preparation_lock());
+    if (auto early = prepare(req, p)) return *early;
   }
-  if (!req.auxDir.empty() && !fs::is_directory(req.auxDir)) return fail("auxiliary folder not found: " + req.auxDir);
-
-  const fs::path out = fs::absolute(req.outDir);
-  if (!writable_dir(out)) return fail("output directory " + out.string() + " is not writable");
-  const std::string stem = fs::path(req.product).stem().string();
-  const fs::path work = out / ".sarfocus" / stem;
-  const std::string root = (out / stem).string();
-
-  SetupRequest setup;
-  setup.dir = work.string();
-  setup.mode = mode->setup;
-  setup.tracing = req.tracing;
-  if (!req.auxDir.empty()) setup.auxDirs.push_back(req.auxDir);
-  setup.arguments = {fs::absolute(req.product).string(), orbit, "NotOK", "NotOK", root,
-                     std::to_string(req.quickLookWidth), std::to_string(req.quickLookHeight), "NotOK", "0", "0",
-                     "NotOK", "NotOK", "OK", "1.0"};
-  std::string list;
-  try {
-    fs::remove_all(work);
-    list = setup_working_dir(setup);
-  } catch (const std::exception& e) {
-    return fail(std::string("cannot lay out the working directory: ") + e.what());
-  }
-  const std::string paramFile = (work / "des" / ("parameters_" + std::string(mode->setup) + ".hdr")).string();
-  std::vector<std::string> overrides;
-  if (!req.paramsFile.empty()) {
-    std::string section;
-    std::ifstream in(req.paramsFile);
-    if (!in) return fail("parameter file not found: " + req.paramsFile);
-    for (std::string l; std::getline(in, l);) {
-      const std::string t = trim(l);
-      if (!t.empty() && t.front() == '[') section = trim(t.substr(1, t.find(']') - 1));
-      else if (t.find('=') != std::string::npos && !section.empty()) overrides.push_back(section + "." + t);
-    }
-  }
-  overrides.insert(overrides.end(), req.params.begin(), req.params.end());
-  if (const std::string err = apply_parameter_overrides(paramFile, overrides); !err.empty()) return fail(err);
 
   ProgressView view(progress);
-  const int status =
-      run_child(focussingExe, command_for(mode->setup, list), work, req.threads, work / "Vanterra.working", view);
-
+  const auto started = std::chrono::steady_clock::now();
+  const int status = run_child(focussingExe, p.command, p.work, req.threads, view);
   StandaloneOutcome o;
-  o.workDir = work.string();
+  o.seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - started).count();
+  o.workDir = p.work.string();
   o.status = status;
-  for (const char* suffix : {"_slc", "_slc_hdr", "_slc.sml", "_slc.hdr", "_slc.vrt", "_slc.tif", "_slc.kml",
-                             "_slc.xml"})
-    if (fs::exists(root + suffix)) o.products.push_back(root + suffix);
 
-  const auto record = read_lines(work / "Vanterra.working_error");
-  const std::string log = (work / "Vanterra.log").string();
-  if (status == 127) {
-    o.summary = "sarfocus: cannot run " + focussingExe;
-  } else if (status != 0 || (!record.empty() && record[0] == "-1")) {
-    std::string text = "no error record";
-    if (record.size() > 2) {
-      const std::string second = trim(record[2]);
-      text = record[1] + (second.front() == '[' ? " " : ": ") + second;
-    }
-    for (std::size_t i = 3; i < record.size() && !trim(record[i]).empty(); ++i) text += " " + trim(record[i]);
-    o.summary = "sarfocus: FAILED: " + text + "; log: " + log;
-    if (o.status == 0) o.status = 1;
-  } else {
-    std::string list2;
-    for (const auto& p : o.products) list2 += (list2.empty() ? "" : ", ") + p;
-    o.summary = "sarfocus: done" + std::string(record.empty() ? "" : " with warnings") + ": " +
-                (list2.empty() ? std::string("no products") : list2);
+  const auto record = read_lines(p.work / "Vanterra.working_error");
+  const std::string log = (p.work / base::kLogFile).string();
+  if (status == 127 || status < 0) {
+    o.result = StandaloneResult::kFailed;
+    o.error = "cannot run " + focussingExe;
+    o.summary = "sarfocus: " + o.error;
+    if (o.status <= 0) o.status = 1;
+    return o;
   }
+  if (status != 0 || (!record.empty() && record[0] == "-1")) {
+    o.error = record_text(record);
+    if (o.status == 0) o.status = 1;
+    if (const std::string stage = unbuilt_stage(read_text(log)); !stage.empty()) {
+      o.result = StandaloneResult::kNotBuilt;
+      o.status = kExitNotBuilt;
+      o.error = "mode '" + req.mode + "' is not available in this build yet: the job stopped at " + stage + " (" +
+                std::string(kStageNotBuilt) + ")";
+      o.summary = "sarfocus: " + o.error;
+      std::lock_guard<std::mutex> lock(preparation_lock());
+      clean_up(p.work, p.out, p.created);
+      o.workDir.clear();
+      return o;
+    }
+    o.result = StandaloneResult::kFailed;
+    o.summary = "sarfocus: FAILED: " + o.error + "; log: " + log;
+    return o;
+  }
+  if (std::string why = finish_success(req, p, o); !why.empty()) {
+    o.result = StandaloneResult::kFailed;
+    o.status = 1;
+    o.error = why;
+    o.summary = "sarfocus: FAILED: " + why;
+    return o;
+  }
+  std::string list;
+  for (const auto& f : o.products) list += (list.empty() ? "" : ", ") + f;
+  o.summary = "sarfocus: done" + std::string(record.empty() ? "" : " with warnings") + ": " +
+              (list.empty() ? std::string("no products") : list);
   return o;
+}
+
+// ------------------------------------------------------------------------- command line
+
+std::string parse_standalone_options(const std::vector<std::string>& args, std::size_t first,
+                                     StandaloneRequest& req, bool& help) {
+  help = false;
+  auto whole_int = [](const std::string& text, int lo, const std::string& what, int& out) -> std::string {
+    std::size_t used = 0;
+    long v = 0;
+    try {
+      v = std::stol(text, &used);
+    } catch (const std::exception&) {
+      used = 0;
+    }
+    if (used == 0 || used != text.size() || v < lo || v > 1000000) return what + " takes a whole number, not '" + text + "'";
+    out = static_cast<int>(v);
+    return {};
+  };
+  for (std::size_t i = first; i < args.size(); ++i) {
+    std::string a = args[i];
+    std::optional<std::string> inlineValue;
+    if (a.rfind("--", 0) == 0)
+      if (const auto eq = a.find('='); eq != std::string::npos) {
+        inlineValue = a.substr(eq + 1);
+        a = a.substr(0, eq);
+      }
+    std::string missing;
+    auto value = [&]() -> std::string {
+      if (inlineValue) return *inlineValue;
+      if (i + 1 >= args.size()) {
+        missing = a + " needs a value";
+        return {};
+      }
+      return args[++i];
+    };
+    std::string error;
+    if (a == "--orbit") req.orbit = value();
+    else if (a == "--aux") req.auxDir = value();
+    else if (a == "--out") req.outDir = value();
+    else if (a == "--threads") {
+      const std::string v = value();
+      if (missing.empty()) error = whole_int(v, 1, "--threads", req.threads);
+    } else if (a == "--param") {
+      const std::string v = value();
+      if (missing.empty() && v.find('=') == std::string::npos) error = "--param takes KEY=VALUE, not '" + v + "'";
+      req.params.push_back(v);
+    } else if (a == "--params") req.paramsFile = value();
+    else if (a == "--trace") req.tracing = true;
+    else if (a == "--skip-complete") req.skipComplete = true;
+    else if (a == "--no-quicklook") req.quickLook = false;
+    else if (a == "--quicklook") {
+      const std::string v = value();
+      const auto x = v.find('x');
+      if (missing.empty()) {
+        if (x == std::string::npos) error = "--quicklook takes WxH, not '" + v + "'";
+        else if (error = whole_int(v.substr(0, x), 1, "--quicklook", req.quickLookWidth); error.empty())
+          error = whole_int(v.substr(x + 1), 1, "--quicklook", req.quickLookHeight);
+        req.quickLook = true;
+      }
+    } else if (a == "--help" || a == "-h") {
+      help = true;
+    } else if (!a.empty() && a[0] == '-' && a != "-") {
+      error = "unknown option " + a;
+    } else if (req.product.empty()) {
+      req.product = a;
+    } else {
+      error = "one product only (" + req.product + " and " + a + "); sarfocus batch takes many";
+    }
+    if (!missing.empty()) return missing;
+    if (!error.empty()) return error;
+  }
+  return {};
+}
+
+std::vector<std::string> standalone_options(const StandaloneRequest& req) {
+  std::vector<std::string> a;
+  auto add = [&](const char* option, const std::string& value) {
+    a.emplace_back(option);
+    a.push_back(value);
+  };
+  if (!req.orbit.empty()) add("--orbit", req.orbit);
+  if (!req.auxDir.empty()) add("--aux", req.auxDir);
+  add("--out", req.outDir);
+  if (req.quickLook) add("--quicklook", quick_look_text(req));
+  else a.emplace_back("--no-quicklook");
+  if (req.threads > 0) add("--threads", std::to_string(req.threads));
+  for (const auto& p : req.params) add("--param", p);
+  if (!req.paramsFile.empty()) add("--params", req.paramsFile);
+  if (req.tracing) a.emplace_back("--trace");
+  if (req.skipComplete) a.emplace_back("--skip-complete");
+  return a;
 }
 
 namespace {
 
-const char* kUsage =
-    "usage: sarfocus MODE PRODUCT [options]\n"
-    "  MODE       im (image mode); ap, ws, rs, wss are not available yet\n"
-    "  PRODUCT    level 0 product (ENVISAT .N1)\n"
+const char* kOverview =
+    "usage: sarfocus MODE PRODUCT [options]   focus one product\n"
+    "       sarfocus batch LIST|DIR [options] focus many products, or emit a Slurm or GNU parallel job\n"
+    "       sarfocus help [MODE|batch]        help on a command (also: sarfocus MODE --help)\n"
+    "       sarfocus --version                the engine's version text\n"
+    "\n"
+    "MODE is the acquisition mode of the product:\n"
+    "  im    ENVISAT ASAR image mode level 0 (ASA_IM__0P)\n"
+    "  ap    ENVISAT ASAR alternating polarisation level 0 (ASA_AP__0P)\n"
+    "  ws    ENVISAT ASAR wide swath level 0 (ASA_WS__0P)\n"
+    "  rs    RADARSAT-1 CEOS raw product\n"
+    "  wss   ENVISAT ASAR wide swath single-look level 1 (ASA_WSS_1P), multilooked\n"
+    "\n"
+    "sarfocus lays out the host's files for each product in OUT/.sarfocus/<product>/, runs the\n"
+    "engine's host entry `focussing` there, and moves the products into OUT once the job has\n"
+    "succeeded. A mode whose processing chain this build does not hold yet says so.\n"
+    "\n"
+    "Exit status: 0 done (or skipped as complete), 2 bad command line or inputs, 3 mode not built\n"
+    "yet, otherwise the failed job's own status. Run `sarfocus im --help` for the options.\n";
+
+const char* kModeOptions =
     "options:\n"
-    "  --orbit FILE|DIR     orbit file, or a folder to choose the covering one from\n"
-    "                       (DOR_VOR before DOR_POR, AUX_FPO, AUX_FRO)\n"
-    "  --aux DIR            folder of ASA_INS/ASA_XCA/ASA_XCH products (default: the shipped index)\n"
-    "  --out DIR            output folder (default: .); work files go to DIR/.sarfocus/<product>\n"
-    "  --quicklook WxH      quick-look size (default 1024x1024)\n"
-    "  --threads N          worker threads (default: all cores)\n"
+    "  --orbit FILE|DIR     orbit file, or a folder to choose the covering one from (by header:\n"
+    "                       DOR_VOR before DOR_POR, AUX_FPO, AUX_FRO, then the newest issue)\n"
+    "  --aux DIR            folder of ASA_INS/ASA_XCA/ASA_XCH products, chosen by validity\n"
+    "                       (default: the shipped index data/ASA_AUX_list.dat)\n"
+    "  --out DIR            output folder (default: .); work files go to DIR/.sarfocus/<product>/\n"
+    "  --quicklook WxH      quick-look GeoTIFF size (default 1024x1024)\n"
+    "  --no-quicklook       no quick-look\n"
+    "  --threads N          worker threads of the job (default: all cores)\n"
     "  --param KEY=VALUE    override a processing parameter (Section.Key=VALUE when ambiguous)\n"
     "  --params FILE        override parameters from a file of [Section] and Key = Value lines\n"
     "  --trace              keep a trace of the run in the work folder\n"
-    "  --help, --version\n";
+    "  --skip-complete      do nothing when an earlier run's outputs are complete\n"
+    "  --help               this text\n"
+    "\n"
+    "Outputs: OUT/<product>_slc (the SLC), <product>_slc_hdr (its annotation), .sml, .hdr, .vrt,\n"
+    "and <product>_slc.tif (the quick-look). Work files, the log (Vanterra.log) and the error\n"
+    "record (Vanterra.working_error) stay in OUT/.sarfocus/<product>/; after a successful run the\n"
+    "marker sarfocus.complete there lists the outputs. The last line says what was written, or\n"
+    "the error with its code and the log's path.\n";
+
+const char* kBatchHelp =
+    "usage: sarfocus batch LIST|DIR [--mode MODE] [--jobs N] [--force] [MODE options]\n"
+    "       sarfocus batch LIST|DIR --emit slurm [--slurm-option TEXT]... [--job-name NAME] [options]\n"
+    "       sarfocus batch LIST|DIR --emit parallel [--sshlogin LOGIN]... [options]\n"
+    "\n"
+    "Focus many products, each in its own working directory OUT/.sarfocus/<product>/, as\n"
+    "`sarfocus MODE PRODUCT` would. LIST is a text file of product paths, one a line (blank lines\n"
+    "and lines starting with # are skipped; relative paths are taken from the list's folder);\n"
+    "DIR gives its *.N1 files. A failed product never stops the others.\n"
+    "\n"
+    "  --mode MODE          im (default), ap, ws, rs or wss\n"
+    "  --jobs N             products run at a time (default 1); with --emit slurm the array's\n"
+    "                       throttle, with --emit parallel the jobs a host\n"
+    "  --force              run products again whose outputs are complete\n"
+    "  --emit slurm         print a Slurm array job script instead of running: one array task a\n"
+    "                       product, each running `sarfocus MODE PRODUCT ... --skip-complete`;\n"
+    "                       submit it with sbatch; task logs go to OUT/.sarfocus/slurm-*.out\n"
+    "  --slurm-option TEXT  an #SBATCH line of the script, e.g. --slurm-option --partition=short\n"
+    "  --job-name NAME      the Slurm job name (default sarfocus)\n"
+    "  --emit parallel      print a GNU parallel command line instead of running\n"
+    "  --sshlogin LOGIN     spread the parallel jobs over hosts (GNU parallel's --sshlogin, e.g.\n"
+    "                       4/node1,4/node2,: where : is this machine); the paths must be the same\n"
+    "                       on every host\n"
+    "  MODE options         --orbit, --aux, --out, --quicklook, --no-quicklook, --threads, --param,\n"
+    "                       --params, --trace (see sarfocus im --help); --threads defaults to the\n"
+    "                       cores divided by --jobs\n"
+    "\n"
+    "A local run ends with a table of product, status, time and output (the SLC, or the error\n"
+    "text). A product counts as complete, and is skipped on the next run, when its marker\n"
+    "OUT/.sarfocus/<product>/sarfocus.complete stands (written last by a successful run) and the\n"
+    "SLC, its _slc_hdr annotation and, when asked for, the quick-look are there with the sizes it\n"
+    "records. Exit status: 0 when every product is done or skipped, 1 when any failed, 2 for a\n"
+    "bad command line or inputs.\n";
 
 std::string self_dir() {
   std::error_code ec;
@@ -287,54 +754,63 @@ std::string self_dir() {
 
 }  // namespace
 
-int sarfocus_main(int argc, char** argv) {
-  if (argc < 2 || std::strcmp(argv[1], "--help") == 0 || std::strcmp(argv[1], "-h") == 0) {
-    std::fputs(kUsage, argc < 2 ? stderr : stdout);
-    return argc < 2 ? 2 : 0;
+std::string sarfocus_help(std::string_view topic) {
+  if (topic.empty()) return kOverview;
+  if (topic == "batch") return kBatchHelp;
+  const ModeRow* m = find_mode(topic);
+  if (!m) return {};
+  return "usage: sarfocus " + std::string(m->name) + " PRODUCT [options]\n  PRODUCT    " + m->title + "\n" +
+         (m->orbit ? "" : "  (this mode takes no orbit file: --orbit is ignored)\n") + kModeOptions;
+}
+
+int sarfocus_run(const std::vector<std::string>& args, const SarfocusTools& tools, std::FILE* out, std::FILE* err) {
+  if (args.empty()) {
+    std::fputs(kOverview, err);
+    return kExitBadRequest;
   }
-  if (std::strcmp(argv[1], "--version") == 0) {
-    std::printf("sarfocus, engine %s\n", std::string(base::kVersionText).c_str());
+  const std::string& first = args[0];
+  if (first == "--help" || first == "-h" || first == "help") {
+    const std::string topic = first == "help" && args.size() > 1 ? args[1] : "";
+    const std::string text = sarfocus_help(topic);
+    if (text.empty()) {
+      std::fprintf(err, "sarfocus: no help on '%s' (modes im, ap, ws, rs, wss; batch)\n", topic.c_str());
+      return kExitBadRequest;
+    }
+    std::fputs(text.c_str(), out);
     return 0;
   }
-  StandaloneRequest req;
-  req.mode = argv[1];
-  try {
-    int i = 2;
-    if (i < argc && argv[i][0] != '-') req.product = argv[i++];
-    for (; i < argc; ++i) {
-      const std::string a = argv[i];
-      auto value = [&]() -> std::string {
-        if (i + 1 >= argc) throw std::invalid_argument(a + " needs a value");
-        return argv[++i];
-      };
-      if (a == "--orbit") req.orbit = value();
-      else if (a == "--aux") req.auxDir = value();
-      else if (a == "--out") req.outDir = value();
-      else if (a == "--threads") req.threads = std::stoi(value());
-      else if (a == "--param") req.params.push_back(value());
-      else if (a == "--params") req.paramsFile = value();
-      else if (a == "--trace") req.tracing = true;
-      else if (a == "--quicklook") {
-        const std::string v = value();
-        const auto x = v.find('x');
-        if (x == std::string::npos) throw std::invalid_argument("--quicklook takes WxH");
-        req.quickLookWidth = std::stoi(v.substr(0, x));
-        req.quickLookHeight = std::stoi(v.substr(x + 1));
-      } else if (a == "--help") {
-        std::fputs(kUsage, stdout);
-        return 0;
-      } else {
-        throw std::invalid_argument("unknown option " + a);
-      }
-    }
-    if (req.product.empty()) throw std::invalid_argument("no product given");
-  } catch (const std::exception& e) {
-    std::fprintf(stderr, "sarfocus: %s\n%s", e.what(), kUsage);
-    return 2;
+  if (first == "--version") {
+    std::fprintf(out, "%s\n", std::string(base::kVersionText).c_str());
+    return 0;
   }
-  const StandaloneOutcome o = run_standalone(req, self_dir() + "/focussing", stderr);
-  std::fprintf(o.status == 0 ? stdout : stderr, "%s\n", o.summary.c_str());
+  if (first == "batch") return batch_main(args, 1, tools, out, err);
+  if (!known_mode(first)) {
+    std::fprintf(err, "sarfocus: unknown mode '%s' (im, ap, ws, rs, wss or batch); see sarfocus --help\n",
+                 first.c_str());
+    return kExitBadRequest;
+  }
+  StandaloneRequest req;
+  req.mode = first;
+  bool help = false;
+  std::string error = parse_standalone_options(args, 1, req, help);
+  if (help) {
+    std::fputs(sarfocus_help(first).c_str(), out);
+    return 0;
+  }
+  if (error.empty() && req.product.empty()) error = "no product given";
+  if (!error.empty()) {
+    std::fprintf(err, "sarfocus: %s; see sarfocus %s --help\n", error.c_str(), first.c_str());
+    return kExitBadRequest;
+  }
+  const StandaloneOutcome o = run_standalone(req, tools.focussing, err);
+  std::fprintf(o.status == 0 ? out : err, "%s\n", o.summary.c_str());
   return o.status;
+}
+
+int sarfocus_main(int argc, char** argv) {
+  const std::vector<std::string> args(argv + 1, argv + argc);
+  const std::string dir = self_dir();
+  return sarfocus_run(args, {dir + "/focussing", dir + "/sarfocus"}, stdout, stderr);
 }
 
 }  // namespace sar::jobs
