@@ -12,9 +12,9 @@ demo="$here/out/demo"
 rm -rf "$demo"
 mkdir -p "$demo/input"
 echo "== simulating an IM scene (5000 lines x 5616 samples, clutter and four point targets)"
-"$build/tools/sarsim" --out "$demo/input" --lines 5000 --samples 5616 --clutter-db 0 --clutter-contrast low \
-  --target 45.000,10.000,0,6 --target 45.010,10.030,0,6 --target 44.992,9.985,100,5 \
-  --target 45.004,10.060,0,6 >/dev/null
+"$build/tools/sarsim" --out "$demo/input" --lines 5000 --samples 5616 --noise 0 --clutter-db 25 --clutter-contrast low --yaw-steering on \
+  --target 45.000,10.000,0,40 --target 45.010,10.030,0,40 --target 44.992,9.985,100,35 \
+  --target 45.004,10.060,0,40 >/dev/null
 product=$(ls "$demo"/input/ASA_IM__0*.N1)
 orbit=$(ls "$demo"/input/DOR_VOR_AX*)
 ins=$(ls "$demo"/input/ASA_INS_AX*)
