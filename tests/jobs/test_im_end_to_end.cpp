@@ -12,6 +12,8 @@
 
 #include "analyser/irf.hpp"
 #include "base/profile.hpp"
+#include "geometry/geolocation.hpp"
+#include "geometry/orbit_file.hpp"
 #include "job_harness.hpp"
 #include "simulator/simulator.hpp"
 
@@ -101,6 +103,18 @@ void focus_scene(const Scene& sc) {
   ASSERT_TRUE(fs::exists(slc + "_hdr"));
   EXPECT_TRUE(fs::exists(slc + ".tif"));
   EXPECT_FALSE(fs::exists(slc + ".part"));
+  // GDAL opens the quick-look, which fits the 512 x 512 the list asked for and is tied to WGS84.
+  const fs::path info = job.dir() / "gdalinfo.txt";
+  if (std::system(("gdalinfo '" + slc + ".tif' >'" + info.string() + "' 2>&1").c_str()) == 0) {
+    const std::string text = slurp(info);
+    std::smatch size;
+    ASSERT_TRUE(std::regex_search(text, size, std::regex("Size is ([0-9]+), ([0-9]+)"))) << text;
+    EXPECT_EQ(std::max(std::stoi(size[1]), std::stoi(size[2])), 512) << text;
+    EXPECT_NE(text.find("WGS 84"), std::string::npos) << text;
+    EXPECT_NE(text.find("GCP[  3]"), std::string::npos) << text;
+  } else {
+    ADD_FAILURE() << "gdalinfo cannot open the quick-look: " << slurp(info);
+  }
 
   // The SLC grid from the job's own log line (sizes and first times).
   const std::string log = job.log();
@@ -119,6 +133,7 @@ void focus_scene(const Scene& sc) {
   const double theoryRg = 0.886 * fs_ / t.chirp_bandwidth;
   sar::analyser::ComplexImageView view{image, lines, samples, samples, 0, 0};
   sar::analyser::AnalyserOptions opt;
+  const sar::geometry::OrbitData orbit = sar::geometry::read_orbit(t.orbit_path);
   int measured = 0;
   for (const auto& target : t.targets) {
     const double line = (target.zero_doppler_time - firstLine) * t.prf;
@@ -138,6 +153,20 @@ void focus_scene(const Scene& sc) {
     EXPECT_NEAR(irf.res_az_px, theoryAz, 0.1 * theoryAz);
     EXPECT_LT(irf.pslr_rg_db, -11.8);
     EXPECT_LT(irf.pslr_az_db, -11.8);
+    // Geolocation: the measured pixel, through the SLC's first times and the orbit, lands on the
+    // target within 2 m (a pixel is about 20 m across track on the ground, 4 m along; an orbit
+    // epoch off by 1 ms would move it 7 m).
+    sar::geometry::grpt_rec rec;
+    rec.azimuth_time = firstLine + irf.peak_line / t.prf;
+    rec.tau = firstSample + irf.peak_sample / fs_;
+    rec.wavelength = t.wavelength;
+    rec.height = target.target.position.height;
+    ASSERT_EQ(sar::geometry::geolocate(orbit, rec), 0);
+    const double north = (rec.latitude - target.target.position.lat_deg) * kPi / 180.0 * 6371000.0;
+    const double east = (rec.longitude - target.target.position.lon_deg) * kPi / 180.0 * 6371000.0 *
+                        std::cos(target.target.position.lat_deg * kPi / 180.0);
+    std::printf("%s: geolocation error north %.2f m east %.2f m\n", sc.name, north, east);
+    EXPECT_LT(std::hypot(north, east), 2.0) << "north " << north << " m, east " << east << " m";
     ++measured;
   }
   EXPECT_GE(measured, 2);
