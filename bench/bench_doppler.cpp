@@ -22,22 +22,22 @@ constexpr int kLines = 8192;
 constexpr int kSamples = 5120;
 
 struct Scene {
-  testing::SceneSpec spec;
+  testing::SceneSpec shape;
   std::vector<fcomplex> data;
   Scene() {
-    spec.lines = kTileLines;
-    spec.samples = kSamples;
-    spec.centroid = 1.6 * spec.prf;
-    spec.centroidSlope = -0.02;
-    spec.highContrast = true;
-    spec.brightFraction = 0.3;
-    spec.brightSpacing = 1024;
-    spec.brightPower = 1000.0;
-    const auto tile = testing::make_scene(spec);
+    shape.lines = kTileLines;
+    shape.samples = kSamples;
+    shape.centroid = 1.6 * shape.prf;
+    shape.centroidSlope = -0.02;
+    shape.highContrast = true;
+    shape.brightFraction = 0.3;
+    shape.brightSpacing = 1024;
+    shape.brightPower = 1000.0;
+    const auto tile = testing::make_scene(shape);
     testing::clear_reflectivity_cache();
     data.reserve(static_cast<std::size_t>(kLines) * kSamples);
     for (int k = 0; k < kLines / kTileLines; ++k) data.insert(data.end(), tile.begin(), tile.end());
-    spec.lines = kLines;
+    shape.lines = kLines;
   }
 };
 
@@ -53,7 +53,7 @@ dcestconf config(int ambFlag) {
   c.Nbestblocks = 20;
   c.Nummlbf = 8;
   c.coreMatrix = scene().data;
-  c.geometricCentroid = scene().spec.centroid;
+  c.geometricCentroid = scene().shape.centroid;
   return c;
 }
 
@@ -63,14 +63,14 @@ void BM_EstimateDoppler(benchmark::State& state) {
   {
     // Transform plans are made once per shape and process: not part of the estimation.
     dcestconf c = config(static_cast<int>(state.range(0)));
-    dcimage image = testing::image_of(scene().spec);
+    dcimage image = testing::image_of(scene().shape);
     DopplerPoly poly{};
     getnadcpoly(image, c, poly);
   }
   for (auto _ : state) {
     dcestconf c = config(static_cast<int>(state.range(0)));
     c.outputDir = dir.string();
-    dcimage image = testing::image_of(scene().spec);
+    dcimage image = testing::image_of(scene().shape);
     DopplerPoly poly{};
     if (getnadcpoly(image, c, poly) != 0) state.SkipWithError("estimation failed");
     benchmark::DoNotOptimize(poly);
@@ -83,7 +83,7 @@ BENCHMARK(BM_EstimateDoppler)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond)->Us
 void BM_BlockStatistics(benchmark::State& state) {
   for (auto _ : state) {
     dcestconf c = config(1);
-    dcimage image = testing::image_of(scene().spec);
+    dcimage image = testing::image_of(scene().shape);
     c.r0 = bspline3(0.0);
     c.r1 = bspline3(2.0 * image.platformSpeed / (c.AnLen * image.prf));
     if (setprocbuf(c, image) != 0 || getnadcbins(c, image) != 0) state.SkipWithError("block statistics failed");

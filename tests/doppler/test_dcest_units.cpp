@@ -162,20 +162,20 @@ TEST(DopplerBlockStats, ResultsDoNotDependOnTheThreadCount) {
 #ifndef _OPENMP
   GTEST_SKIP() << "built without OpenMP";
 #else
-  testing::SceneSpec spec;
-  spec.lines = 2048;
-  spec.samples = 1024;
-  spec.centroid = 300.0;
-  spec.highContrast = true;
-  spec.brightSpacing = 1024;
-  const auto scene = testing::make_scene(spec);
+  testing::SceneSpec shape;
+  shape.lines = 2048;
+  shape.samples = 1024;
+  shape.centroid = 300.0;
+  shape.highContrast = true;
+  shape.brightSpacing = 1024;
+  const auto scene = testing::make_scene(shape);
   auto run = [&](int threads) {
     omp_set_num_threads(threads);
     dcestconf c = testing::estimator_config();
     c.coreMatrix = scene;
     c.r0 = bspline3(0.0);
     c.r1 = bspline3(0.86);
-    dcimage im = testing::image_of(spec);
+    dcimage im = testing::image_of(shape);
     EXPECT_EQ(setprocbuf(c, im), 0);
     EXPECT_EQ(getnadcbins(c, im), 0);
     return c;
@@ -303,17 +303,17 @@ TEST(DopplerWdar, BinsAreSymmetricAboutZeroFrequency) {
 // (A (1 + f_r fs / f0)) cycles per line: the signature of an absolute centroid of A PRF.
 std::vector<fcomplex> wdar_block(const dcestconf& c, double A) {
   const int ns = c.Blocks, nl = c.Blockl;
-  dsp::cvector spec(static_cast<std::size_t>(ns * nl));
+  dsp::cvector shape(static_cast<std::size_t>(ns * nl));
   testing::Random rnd(3);
   for (int i = 0; i < ns; ++i) {
     const double fr = (i <= ns / 2 ? i : i - ns) / static_cast<double>(ns);
     const double cyc = A * (1.0 + fr * c.fs / c.carrier);
     const double ph0 = kTwoPi * rnd.uniform();
     for (int l = 0; l < nl; ++l)
-      spec[static_cast<std::size_t>(l * ns + i)] = std::polar(1.0f, static_cast<float>(ph0 + kTwoPi * cyc * l));
+      shape[static_cast<std::size_t>(l * ns + i)] = std::polar(1.0f, static_cast<float>(ph0 + kTwoPi * cyc * l));
   }
-  dsp::fft_c(ns, ns, nl, nl, -1, 0, spec);
-  return {spec.begin(), spec.end()};
+  dsp::fft_c(ns, ns, nl, nl, -1, 0, shape);
+  return {shape.begin(), shape.end()};
 }
 
 TEST(DopplerWdar, SignedSlopeGivesTheAbsoluteCentroid) {

@@ -37,9 +37,9 @@ struct Outcome {
   double slope = 0.0;   // Hz/s at the scene centre
 };
 
-Outcome estimate(const SceneSpec& spec, std::span<const fcomplex> scene, dcestconf conf, const TempDir& dir) {
+Outcome estimate(const SceneSpec& shape, std::span<const fcomplex> scene, dcestconf conf, const TempDir& dir) {
   Outcome o;
-  o.image = testing::image_of(spec);
+  o.image = testing::image_of(shape);
   conf.coreMatrix = scene;
   conf.outputDir = dir.path.string();
   o.status = getnadcpoly(o.image, conf, o.poly);
@@ -58,33 +58,33 @@ TEST(DopplerScenes, CentroidSlopeAndAmbiguityOverTheTable) {
   const double kPrfs[] = {-2.3, -0.4, 0.1, 0.45, 0.9, 1.6, 2.7};
   for (const bool high : {false, true}) {
     for (const double prfs : kPrfs) {
-      SceneSpec spec;
-      spec.seed = high ? 11 : 5;
-      spec.highContrast = high;
-      spec.brightSpacing = 1024;
-      spec.brightPower = 1000.0;
+      SceneSpec shape;
+      shape.seed = high ? 11 : 5;
+      shape.highContrast = high;
+      shape.brightSpacing = 1024;
+      shape.brightPower = 1000.0;
       // WDAR reads a slope of a few 1e-3 cycles over the range band: its block estimates
       // scatter by about a PRF, and blocks closer than an azimuth exposure share scatterers,
       // so the homogeneous scenes are larger.
-      spec.lines = high ? 2048 : 4096;
-      spec.samples = high ? 1024 : 4096;
-      spec.centroid = prfs * spec.prf;
-      spec.centroidSlope = -0.05;  // Hz per range sample
-      const auto scene = testing::make_scene(spec);
+      shape.lines = high ? 2048 : 4096;
+      shape.samples = high ? 1024 : 4096;
+      shape.centroid = prfs * shape.prf;
+      shape.centroidSlope = -0.05;  // Hz per range sample
+      const auto scene = testing::make_scene(shape);
       dcestconf conf = testing::estimator_config();
-      conf.geometricCentroid = spec.centroid + spec.prf;
-      const Outcome o = estimate(spec, scene, conf, dir);
+      conf.geometricCentroid = shape.centroid + shape.prf;
+      const Outcome o = estimate(shape, scene, conf, dir);
       SCOPED_TRACE(testing::resume_text(dir.resume(), "Ambiguity_decision", "Decided_by") +
                    (high ? " high contrast, " : " low contrast, ") + std::to_string(prfs) + " PRF");
       ASSERT_EQ(o.status, 0);
-      const double truth = spec.centroidAt(spec.samples / 2);
-      const double trueSlope = spec.centroidSlope * conf.fs;
+      const double truth = shape.centroidAt(shape.samples / 2);
+      const double trueSlope = shape.centroidSlope * conf.fs;
       std::printf("TABLE %-4s true %9.2f Hz (%5.2f PRF)  estimated %9.2f Hz  ambiguity %2d  by %s  slope %.4g / %.4g\n",
                   high ? "high" : "low", truth, prfs, o.centre, o.conf.ambiguity,
                   testing::resume_text(dir.resume(), "Ambiguity_decision", "Decided_by").c_str(), o.slope, trueSlope);
       // Fractional centroid and the ambiguity.
-      EXPECT_LT(std::fabs(testing::wrap_half((o.centre - truth) / spec.prf)) * spec.prf, 10.0);
-      EXPECT_LT(std::fabs(o.centre - truth), spec.prf / 2.0);
+      EXPECT_LT(std::fabs(testing::wrap_half((o.centre - truth) / shape.prf)) * shape.prf, 10.0);
+      EXPECT_LT(std::fabs(o.centre - truth), shape.prf / 2.0);
       // Range slope: right sign, within 20 %.
       EXPECT_GT(o.slope / trueSlope, 0.8);
       EXPECT_LT(o.slope / trueSlope, 1.2);
@@ -128,7 +128,7 @@ TEST(DopplerScenes, CentroidSlopeAndAmbiguityOverTheTable) {
 
 // One small scene for the tests of configuration and bad input.
 const SceneSpec& small_spec() {
-  static const SceneSpec spec = [] {
+  static const SceneSpec shape = [] {
     SceneSpec s;
     s.seed = 21;
     s.lines = 2048;
@@ -137,7 +137,7 @@ const SceneSpec& small_spec() {
     s.centroidSlope = -0.05;
     return s;
   }();
-  return spec;
+  return shape;
 }
 const std::vector<fcomplex>& small_scene() {
   static const std::vector<fcomplex> scene = testing::make_scene(small_spec());
@@ -146,35 +146,35 @@ const std::vector<fcomplex>& small_scene() {
 
 TEST(DopplerScenes, AmbiguityFlagSelectsTheAnswer) {
   const TempDir dir("flags");
-  const SceneSpec& spec = small_spec();
-  const double truth = spec.centroidAt(spec.samples / 2);
+  const SceneSpec& shape = small_spec();
+  const double truth = shape.centroidAt(shape.samples / 2);
   dcestconf conf = testing::estimator_config();
-  conf.geometricCentroid = truth + 0.2 * spec.prf;
+  conf.geometricCentroid = truth + 0.2 * shape.prf;
 
   conf.Amb_flag = 0;
-  const Outcome none = estimate(spec, small_scene(), conf, dir);
+  const Outcome none = estimate(shape, small_scene(), conf, dir);
   ASSERT_EQ(none.status, 0);
   EXPECT_EQ(none.conf.ambiguity, 0);
   EXPECT_EQ(none.conf.decision, AmbiguityDecision::None);
   // No ambiguity: the centroid stays on the fractional branch of the plane search.
-  EXPECT_LT(std::fabs(none.centre / spec.prf), 1.0);
-  EXPECT_LT(std::fabs(testing::wrap_half((none.centre - truth) / spec.prf)) * spec.prf, 10.0);
+  EXPECT_LT(std::fabs(none.centre / shape.prf), 1.0);
+  EXPECT_LT(std::fabs(testing::wrap_half((none.centre - truth) / shape.prf)) * shape.prf, 10.0);
   const std::string path = dir.resume();
   EXPECT_EQ(testing::resume_int(path, "Estimated_polynomial", "Estimated_ambiguity"), -99999);
   EXPECT_EQ(testing::resume_text(path, "MLBF_ambiguity_estimation", "MLBF_bins_processed"), "");
   EXPECT_EQ(testing::resume_text(path, "GEOM_ambiguity_estimation", "Geometry_estimated_ambiguity"), "");
   EXPECT_EQ(testing::resume_text(path, "Ambiguity_decision", "Decided_by"), "NONE");
   // The time origins of the polynomial are the image's, not zero.
-  EXPECT_EQ(none.poly[7], testing::image_of(spec).rangeTimeOrigin);
-  EXPECT_EQ(none.poly[8], testing::image_of(spec).azimuthTimeOrigin);
+  EXPECT_EQ(none.poly[7], testing::image_of(shape).rangeTimeOrigin);
+  EXPECT_EQ(none.poly[8], testing::image_of(shape).azimuthTimeOrigin);
   EXPECT_NEAR(testing::resume_double(path, "Estimated_polynomial", "DC_time_origin_s"), none.poly[7], 1e-9);
 
   conf.Amb_flag = 2;
-  const Outcome geo = estimate(spec, small_scene(), conf, dir);
+  const Outcome geo = estimate(shape, small_scene(), conf, dir);
   ASSERT_EQ(geo.status, 0);
   EXPECT_EQ(geo.conf.decision, AmbiguityDecision::Geometry);
   EXPECT_LT(std::fabs(geo.centre - truth), 10.0);
-  EXPECT_EQ(geo.conf.ambiguity, round_half_away((geo.centre - none.centre) / spec.prf));
+  EXPECT_EQ(geo.conf.ambiguity, round_half_away((geo.centre - none.centre) / shape.prf));
   EXPECT_EQ(testing::resume_int(path, "GEOM_ambiguity_estimation", "Geometry_estimated_ambiguity"), geo.conf.ambiguity);
   EXPECT_EQ(testing::resume_int(path, "Estimated_polynomial", "Estimated_ambiguity"), geo.conf.ambiguity);
   // The file is written anew: the estimators' sections of no run are left in it.
@@ -184,33 +184,33 @@ TEST(DopplerScenes, AmbiguityFlagSelectsTheAnswer) {
 
   for (const int bad : {-1, 3, 7}) {
     conf.Amb_flag = bad;
-    EXPECT_EQ(estimate(spec, small_scene(), conf, dir).status, 10) << bad;
+    EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 10) << bad;
   }
   conf.Amb_flag = 1;
   conf.Nbestblocks = 0;
-  EXPECT_EQ(estimate(spec, small_scene(), conf, dir).status, 10);
+  EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 10);
 }
 
 TEST(DopplerScenes, PureNoiseCannotBeDecided) {
   const TempDir dir("noise");
-  SceneSpec spec;
-  spec.noiseOnly = true;
-  spec.lines = 4096;
-  spec.samples = 2048;
-  const auto scene = testing::make_scene(spec);
+  SceneSpec shape;
+  shape.noiseOnly = true;
+  shape.lines = 4096;
+  shape.samples = 2048;
+  const auto scene = testing::make_scene(shape);
   dcestconf conf = testing::estimator_config();
-  conf.geometricCentroid = 2.7 * spec.prf;
+  conf.geometricCentroid = 2.7 * shape.prf;
 
   // White noise has no lag-one correlation: no block passes the acceptance test and there is
   // nothing to fill the grid from.
-  Outcome o = estimate(spec, scene, conf, dir);
+  Outcome o = estimate(shape, scene, conf, dir);
   EXPECT_EQ(o.status, -1);
   for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
 
   // With every block accepted, neither estimator agrees with itself: the orbit geometry is
   // applied, and the result file says so.
   conf.Sthr = 1e12;
-  o = estimate(spec, scene, conf, dir);
+  o = estimate(shape, scene, conf, dir);
   ASSERT_EQ(o.status, 0);
   for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
   EXPECT_EQ(o.conf.decision, AmbiguityDecision::GeometryFallback);
@@ -219,12 +219,12 @@ TEST(DopplerScenes, PureNoiseCannotBeDecided) {
   EXPECT_EQ(testing::resume_text(path, "Ambiguity_decision", "Decided_by"), "GEOMETRY_FALLBACK");
   EXPECT_EQ(testing::resume_int(path, "Ambiguity_decision", "Applied_ambiguity"), o.conf.geometricAmbiguity);
   EXPECT_EQ(testing::resume_int(path, "Estimated_polynomial", "Estimated_ambiguity"), o.conf.geometricAmbiguity);
-  EXPECT_LT(std::fabs(o.centre - conf.geometricCentroid), spec.prf / 2.0);
+  EXPECT_LT(std::fabs(o.centre - conf.geometricCentroid), shape.prf / 2.0);
 }
 
 TEST(DopplerScenes, FileModeReadsTheSameImageInRowChunks) {
   const TempDir dir("file");
-  const SceneSpec& spec = small_spec();
+  const SceneSpec& shape = small_spec();
   const std::string file = (dir.path / "rgfoc.raw").string();
   {
     std::ofstream out(file, std::ios::binary | std::ios::trunc);
@@ -232,14 +232,14 @@ TEST(DopplerScenes, FileModeReadsTheSameImageInRowChunks) {
               static_cast<std::streamsize>(small_scene().size() * sizeof(fcomplex)));
   }
   dcestconf conf = testing::estimator_config();
-  conf.geometricCentroid = spec.centroid;
-  const Outcome core = estimate(spec, small_scene(), conf, dir);
+  conf.geometricCentroid = shape.centroid;
+  const Outcome core = estimate(shape, small_scene(), conf, dir);
   ASSERT_EQ(core.status, 0);
 
   conf.Flag_incore = 0;
-  conf.Memory = conf.Blockl * spec.samples * 8;  // one block row at a time
+  conf.Memory = conf.Blockl * shape.samples * 8;  // one block row at a time
   Outcome fileMode;
-  fileMode.image = testing::image_of(spec);
+  fileMode.image = testing::image_of(shape);
   fileMode.image.path = file;
   conf.outputDir = dir.path.string();
   ASSERT_EQ(getnadcpoly(fileMode.image, conf, fileMode.poly), 0);
@@ -249,7 +249,7 @@ TEST(DopplerScenes, FileModeReadsTheSameImageInRowChunks) {
 
   // A file shorter than its description.
   std::filesystem::resize_file(file, small_scene().size() * sizeof(fcomplex) / 2);
-  fileMode.image = testing::image_of(spec);
+  fileMode.image = testing::image_of(shape);
   fileMode.image.path = file;
   EXPECT_EQ(getnadcpoly(fileMode.image, conf, fileMode.poly), 2);
   fileMode.image.path = (dir.path / "absent.raw").string();
@@ -258,22 +258,22 @@ TEST(DopplerScenes, FileModeReadsTheSameImageInRowChunks) {
 
 TEST(DopplerScenes, FilledLinesOfNaNDoNotSpoilTheCentroid) {
   const TempDir dir("nan");
-  const SceneSpec& spec = small_spec();
+  const SceneSpec& shape = small_spec();
   dcestconf conf = testing::estimator_config();
-  conf.geometricCentroid = spec.centroid;
+  conf.geometricCentroid = shape.centroid;
   conf.Amb_flag = 2;  // the fractional centroid is under test here
-  const Outcome clean = estimate(spec, small_scene(), conf, dir);
+  const Outcome clean = estimate(shape, small_scene(), conf, dir);
   ASSERT_EQ(clean.status, 0);
 
   // Missing lines filled with NaN: scattered lines, and a whole block row.
   std::vector<fcomplex> scene = small_scene();
   const float nan = std::numeric_limits<float>::quiet_NaN();
   auto blank = [&](int line) {
-    for (int s = 0; s < spec.samples; ++s) scene[static_cast<std::size_t>(line) * spec.samples + s] = {nan, nan};
+    for (int s = 0; s < shape.samples; ++s) scene[static_cast<std::size_t>(line) * shape.samples + s] = {nan, nan};
   };
   for (int l = 100; l < 2048; l += 97) blank(l);
   for (int l = 1024; l < 1536; ++l) blank(l);
-  const Outcome o = estimate(spec, scene, conf, dir);
+  const Outcome o = estimate(shape, scene, conf, dir);
   ASSERT_EQ(o.status, 0);
   for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
   EXPECT_LT(std::fabs(o.centre - clean.centre), 10.0);
@@ -287,22 +287,22 @@ TEST(DopplerScenes, FilledLinesOfNaNDoNotSpoilTheCentroid) {
 
 TEST(DopplerScenes, ImagesTooSmallForOneBlockAreRejected) {
   const TempDir dir("small");
-  const SceneSpec& spec = small_spec();
+  const SceneSpec& shape = small_spec();
   dcestconf conf = testing::estimator_config();
   conf.Blocks = 2048;  // wider than the scene
   conf.Patchs = 64;
-  EXPECT_EQ(estimate(spec, small_scene(), conf, dir).status, 10);
+  EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 10);
   conf = testing::estimator_config();
-  SceneSpec shortSpec = spec;
+  SceneSpec shortSpec = shape;
   shortSpec.lines = 300;  // shorter than a block
   EXPECT_EQ(estimate(shortSpec, std::span<const fcomplex>(small_scene()).first(300 * 1024), conf, dir).status, 10);
   conf.Memory = 1000;  // not one block row
-  EXPECT_EQ(estimate(spec, small_scene(), conf, dir).status, 1);
+  EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 1);
   conf = testing::estimator_config();
   conf.Blockl = 500;  // not a multiple of the patch
-  EXPECT_EQ(estimate(spec, small_scene(), conf, dir).status, 10);
+  EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 10);
   conf = testing::estimator_config();
-  EXPECT_EQ(estimate(spec, std::span<const fcomplex>(small_scene()).first(1000), conf, dir).status, 10);
+  EXPECT_EQ(estimate(shape, std::span<const fcomplex>(small_scene()).first(1000), conf, dir).status, 10);
 }
 
 }  // namespace

@@ -55,13 +55,13 @@ inline dcestconf estimator_config() {
   return c;
 }
 
-inline dcimage image_of(const SceneSpec& spec) {
+inline dcimage image_of(const SceneSpec& shape) {
   dcimage image;
-  image.samples = spec.samples;
-  image.lines = spec.lines;
-  image.prf = spec.prf;
-  image.platformSpeed = spec.speed;
-  image.rangeTimeOrigin = 2.0 * spec.range / kLight;
+  image.samples = shape.samples;
+  image.lines = shape.lines;
+  image.prf = shape.prf;
+  image.platformSpeed = shape.speed;
+  image.rangeTimeOrigin = 2.0 * shape.range / kLight;
   image.azimuthTimeOrigin = 1000.0;
   return image;
 }

@@ -91,15 +91,15 @@ Scene make_scene(int lines, int samples, double fd, std::vector<PointTarget> tar
 // the two-way amplitude pattern over one PRF around the centroid.
 double azimuth_resolution_theory() {
   const int n = 4096;
-  std::vector<double> spec(n);
+  std::vector<double> weights(n);
   for (int i = 0; i < n; ++i) {
     const double f = (i - n / 2) * kPrf / n;
     const double g = sinc(kAntenna * f / (2.0 * kV));
-    spec[static_cast<std::size_t>(i)] = g * g;
+    weights[static_cast<std::size_t>(i)] = g * g;
   }
   auto response = [&](double x) {  // x in lines
     double re = 0.0;
-    for (int i = 0; i < n; ++i) re += spec[static_cast<std::size_t>(i)] * std::cos(2 * kPi * (i - n / 2) * x / n);
+    for (int i = 0; i < n; ++i) re += weights[static_cast<std::size_t>(i)] * std::cos(2 * kPi * (i - n / 2) * x / n);
     return re * re;
   };
   const double peak = response(0.0);
