@@ -124,11 +124,32 @@ void scale(std::span<fcomplex> data, double norm) {
   for (auto& x : data) x *= f;
 }
 
+// Back to azimuth time and the weighting's normalisation.
+void finish_block(wkparm& wk, const Weighting& w, const std::vector<std::array<double, 2>>& sums) {
+  dsp::fft_c(wk.samples, wk.samples, wk.lines, wk.lines, 0, -1, wk.data);
+  scale(wk.data, normalisation(w, sums));
+}
+
 // kx axis of the mapped grid: kx[i] = kxc - floor(M/2) dkx + i dkx.
 struct KxAxis {
   double first = 0.0, step = 0.0;
   double at(int i) const { return first + i * step; }
+  // Bins i1..i2 of the axis inside the kx span of one Doppler line, given the squares of its
+  // ends (kr^2 - ky^2 at both ends of the kr band); false when the span is empty.
+  bool span(double lowSquare, double highSquare, int M, int& i1, int& i2) const {
+    if (!(lowSquare > 0.0 && highSquare > 0.0)) return false;
+    i1 = std::max(0, static_cast<int>(std::ceil((std::sqrt(lowSquare) - first) / step)));
+    i2 = std::min(M - 1, static_cast<int>(std::floor((std::sqrt(highSquare) - first) / step)) - 1);
+    return i1 <= i2;
+  }
 };
+
+// Back to range on the mapped grid; the first Nout samples replace the line, the rest is zero.
+void finish_row(const dsp::fft_plan& back, dsp::cvector& out, fcomplex* row, int Nout, int n) {
+  dsp::pfft_c(back, out);
+  std::copy(out.begin(), out.begin() + Nout, row);
+  std::fill(row + Nout, row + n, fcomplex{});
+}
 
 KxAxis kx_axis(double kx0, int M, double spacing) {
   KxAxis a;
@@ -302,12 +323,8 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
       const double e = r - std::trunc(r / dk) * dk;
       const double s = -half * dk - e;
       const double lowArg = (s + kr0) * (s + kr0) - y * y, highArg = (endOffset - e + kr0) * (endOffset - e + kr0) - y * y;
-      int i1 = 1, i2 = 0;
-      if (lowArg > 0.0 && highArg > 0.0) {
-        i1 = std::max(0, static_cast<int>(std::ceil((std::sqrt(lowArg) - kx.first) / kx.step)));
-        i2 = std::min(M - 1, static_cast<int>(std::floor((std::sqrt(highArg) - kx.first) / kx.step)) - 1);
-      }
-      if (i1 > i2) {
+      int i1 = 0, i2 = 0;
+      if (!kx.span(lowArg, highArg, M, i1, i2)) {
         std::fill(row, row + n, fcomplex{});
         continue;
       }
@@ -336,13 +353,10 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
         const dcomplex v = (a + b) * std::polar(1.0, lineTurn);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
       }
-      dsp::pfft_c(back, out);
-      std::copy(out.begin(), out.begin() + Nout, row);
-      std::fill(row + Nout, row + n, fcomplex{});
+      finish_row(back, out, row, Nout, n);
     }
   }
-  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
-  scale(wk.data, normalisation(w, sums));
+  finish_block(wk, w, sums);
   return 0;
 }
 
@@ -389,12 +403,8 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
       fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
       const double y = ky[static_cast<std::size_t>(j)];
       const double lowArg = krs * krs - y * y, highArg = kre * kre - y * y;
-      int i1 = 1, i2 = 0;
-      if (lowArg > 0.0 && highArg > 0.0) {
-        i1 = std::max(0, static_cast<int>(std::ceil((std::sqrt(lowArg) - kx.first) / kx.step)));
-        i2 = std::min(M - 1, static_cast<int>(std::floor((std::sqrt(highArg) - kx.first) / kx.step)) - 1);
-      }
-      if (i1 > i2) {
+      int i1 = 0, i2 = 0;
+      if (!kx.span(lowArg, highArg, M, i1, i2)) {
         std::fill(row, row + n, fcomplex{});
         continue;
       }
@@ -423,13 +433,10 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
         acc *= std::polar(1.0, (kx.at(i) - kx0) * q);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(acc.real()), static_cast<float>(acc.imag()));
       }
-      dsp::pfft_c(back, out);
-      std::copy(out.begin(), out.begin() + Nout, row);
-      std::fill(row + Nout, row + n, fcomplex{});
+      finish_row(back, out, row, Nout, n);
     }
   }
-  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
-  scale(wk.data, normalisation(w, sums));
+  finish_block(wk, w, sums);
   return 0;
 }
 
