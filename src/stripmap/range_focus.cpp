@@ -4,10 +4,7 @@
 #include <cmath>
 #include <cstdio>
 #include <cstring>
-#include <filesystem>
-#include <memory>
 #include <string>
-#include <system_error>
 
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
@@ -34,45 +31,27 @@ std::string format(const char* fmt, double a, double b = 0.0, double c = 0.0) {
   return t;
 }
 
-struct FileCloser {
-  void operator()(std::FILE* f) const {
-    if (f) std::fclose(f);
-  }
-};
-using FilePtr = std::unique_ptr<std::FILE, FileCloser>;
-
 const std::string& raw_path(const sarpar& par) { return par.raw_file.empty() ? par.extrPath : par.raw_file; }
 
-// Sequential reader of the raw line file. Its size is checked against the lines it must hold
-// before anything is read, so a short file is refused at once rather than half processed.
+// Sequential reader of the raw line file: per line a float32 time, then the samples. Its size is
+// checked against the lines it must hold before anything is read, so a short file is refused at
+// once rather than half processed.
 class RawLines {
  public:
-  RawLines(const std::string& path, int32_t lines, int32_t samples) : path_(path), samples_(samples) {
-    std::error_code err;
-    const auto size = std::filesystem::file_size(path, err);
-    if (err) base::fatal(ec::kFileIo, {path, "raw line file cannot be opened"});
-    const int64_t need = static_cast<int64_t>(lines) * line_bytes();
-    if (static_cast<int64_t>(size) < need)
-      base::fatal(ec::kFileIo, {path, "raw line file holds fewer lines than the product",
-                                std::to_string(size) + " of " + std::to_string(need) + " bytes"});
-    file_.reset(std::fopen(path.c_str(), "rb"));
-    if (!file_) base::fatal(ec::kFileIo, {path, "raw line file cannot be opened"});
-  }
-  int64_t line_bytes() const { return 4 + 8 * static_cast<int64_t>(samples_); }
+  RawLines(const std::string& path, int32_t lines, int32_t samples)
+      : samples_(samples), in_(path, static_cast<int64_t>(lines) * (4 + 8 * static_cast<int64_t>(samples)),
+                               "raw line file") {}
   // Reads one line's time and samples; the samples land in `row`.
   float read(fcomplex* row) {
     float time = 0.0f;
-    if (std::fread(&time, 4, 1, file_.get()) != 1 ||
-        std::fread(row, sizeof(fcomplex), static_cast<std::size_t>(samples_), file_.get()) !=
-            static_cast<std::size_t>(samples_))
-      base::fatal(ec::kFileIo, {path_, "read failed in the raw line file"});
+    in_.read(&time, 4);
+    in_.read(row, 8 * static_cast<int64_t>(samples_));
     return time;
   }
 
  private:
-  std::string path_;
   int32_t samples_;
-  FilePtr file_;
+  InputRaster in_;
 };
 
 // Window start offset of a line in samples against the earliest window. A shift outside the
