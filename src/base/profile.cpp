@@ -232,11 +232,16 @@ std::string render(const FileNode& file) {
 int write_file(const FileNode& file) {
   ErrnoGuard guard;
   const std::string text = render(file);
-  std::FILE* fp = std::fopen(file.name.c_str(), "w");
+  // Written beside and renamed over, so that a full disk leaves the old file or none, never a
+  // header cut in the middle that a reader would take for complete.
+  const std::string part = file.name + ".part";
+  std::FILE* fp = std::fopen(part.c_str(), "w");
   if (!fp) return 1;
   const bool written = std::fwrite(text.data(), 1, text.size(), fp) == text.size();
   const bool closed = std::fclose(fp) == 0;
-  return written && closed ? 0 : -1;
+  if (written && closed && std::rename(part.c_str(), file.name.c_str()) == 0) return 0;
+  std::remove(part.c_str());
+  return -1;
 }
 
 // ----------------------------------------------------------------------------- texts

@@ -523,8 +523,12 @@ bool getAndSetPerc(int oldValue, int newValue, const std::string* label) {
   // Without run services there is no host to tell, and no working file to stop the run by:
   // the stages are being used as a library.
   if (!rs().up) return true;
+  // The heartbeat is usually absent already: that is not an error of the stage being reported
+  // on, whose frames test errno.
+  const int callerErrno = errno;
   std::error_code ec;
   fs::remove(heartbeat_file_path(), ec);
+  errno = callerErrno;
   const std::string wf = working_file_path();
   if (!fs::exists(wf)) {
     TracePrintf("getAndSetPerc - Not found the file : %s\n", wf.c_str());
@@ -606,7 +610,9 @@ bool DeleteFileForced(const std::string& path) {
 void DeleteProductFile(const std::string& path, bool withCompanions) {
   DeleteFileForced(path);
   if (!withCompanions) return;
-  for (const char* ext : {"_hdr", ".hdr", ".sml", ".shx", ".shp", ".shp_hdr", ".shp.hdr", ".dbf", ".xml"})
+  // The footprint step also writes a KML and the shapefile's projection: they go with the rest.
+  for (const char* ext :
+       {"_hdr", ".hdr", ".sml", ".shx", ".shp", ".shp_hdr", ".shp.hdr", ".dbf", ".xml", ".kml", ".prj"})
     DeleteFileForced(path + ext);
 }
 

@@ -1,5 +1,6 @@
 // focussing: the host's entry. One command string (further arguments are joined to it with a
 // blank), one job, the outcome in the working directory's files and the exit status.
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <string>
@@ -23,6 +24,9 @@ int main(int argc, char** argv) {
     std::printf("%s\n", "focussing (VanterraFocRadarsatASARPalsar ENVI 3.0.000.003)");
     return 0;
   }
+  // A file size limit must show up as a failed write that the job reports, not as a signal that
+  // ends the process before it can say why.
+  std::signal(SIGXFSZ, SIG_IGN);
   std::string command = argv[1];
   for (int i = 2; i < argc; ++i) {
     command += ' ';

@@ -1,25 +1,25 @@
 #include "jobs/im_job.hpp"
 
-#include <complex>
-#include <cstdio>
-#include <span>
-
-#include "hostlib/quicklook.hpp"
-#include "jobs/annotation.hpp"
-
 #include <cerrno>
+#include <chrono>
+#include <complex>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
+#include <span>
 
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
 #include "envisat/product_types.hpp"
+#include "hostlib/footprint.hpp"
+#include "hostlib/quicklook.hpp"
+#include "jobs/annotation.hpp"
 #include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 #include "jobs/job_common.hpp"
+#include "stripmap/raster_files.hpp"
 
 namespace sar::jobs {
 namespace {
@@ -127,6 +127,31 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
   return 0;
 }
 
+namespace {
+// Wall time of one stage into the log, so that an operator sees where a slow run spent it.
+class StageClock {
+ public:
+  explicit StageClock(const char* stage) : stage_(stage), writing_(stripmap::output_write_seconds()) {}
+  StageClock(const StageClock&) = delete;
+  StageClock& operator=(const StageClock&) = delete;
+  ~StageClock() {
+    const double total = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
+    const double writing = stripmap::output_write_seconds() - writing_;
+    if (writing > 0.0) {
+      base::LogPrintf("Stage time %-12s %9.2f s\n", stage_, total - writing);
+      base::LogPrintf("Stage time %-12s %9.2f s\n", "SLC writing", writing);
+    } else {
+      base::LogPrintf("Stage time %-12s %9.2f s\n", stage_, total);
+    }
+  }
+
+ private:
+  const char* stage_;
+  double writing_;
+  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+};
+}  // namespace
+
 int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, extconf& extra, enviauxfiles& files,
                 StageFlags& flags) {
   base::Frame frame("IMprocessor");
@@ -134,21 +159,26 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
   connect_stage_progress();
 
   if (flags[kStageExtract]) {
+    const StageClock clock("extraction");
     if (int st = frame.check(envi_extract(files, par, extra))) return st;
     if (int st = frame.check(envi_orbit(files.orbit, par, proc))) return st;
     if (int st = frame.check(envi_rgpattern(files.xca, files.ins, par, proc))) return st;
     if (int st = frame.check(envi_syntchirp(par, proc))) return st;
   }
-  if (proc.Flag_incore) {
-    if (int st = frame.check(init_buffer(par, proc))) return st;
-    // With the data in memory there are no work files to remove.
-    flags[kStageCleanup] = 0;
-  }
-  if (flags[kStageRangeFocus]) {
-    if (int st = frame.check(rangefoc(par, proc))) return st;
-    if (flags[kStageCleanup]) remove_work_file(par.extrPath);
+  {
+    const StageClock clock("range");
+    if (proc.Flag_incore) {
+      if (int st = frame.check(init_buffer(par, proc))) return st;
+      // With the data in memory there are no work files to remove.
+      flags[kStageCleanup] = 0;
+    }
+    if (flags[kStageRangeFocus]) {
+      if (int st = frame.check(rangefoc(par, proc))) return st;
+      if (flags[kStageCleanup]) remove_work_file(par.extrPath);
+    }
   }
   if (flags[kStageDoppler]) {
+    const StageClock clock("Doppler");
     // The centroid the geometry predicts at the scene centre: mid-scene azimuth time and the
     // mid-swath two-way time, with the yaw-steering law of the platform.
     const double wavelength = kSpeedOfLight / par.carrierFrequency;
@@ -169,6 +199,7 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
     if (int st = frame.check(IMCalibration(par, proc))) return st;
   }
   if (flags[kStageAzimuth]) {
+    const StageClock clock("azimuth");
     if (az.rangeShift == par.samples) az.rangeShift = proc.rangeSamples;
     az.RangeLookBandwidth *= par.samplingRate;
     az.RangeTransitionBandwidth *= par.samplingRate;
@@ -243,6 +274,7 @@ int main_focussing_asar_im(const std::string& listPath) {
   if (args[3] == kNotOK) {
     // Calibration is off in this job, so a missing ASA_XCA does not stop it.
     if (find_aux(args[0], desDir, "ASA_XCA", files.xca) != 0) flags[kStageCalibration] = 0;
+    else base::LogPrintf("ASA_XCA from the auxiliary index: %s\n", files.xca.c_str());
   } else {
     require_existing(args[3]);
     files.xca = args[3];
@@ -252,6 +284,7 @@ int main_focussing_asar_im(const std::string& listPath) {
       note_failed_stage("find_aux");
       base::fatal(base::ec::kStageFailed, {"find_aux()"});
     }
+    base::LogPrintf("ASA_INS from the auxiliary index: %s\n", files.ins.c_str());
   } else {
     require_existing(args[2]);
     files.ins = args[2];
@@ -270,6 +303,13 @@ int main_focussing_asar_im(const std::string& listPath) {
   files.orbit = args[1];
   par.slcPath = slcPath;
   par.outputDir = directory_of(slcPath);
+  {
+    // The output root may name a folder the host has not made yet.
+    const int callerErrno = errno;
+    std::error_code made;
+    std::filesystem::create_directories(par.outputDir, made);
+    errno = callerErrno;
+  }
   par.extrPath = par.outputDir + "/EXTR";
   par.rgfPath = par.extrPath + ".rgf";
   par.reportPath = par.outputDir + "/report.bin";
@@ -278,18 +318,28 @@ int main_focussing_asar_im(const std::string& listPath) {
   if (IMprocessor(par, proc, dc, az, extra, files, flags) != 0)
     base::fatal(base::ec::kStageFailed, {"IMprocessor()", failed_stage()});
 
-  const std::string headerPath = slcPath + "_hdr";
-  if (IMwritepars(headerPath, par, proc, dc, az, extra, files) != 0)
-    base::fatal(base::ec::kStageFailed, {"IMwritepars_kelvor()", failed_stage()});
-  errno = 0;
+  {
+    const StageClock clock("product files");
+    const std::string headerPath = slcPath + "_hdr";
+    if (IMwritepars(headerPath, par, proc, dc, az, extra, files) != 0) {
+      // An SLC without its annotation cannot be used, and beside a half-written description it
+      // would look like a product: take it all away.
+      base::DeleteProductFile(slcPath, true);
+      base::fatal(base::ec::kStageFailed, {"IMwritepars_kelvor()", failed_stage()});
+    }
+    // Where the scene lies, for map tools; a product without it is still a product, so a failure
+    // here is reported and the job goes on.
+    hostlib::write_footprint(slcPath, hostlib::kFootprintAllFiles);
+    errno = 0;
 
-  if (args[12] == "OK") {
-    base::SetActivityLabel("Tiff generation ...");
-    const std::string label = base::activity_label();
-    base::getAndSetPerc(-1, 0, &label);
-    base::getAndSetPerc(-1, 0, nullptr);
-    if (write_quicklook(slcPath, slcPath + ".tif", std::atof(args[13].c_str()), quickLook1, quickLook2, proc) != 0)
-      base::fatal(base::ec::kStageFailed, {"GeoTIFF", failed_stage()});
+    if (args[12] == "OK") {
+      base::SetActivityLabel("Tiff generation ...");
+      const std::string label = base::activity_label();
+      base::getAndSetPerc(-1, 0, &label);
+      base::getAndSetPerc(-1, 0, nullptr);
+      if (write_quicklook(slcPath, slcPath + ".tif", std::atof(args[13].c_str()), quickLook1, quickLook2, proc) != 0)
+        base::fatal(base::ec::kStageFailed, {"GeoTIFF", failed_stage()});
+    }
   }
   return 0;
 }

@@ -1,10 +1,17 @@
 #include "jobs/stages.hpp"
 
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
 #include <vector>
 
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
+#include "base/errors.hpp"
 #include "base/run_services.hpp"
+#include "envisat/aux_products.hpp"
 #include "envisat/extract.hpp"
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
@@ -34,6 +41,27 @@ int stage_not_built(std::string_view name) {
   return kStageRejected;
 }
 
+namespace {
+// A product shorter than its main header says was cut in transfer or on disk. Its whole packets
+// can be read, but an image from them would silently miss the rest of the pass.
+void refuse_truncated_product(const std::string& path) {
+  std::ifstream in(path, std::ios::binary);
+  std::string mph(envisat::kMphTotSizePos + envisat::kMphTotSizeWidth, '\0');
+  if (!in.read(mph.data(), static_cast<std::streamsize>(mph.size()))) return;  // the reader has said why
+  const std::string field = mph.substr(envisat::kMphTotSizePos, envisat::kMphTotSizeWidth);
+  char* end = nullptr;
+  const long long stated = std::strtoll(field.c_str(), &end, 10);
+  if (end == field.c_str()) return;
+  std::error_code err;
+  const auto size = static_cast<long long>(std::filesystem::file_size(path, err));
+  if (err || size >= stated) return;
+  char where[128];
+  std::snprintf(where, sizeof where, "%lld of the %lld bytes its MPH states", size, stated);
+  note_failed_stage("envi_extract");
+  base::fatal(base::ec::kFileIo, {path, "level 0 product truncated", where});
+}
+}  // namespace
+
 int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
   base::Frame frame("envi_extract");
   std::vector<sarpar> channels{par};
@@ -43,6 +71,7 @@ int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
     note_failed_stage("envi_extract");
     return frame.check(st);
   }
+  refuse_truncated_product(files.level0);
   // Stripmap jobs hold one channel; the record keeps the job's paths and takes the rest.
   par = channels.front();
   std::string first;
@@ -93,9 +122,11 @@ int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm
   doppler::DopplerPoly poly{};
   int st = doppler::getnadcpoly(image, conf, poly);
   conf.coreMatrix = {};
-  if (st == -1) {
-    // The data hold too little signal for any block estimate (a dark or point-only scene): the
-    // orbit's prediction is the best centroid there is, and the run says so.
+  const auto goodBlocks = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const auto& b) { return b.good; });
+  if (st == -1 || (st == 10 && !conf.blocks.empty() && goodBlocks <= 7)) {
+    // The data hold too little signal for a block estimate, or for too few blocks to fit a
+    // surface (a dark or point-only scene): the orbit's prediction is the best centroid there
+    // is, and the run says so.
     base::report(base::kReportWarning, "Doppler centroid not measurable from the data: the geometric centroid is used");
     base::LogPrintf("Doppler centroid from the orbit geometry: %.3f Hz\n", conf.geometricCentroid);
     poly = doppler::DopplerPoly{};

@@ -1,5 +1,7 @@
 #include "stripmap/raster_files.hpp"
 
+#include <atomic>
+#include <chrono>
 #include <filesystem>
 #include <system_error>
 
@@ -51,13 +53,30 @@ OutputRaster::~OutputRaster() {
   }
 }
 
+namespace {
+std::atomic<int64_t> writeNanoseconds{0};
+
+// Adds the lifetime of the scope to the write clock.
+struct WriteClock {
+  std::chrono::steady_clock::time_point start = std::chrono::steady_clock::now();
+  ~WriteClock() {
+    writeNanoseconds += std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now() - start)
+                            .count();
+  }
+};
+}  // namespace
+
+double output_write_seconds() { return static_cast<double>(writeNanoseconds.load()) * 1e-9; }
+
 void OutputRaster::write(const std::complex<float>* data, int64_t count) {
+  const WriteClock clock;
   if (count > 0 && std::fwrite(data, sizeof(std::complex<float>), static_cast<std::size_t>(count), file_.get()) !=
                        static_cast<std::size_t>(count))
     base::fatal(ec::kFileIo, {path_, "write failed (disk full?)"});
 }
 
 void OutputRaster::commit() {
+  const WriteClock clock;
   if (std::fclose(file_.release()) != 0) base::fatal(ec::kFileIo, {path_, "close failed (disk full?)"});
   std::error_code err;
   std::filesystem::rename(part_, path_, err);

@@ -44,4 +44,8 @@ class OutputRaster {
   bool committed_ = false;
 };
 
+/// Wall seconds spent in OutputRaster writes and commits since the process started: the job
+/// reports its writing time apart from the focusing that produces the lines.
+double output_write_seconds();
+
 }  // namespace sar::stripmap

@@ -62,8 +62,10 @@ class ScratchJob {
   }
 
   /// Lay out the working directory with real inputs for an IM job.
-  std::string layout(std::vector<std::string> args = {}, const std::string& mode = "IM") {
+  std::string layout(std::vector<std::string> args = {}, const std::string& mode = "IM",
+                     std::vector<std::string> auxDirs = {}) {
     jobs::SetupRequest req;
+    req.auxDirs = std::move(auxDirs);
     req.dir = dir_.string();
     req.mode = mode;
     req.dataDir = SAR_DATA_DIR;
@@ -80,9 +82,11 @@ class ScratchJob {
     return p.string();
   }
 
-  RunResult run(const std::string& command, const std::string& envPrefix = "") const {
+  /// `shellPrefix` runs before the job in the same shell (a resource limit, say).
+  RunResult run(const std::string& command, const std::string& envPrefix = "",
+                const std::string& shellPrefix = "") const {
     const fs::path errFile = dir_ / "stderr.txt";
-    const std::string cmd = "cd '" + dir_.string() + "' && env VANTERRA_INIT_DIR='" + dir_.string() + "' " +
+    const std::string cmd = "cd '" + dir_.string() + "' && " + shellPrefix + " env VANTERRA_INIT_DIR='" + dir_.string() + "' " +
                             envPrefix + " '" + SAR_FOCUSSING_EXE + "' '" + command + "' >/dev/null 2>'" +
                             errFile.string() + "'";
     const int raw = std::system(cmd.c_str());

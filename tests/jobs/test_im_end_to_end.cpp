@@ -116,6 +116,21 @@ void focus_scene(const Scene& sc) {
     ADD_FAILURE() << "gdalinfo cannot open the quick-look: " << slurp(info);
   }
 
+  // The footprint encloses every target the SLC holds (checked below), as GDAL reads it.
+  for (const char* ext : {".kml", ".shp", ".shx", ".dbf", ".prj", ".xml"}) EXPECT_TRUE(fs::exists(slc + ext)) << ext;
+  double extent[4] = {0, 0, 0, 0};  // lon min, lat min, lon max, lat max
+  {
+    const fs::path ogr = job.dir() / "ogrinfo.txt";
+    if (std::system(("ogrinfo -so -al '" + slc + ".shp' >'" + ogr.string() + "' 2>&1").c_str()) == 0) {
+      const std::string text = slurp(ogr);
+      std::smatch e;
+      ASSERT_TRUE(std::regex_search(text, e, std::regex("Extent: \\(([-0-9.]+), ([-0-9.]+)\\) - \\(([-0-9.]+), ([-0-9.]+)\\)")))
+          << text;
+      for (int i = 0; i < 4; ++i) extent[i] = std::stod(e[i + 1]);
+      EXPECT_NE(text.find("Feature Count: 1"), std::string::npos) << text;
+    }
+  }
+
   // The SLC grid from the job's own log line (sizes and first times).
   const std::string log = job.log();
   std::smatch m;
@@ -166,6 +181,12 @@ void focus_scene(const Scene& sc) {
     const double east = (rec.longitude - target.target.position.lon_deg) * kPi / 180.0 * 6371000.0 *
                         std::cos(target.target.position.lat_deg * kPi / 180.0);
     std::printf("%s: geolocation error north %.2f m east %.2f m\n", sc.name, north, east);
+    if (extent[2] > extent[0]) {
+      EXPECT_GT(target.target.position.lon_deg, extent[0]);
+      EXPECT_LT(target.target.position.lon_deg, extent[2]);
+      EXPECT_GT(target.target.position.lat_deg, extent[1]);
+      EXPECT_LT(target.target.position.lat_deg, extent[3]);
+    }
     EXPECT_LT(std::hypot(north, east), 2.0) << "north " << north << " m, east " << east << " m";
     ++measured;
   }

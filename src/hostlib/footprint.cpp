@@ -1,0 +1,685 @@
+#include "hostlib/footprint.hpp"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <bit>
+#include <cctype>
+#include <charconv>
+#include <cmath>
+#include <cstdio>
+#include <ctime>
+#include <exception>
+#include <filesystem>
+#include <memory>
+#include <optional>
+#include <string_view>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "base/diagnostics.hpp"
+#include "io/description.hpp"
+
+namespace sar::hostlib {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+template <class... Args>
+std::string printed(const char* format, Args... args) {
+  char text[256];
+  const int n = std::snprintf(text, sizeof text, format, args...);
+  if (n < 0) return {};
+  if (static_cast<std::size_t>(n) < sizeof text) return std::string(text, static_cast<std::size_t>(n));
+  std::string big(static_cast<std::size_t>(n) + 1, '\0');
+  std::snprintf(big.data(), big.size(), format, args...);
+  big.resize(static_cast<std::size_t>(n));
+  return big;
+}
+
+// ---- reading the description -----------------------------------------------------------------
+
+/// Upper case, blanks trimmed and runs of blanks made one: the table's names are matched
+/// whatever spacing a writer used ("CORNER POINT 1  X" and "CORNER POINT 1 X" are one name).
+std::string normalised_name(std::string_view text) {
+  std::string out;
+  bool blank = false;
+  for (char c : text) {
+    if (std::isspace(static_cast<unsigned char>(c))) {
+      blank = !out.empty();
+      continue;
+    }
+    if (blank) out += ' ';
+    blank = false;
+    out += static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
+  }
+  return out;
+}
+
+std::string_view trimmed(std::string_view text) {
+  while (!text.empty() && std::isspace(static_cast<unsigned char>(text.front()))) text.remove_prefix(1);
+  while (!text.empty() && std::isspace(static_cast<unsigned char>(text.back()))) text.remove_suffix(1);
+  return text;
+}
+
+/// The whole text as one finite number, or nothing.
+std::optional<double> number(std::string_view text) {
+  text = trimmed(text);
+  if (!text.empty() && text.front() == '+') text.remove_prefix(1);
+  if (text.empty()) return std::nullopt;
+  double v = 0.0;
+  const auto [end, ec] = std::from_chars(text.data(), text.data() + text.size(), v);
+  if (ec != std::errc() || end != text.data() + text.size() || !std::isfinite(v)) return std::nullopt;
+  return v;
+}
+
+/// Name-value view of RasterInfo.OtherInfo: first row names, second row values.
+class OtherInfo {
+ public:
+  explicit OtherInfo(const io::CSectionDataGroup& group) {
+    const io::DescriptionField* f = group.field("RasterInfo.OtherInfo");
+    if (!f || !f->set || f->rows < 2 || f->cols < 1) return;
+    const auto cols = static_cast<std::size_t>(f->cols);
+    if (f->values.size() < 2 * cols) return;
+    for (std::size_t c = 0; c < cols; ++c) {
+      std::string name, value;
+      if (group.getString("RasterInfo.OtherInfo", name, c) != 0) continue;
+      if (group.getString("RasterInfo.OtherInfo", value, cols + c) != 0) continue;
+      entries_.emplace_back(normalised_name(name), std::move(value));
+    }
+  }
+  bool present() const { return !entries_.empty(); }
+  std::optional<std::string> find(std::string_view name) const {
+    const std::string key = normalised_name(name);
+    for (const auto& [n, v] : entries_)
+      if (n == key) return v;
+    return std::nullopt;
+  }
+
+ private:
+  std::vector<std::pair<std::string, std::string>> entries_;
+};
+
+bool is_empty_text(std::string_view v) {
+  v = trimmed(v);
+  return v.empty() || v == io::kEmptyFieldText;
+}
+
+/// Reads "<prefix> X" and "<prefix> Y" as longitude and latitude; false with `error` set.
+bool read_position(const OtherInfo& info, const std::string& prefix, FootprintPoint& p, std::string& error) {
+  const auto x = info.find(prefix + " X");
+  const auto y = info.find(prefix + " Y");
+  if (!x || !y || is_empty_text(*x) || is_empty_text(*y)) {
+    error = "the description gives no " + prefix;
+    return false;
+  }
+  const auto lon = number(*x);
+  const auto lat = number(*y);
+  if (!lon || !lat || std::fabs(*lat) > 90.0 || std::fabs(*lon) > 360.0) {
+    error = "the description gives no valid " + prefix + " (\"" + *x + "\", \"" + *y + "\")";
+    return false;
+  }
+  p.latitude = *lat;
+  // -180..180, the form every consumer accepts.
+  p.longitude = std::remainder(*lon, 360.0);
+  return true;
+}
+
+// ---- geometry --------------------------------------------------------------------------------
+
+struct LonLat {
+  double lon = 0.0;
+  double lat = 0.0;
+};
+
+/// Twice the signed area of a closed ring in the lon/lat plane: positive counter-clockwise.
+double twice_signed_area(const std::vector<LonLat>& ring) {
+  double sum = 0.0;
+  for (std::size_t i = 0; i + 1 < ring.size(); ++i) sum += ring[i].lon * ring[i + 1].lat - ring[i + 1].lon * ring[i].lat;
+  return sum;
+}
+
+/// The closed perimeter 1-2-4-3-1 in the wanted turning sense. With `continuous`, longitudes are
+/// carried within half a turn of corner 1 so that a ring across the antimeridian stays one piece.
+std::vector<LonLat> corner_ring(const Footprint& fp, bool clockwise, bool continuous) {
+  constexpr std::size_t kPerimeter[] = {0, 1, 3, 2};
+  const double origin = fp.corners[0].longitude;
+  std::vector<LonLat> ring;
+  for (std::size_t k : kPerimeter) {
+    const FootprintPoint& c = fp.corners[k];
+    const double lon = continuous ? origin + std::remainder(c.longitude - origin, 360.0) : c.longitude;
+    ring.push_back({lon, c.latitude});
+  }
+  ring.push_back(ring.front());
+  // The sense is judged on the continuous ring: the plain one of a scene across the antimeridian
+  // spans most of the globe and would turn the other way.
+  std::vector<LonLat> judged = ring;
+  if (!continuous) {
+    for (auto& p : judged) p.lon = origin + std::remainder(p.lon - origin, 360.0);
+  }
+  const bool isClockwise = twice_signed_area(judged) < 0.0;
+  if (isClockwise != clockwise) std::reverse(ring.begin(), ring.end());
+  return ring;
+}
+
+// ---- text forms ------------------------------------------------------------------------------
+
+/// Text made safe for XML 1.0: markup characters escaped, control characters and bytes that are
+/// not UTF-8 replaced by '?'.
+std::string xml_text(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  std::size_t i = 0;
+  while (i < text.size()) {
+    const auto c = static_cast<unsigned char>(text[i]);
+    if (c < 0x80) {
+      switch (c) {
+        case '&': out += "&amp;"; break;
+        case '<': out += "&lt;"; break;
+        case '>': out += "&gt;"; break;
+        case '"': out += "&quot;"; break;
+        case '\'': out += "&apos;"; break;
+        default: out += (c < 0x20 && c != '\t' && c != '\n' && c != '\r') || c == 0x7f ? '?' : static_cast<char>(c);
+      }
+      ++i;
+      continue;
+    }
+    // Multi-byte sequence: length from the lead byte, then continuation bytes, no overlong form,
+    // no surrogate, nothing past U+10FFFF.
+    std::size_t len = 0;
+    uint32_t cp = 0;
+    if (c >= 0xc2 && c <= 0xdf) {
+      len = 2;
+      cp = c & 0x1fu;
+    } else if (c >= 0xe0 && c <= 0xef) {
+      len = 3;
+      cp = c & 0x0fu;
+    } else if (c >= 0xf0 && c <= 0xf4) {
+      len = 4;
+      cp = c & 0x07u;
+    }
+    bool valid = len != 0 && i + len <= text.size();
+    for (std::size_t k = 1; valid && k < len; ++k) {
+      const auto cc = static_cast<unsigned char>(text[i + k]);
+      valid = (cc & 0xc0u) == 0x80u;
+      cp = (cp << 6) | (cc & 0x3fu);
+    }
+    if (valid) {
+      valid = !(len == 3 && cp < 0x800) && !(len == 4 && (cp < 0x10000 || cp > 0x10ffff)) &&
+              !(cp >= 0xd800 && cp <= 0xdfff) && cp != 0xfffe && cp != 0xffff;
+    }
+    if (valid) {
+      out.append(text.substr(i, len));
+      i += len;
+    } else {
+      out += '?';
+      ++i;
+    }
+  }
+  return out;
+}
+
+/// "dd-MMM-yyyy hh:mm:ss[.fraction]" as an xsd:dateTime in UTC, or empty when the text is not
+/// of that form.
+std::string iso_time(std::string_view text) {
+  text = trimmed(text);
+  static constexpr std::string_view kMonths[] = {"JAN", "FEB", "MAR", "APR", "MAY", "JUN",
+                                                 "JUL", "AUG", "SEP", "OCT", "NOV", "DEC"};
+  if (text.size() < 20 || text[2] != '-' || text[6] != '-' || text[11] != ' ' || text[14] != ':' || text[17] != ':')
+    return {};
+  const auto digits = [&](std::size_t at, std::size_t n, int& value) {
+    value = 0;
+    for (std::size_t k = at; k < at + n; ++k) {
+      if (!std::isdigit(static_cast<unsigned char>(text[k]))) return false;
+      value = value * 10 + (text[k] - '0');
+    }
+    return true;
+  };
+  int day = 0, year = 0, hour = 0, minute = 0, second = 0;
+  if (!digits(0, 2, day) || !digits(7, 4, year) || !digits(12, 2, hour) || !digits(15, 2, minute) ||
+      !digits(18, 2, second))
+    return {};
+  int month = 0;
+  const std::string name = normalised_name(text.substr(3, 3));
+  for (int m = 0; m < 12; ++m)
+    if (name == kMonths[m]) month = m + 1;
+  if (month == 0 || day < 1 || day > 31 || hour > 23 || minute > 59 || second > 60) return {};
+  std::string fraction;
+  if (text.size() > 20) {
+    if (text[20] != '.') return {};
+    const std::string_view f = text.substr(21);
+    if (f.empty() || !std::all_of(f.begin(), f.end(), [](char c) { return std::isdigit(static_cast<unsigned char>(c)); }))
+      return {};
+    fraction = "." + std::string(f);
+  }
+  return printed("%04d-%02d-%02dT%02d:%02d:%02d%sZ", year, month, day, hour, minute, second, fraction.c_str());
+}
+
+std::string degrees(double v) { return printed("%.8f", v); }
+
+std::string kml_document(const Footprint& fp) {
+  const std::vector<LonLat> ring = corner_ring(fp, false, false);
+  std::string coordinates;
+  for (const auto& p : ring) {
+    if (!coordinates.empty()) coordinates += ' ';
+    coordinates += degrees(p.lon) + "," + degrees(p.lat) + ",0";
+  }
+  std::string description = "Product " + fp.productName;
+  if (!fp.sensorName.empty()) description += ", sensor " + fp.sensorName;
+  if (!fp.acquisitionTime.empty()) description += ", acquired " + fp.acquisitionTime;
+  description += printed(", %lld lines x %lld pixels", static_cast<long long>(fp.lines),
+                         static_cast<long long>(fp.pixels));
+  const std::string when = iso_time(fp.acquisitionTime);
+  const std::string name = xml_text(fp.productName);
+
+  std::string k;
+  k += "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n";
+  k += "<kml xmlns=\"http://www.opengis.net/kml/2.2\">\n";
+  k += "  <Document>\n";
+  k += "    <name>" + name + "</name>\n";
+  k += "    <Style id=\"footprint\">\n";
+  k += "      <LineStyle><color>ff0000ff</color><width>2</width></LineStyle>\n";
+  k += "      <PolyStyle><color>400000ff</color></PolyStyle>\n";
+  k += "    </Style>\n";
+  k += "    <Placemark>\n";
+  k += "      <name>" + name + "</name>\n";
+  k += "      <description>" + xml_text(description) + "</description>\n";
+  if (!when.empty()) k += "      <TimeStamp><when>" + when + "</when></TimeStamp>\n";
+  k += "      <styleUrl>#footprint</styleUrl>\n";
+  k += "      <Polygon>\n";
+  k += "        <tessellate>1</tessellate>\n";
+  k += "        <outerBoundaryIs>\n";
+  k += "          <LinearRing>\n";
+  k += "            <coordinates>" + coordinates + "</coordinates>\n";
+  k += "          </LinearRing>\n";
+  k += "        </outerBoundaryIs>\n";
+  k += "      </Polygon>\n";
+  k += "    </Placemark>\n";
+  k += "  </Document>\n";
+  k += "</kml>\n";
+  return k;
+}
+
+std::string gcp_element(int id, const char* name, const char* position, const FootprintPoint& p) {
+  return printed("      <GCP ID=\"%d\" Name=\"%s\" Position=\"%s\" Line=\"%.1f\" Pixel=\"%.1f\" Latitude=\"%s\" "
+                 "Longitude=\"%s\"/>\n",
+                 id, name, position, p.line, p.pixel, degrees(p.latitude).c_str(), degrees(p.longitude).c_str());
+}
+
+std::string xml_document(const Footprint& fp) {
+  std::string x;
+  x += "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n";
+  x += "<SceneFootprint Product=\"" + xml_text(fp.productName) + "\">\n";
+  x += "   <Sensor>" + xml_text(fp.sensorName) + "</Sensor>\n";
+  x += "   <AcquisitionTime>" + xml_text(fp.acquisitionTime) + "</AcquisitionTime>\n";
+  x += printed("   <Lines>%lld</Lines>\n", static_cast<long long>(fp.lines));
+  x += printed("   <Pixels>%lld</Pixels>\n", static_cast<long long>(fp.pixels));
+  x += "   <Datum>WGS84</Datum>\n";
+  x += "   <!-- Line and Pixel count from the leading edge of the first line and sample. -->\n";
+  x += "   <GroundControlPoints NumberOfPoints=\"5\">\n";
+  x += gcp_element(1, "CORNER POINT 1", "NEAR_EARLY", fp.corners[0]);
+  x += gcp_element(2, "CORNER POINT 2", "FAR_EARLY", fp.corners[1]);
+  x += gcp_element(3, "CORNER POINT 3", "NEAR_LATE", fp.corners[2]);
+  x += gcp_element(4, "CORNER POINT 4", "FAR_LATE", fp.corners[3]);
+  x += gcp_element(5, "CENTER SCENE POINT", "CENTRE", fp.centre);
+  x += "   </GroundControlPoints>\n";
+  x += "</SceneFootprint>\n";
+  return x;
+}
+
+/// WGS84 geographic coordinates, in the WKT flavour that the shapefile tools expect.
+constexpr std::string_view kWgs84Prj =
+    "GEOGCS[\"GCS_WGS_1984\",DATUM[\"D_WGS_1984\",SPHEROID[\"WGS_1984\",6378137.0,298.257223563]],"
+    "PRIMEM[\"Greenwich\",0.0],UNIT[\"Degree\",0.0174532925199433]]";
+
+// ---- shapefile -------------------------------------------------------------------------------
+// The main file and the index share a 100-byte header: file code and length (in 16-bit words)
+// big-endian, version, shape type and bounding box little-endian. Record headers are big-endian,
+// record contents little-endian.
+
+class Bytes {
+ public:
+  void be32(int32_t v) {
+    const auto u = static_cast<uint32_t>(v);
+    for (int s = 24; s >= 0; s -= 8) data_ += static_cast<char>((u >> s) & 0xffu);
+  }
+  void le32(int32_t v) {
+    const auto u = static_cast<uint32_t>(v);
+    for (int s = 0; s <= 24; s += 8) data_ += static_cast<char>((u >> s) & 0xffu);
+  }
+  void le16(uint16_t v) {
+    data_ += static_cast<char>(v & 0xffu);
+    data_ += static_cast<char>(v >> 8);
+  }
+  void le_double(double v) {
+    const auto u = std::bit_cast<uint64_t>(v);
+    for (int s = 0; s <= 56; s += 8) data_ += static_cast<char>((u >> s) & 0xffu);
+  }
+  void byte(uint8_t v) { data_ += static_cast<char>(v); }
+  void text(std::string_view t) { data_.append(t); }
+  void zeros(std::size_t n) { data_.append(n, '\0'); }
+  std::size_t size() const { return data_.size(); }
+  std::string take() { return std::move(data_); }
+
+ private:
+  std::string data_;
+};
+
+constexpr int32_t kShapeFileCode = 9994;
+constexpr int32_t kShapeVersion = 1000;
+constexpr int32_t kShapePolygon = 5;
+constexpr int32_t kShapeHeaderBytes = 100;
+
+struct Box {
+  double xmin, ymin, xmax, ymax;
+};
+
+Box bounding_box(const std::vector<LonLat>& ring) {
+  Box b{ring.front().lon, ring.front().lat, ring.front().lon, ring.front().lat};
+  for (const auto& p : ring) {
+    b.xmin = std::min(b.xmin, p.lon);
+    b.xmax = std::max(b.xmax, p.lon);
+    b.ymin = std::min(b.ymin, p.lat);
+    b.ymax = std::max(b.ymax, p.lat);
+  }
+  return b;
+}
+
+void shape_header(Bytes& out, int32_t fileBytes, const Box& box) {
+  out.be32(kShapeFileCode);
+  for (int k = 0; k < 5; ++k) out.be32(0);
+  out.be32(fileBytes / 2);
+  out.le32(kShapeVersion);
+  out.le32(kShapePolygon);
+  out.le_double(box.xmin);
+  out.le_double(box.ymin);
+  out.le_double(box.xmax);
+  out.le_double(box.ymax);
+  for (int k = 0; k < 4; ++k) out.le_double(0.0);  // no Z, no M
+}
+
+struct ShapeFiles {
+  std::string shp;
+  std::string shx;
+};
+
+ShapeFiles shape_files(const Footprint& fp) {
+  const std::vector<LonLat> ring = corner_ring(fp, true, true);
+  const Box box = bounding_box(ring);
+  const auto points = static_cast<int32_t>(ring.size());
+  // Shape type, box, part and point counts, one part index, the points.
+  const int32_t contentBytes = 4 + 32 + 4 + 4 + 4 + 16 * points;
+
+  Bytes shp;
+  shape_header(shp, kShapeHeaderBytes + 8 + contentBytes, box);
+  shp.be32(1);  // record numbers start at 1
+  shp.be32(contentBytes / 2);
+  shp.le32(kShapePolygon);
+  shp.le_double(box.xmin);
+  shp.le_double(box.ymin);
+  shp.le_double(box.xmax);
+  shp.le_double(box.ymax);
+  shp.le32(1);
+  shp.le32(points);
+  shp.le32(0);
+  for (const auto& p : ring) {
+    shp.le_double(p.lon);
+    shp.le_double(p.lat);
+  }
+
+  Bytes shx;
+  shape_header(shx, kShapeHeaderBytes + 8, box);
+  shx.be32(kShapeHeaderBytes / 2);
+  shx.be32(contentBytes / 2);
+  return {shp.take(), shx.take()};
+}
+
+// ---- dBase III table -------------------------------------------------------------------------
+
+struct DbfField {
+  const char* name;  // at most 10 characters
+  char type;         // 'C' text, 'N' number
+  uint8_t length;
+  uint8_t decimals;
+  std::string value;
+};
+
+/// dBase carries no code page here: printable ASCII only.
+std::string dbf_text(std::string_view text, std::size_t length) {
+  std::string out;
+  for (char c : text) {
+    if (out.size() == length) break;
+    const auto u = static_cast<unsigned char>(c);
+    out += u >= 0x20 && u < 0x7f ? c : '?';
+  }
+  out.resize(length, ' ');
+  return out;
+}
+
+std::string dbf_number(const std::string& formatted, std::size_t length) {
+  if (formatted.size() > length) return std::string(length, '*');  // dBase's overflow mark
+  return std::string(length - formatted.size(), ' ') + formatted;
+}
+
+std::string dbf_table(const Footprint& fp) {
+  const std::vector<DbfField> fields{
+      {"NAME", 'C', 80, 0, fp.productName},
+      {"SENSOR", 'C', 32, 0, fp.sensorName},
+      {"ACQ_TIME", 'C', 27, 0, fp.acquisitionTime},
+      {"LINES", 'N', 10, 0, printed("%lld", static_cast<long long>(fp.lines))},
+      {"PIXELS", 'N', 10, 0, printed("%lld", static_cast<long long>(fp.pixels))},
+      {"CENTER_LAT", 'N', 13, 6, printed("%.6f", fp.centre.latitude)},
+      {"CENTER_LON", 'N', 13, 6, printed("%.6f", fp.centre.longitude)},
+  };
+  std::size_t recordBytes = 1;  // the deletion flag
+  for (const auto& f : fields) recordBytes += f.length;
+  const std::size_t headerBytes = 32 + 32 * fields.size() + 1;
+
+  const std::time_t now = std::time(nullptr);
+  std::tm utc{};
+  gmtime_r(&now, &utc);
+
+  Bytes out;
+  out.byte(0x03);  // dBase III without memo
+  out.byte(static_cast<uint8_t>(std::clamp(utc.tm_year, 0, 255)));
+  out.byte(static_cast<uint8_t>(utc.tm_mon + 1));
+  out.byte(static_cast<uint8_t>(utc.tm_mday));
+  out.le32(1);
+  out.le16(static_cast<uint16_t>(headerBytes));
+  out.le16(static_cast<uint16_t>(recordBytes));
+  out.zeros(20);
+  for (const auto& f : fields) {
+    const std::string_view name(f.name);
+    out.text(name);
+    out.zeros(11 - name.size());
+    out.byte(static_cast<uint8_t>(f.type));
+    out.zeros(4);
+    out.byte(f.length);
+    out.byte(f.decimals);
+    out.zeros(14);
+  }
+  out.byte(0x0d);
+  out.byte(' ');
+  for (const auto& f : fields) out.text(f.type == 'C' ? dbf_text(f.value, f.length) : dbf_number(f.value, f.length));
+  out.byte(0x1a);
+  return out.take();
+}
+
+// ---- staging ---------------------------------------------------------------------------------
+
+struct FileCloser {
+  void operator()(std::FILE* f) const { std::fclose(f); }
+};
+
+/// Companions written under temporary names and renamed together: a failure anywhere leaves
+/// neither temporary files nor part of the new set behind.
+class StagedFiles {
+ public:
+  StagedFiles() = default;
+  StagedFiles(const StagedFiles&) = delete;
+  StagedFiles& operator=(const StagedFiles&) = delete;
+  ~StagedFiles() {
+    std::error_code ec;
+    for (const auto& e : entries_) fs::remove(e.temporary, ec);
+  }
+
+  /// 0, or 1 with `error` set.
+  int add(const std::string& target, const std::string& content, std::string& error) {
+    const std::string temporary = target + printed(".tmp%ld", static_cast<long>(::getpid()));
+    std::unique_ptr<std::FILE, FileCloser> f(std::fopen(temporary.c_str(), "wb"));
+    if (!f) {
+      error = "cannot create " + temporary;
+      return 1;
+    }
+    // Only what was created here is removed again.
+    entries_.push_back({temporary, target});
+    const bool written = std::fwrite(content.data(), 1, content.size(), f.get()) == content.size() &&
+                         std::fflush(f.get()) == 0;
+    const bool closed = std::fclose(f.release()) == 0;
+    if (!written || !closed) {
+      error = "cannot write " + temporary;
+      return 1;
+    }
+    return 0;
+  }
+
+  /// Renames every file into place in the order added; on a failure the files already renamed
+  /// are removed again. 0, or 1 with `error` set.
+  int commit(std::string& error) {
+    std::error_code ec;
+    for (std::size_t k = 0; k < entries_.size(); ++k) {
+      fs::rename(entries_[k].temporary, entries_[k].target, ec);
+      if (ec) {
+        error = "cannot rename " + entries_[k].temporary + " to " + entries_[k].target + ": " + ec.message();
+        std::error_code ignored;
+        for (std::size_t j = 0; j < k; ++j) fs::remove(entries_[j].target, ignored);
+        return 1;
+      }
+    }
+    entries_.clear();
+    return 0;
+  }
+
+ private:
+  struct Entry {
+    std::string temporary;
+    std::string target;
+  };
+  std::vector<Entry> entries_;
+};
+
+void warn(const std::string& text) { base::report(base::kReportWarning, text); }
+
+}  // namespace
+
+int read_footprint(const std::string& slcPath, Footprint& footprint, std::string& error) {
+  const std::string base = io::description_base(slcPath);
+  std::error_code ec;
+  std::string description;
+  for (const char* suffix : {".sml", "_hdr"}) {
+    if (fs::is_regular_file(base + suffix, ec)) {
+      description = base + suffix;
+      break;
+    }
+  }
+  // Only the two description forms: the product itself must never be parsed as one.
+  if (description.empty()) {
+    error = "no description " + base + ".sml or " + base + "_hdr";
+    return kFootprintRejected;
+  }
+  io::CSectionDataGroup group{"RasterInfo", "Sensor"};
+  if (!group.ok()) {
+    error = "cannot set up the description reader: " + group.error();
+    return kFootprintRejected;
+  }
+  if (group.read(description, 0) != 0) {
+    error = "cannot read the description " + description;
+    return kFootprintRejected;
+  }
+
+  Footprint fp;
+  fp.productName = fs::path(base).filename().string();
+  if (group.getString("Sensor.SensorName", fp.sensorName) != 0) fp.sensorName.clear();
+  if (group.getInteger("RasterInfo.NrOfLinesPerImage", fp.lines) != 0 ||
+      group.getInteger("RasterInfo.NrOfPixelsPerLine", fp.pixels) != 0 || fp.lines < 1 || fp.pixels < 1 ||
+      fp.lines > INT32_MAX || fp.pixels > INT32_MAX) {
+    error = "the description " + description + " gives no valid image size";
+    return kFootprintRejected;
+  }
+  const OtherInfo info(group);
+  if (!info.present()) {
+    error = "the description " + description + " has no RasterInfo.OtherInfo table";
+    return kFootprintRejected;
+  }
+  for (int k = 0; k < 4; ++k) {
+    if (!read_position(info, printed("CORNER POINT %d", k + 1), fp.corners[static_cast<std::size_t>(k)], error)) {
+      error += " in " + description;
+      return kFootprintRejected;
+    }
+  }
+  if (!read_position(info, "CENTER SCENE POINT", fp.centre, error)) {
+    error += " in " + description;
+    return kFootprintRejected;
+  }
+  if (const auto t = info.find("ACQUISITION_TIME"); t && !is_empty_text(*t)) fp.acquisitionTime = trimmed(*t);
+
+  const auto L = static_cast<double>(fp.lines);
+  const auto P = static_cast<double>(fp.pixels);
+  const double at[4][2] = {{0.0, 0.0}, {0.0, P}, {L, 0.0}, {L, P}};
+  for (std::size_t k = 0; k < 4; ++k) {
+    fp.corners[k].line = at[k][0];
+    fp.corners[k].pixel = at[k][1];
+  }
+  fp.centre.line = 0.5 * L;
+  fp.centre.pixel = 0.5 * P;
+
+  // Corners on one point or one line leave no polygon to draw.
+  const double area = std::fabs(twice_signed_area(corner_ring(fp, true, true)));
+  if (!(area > 1e-12)) {
+    error = "the corners of " + description + " enclose no area";
+    return kFootprintRejected;
+  }
+  footprint = std::move(fp);
+  return 0;
+}
+
+int write_footprint(const std::string& slcPath, int flag) {
+  try {
+    if (flag != kFootprintAllFiles) {
+      warn(printed("Footprint of %s: unknown request %d", slcPath.c_str(), flag));
+      return kFootprintRejected;
+    }
+    Footprint fp;
+    std::string error;
+    if (int st = read_footprint(slcPath, fp, error); st != 0) {
+      warn("Footprint of " + slcPath + " not written: " + error);
+      return st;
+    }
+    ShapeFiles shape = shape_files(fp);
+    const std::string base = io::description_base(slcPath);
+    // The shapefile's main file goes last, so that whoever sees it finds its companions there.
+    const std::pair<const char*, std::string> files[] = {
+        {".xml", xml_document(fp)}, {".kml", kml_document(fp)},   {".prj", std::string(kWgs84Prj)},
+        {".dbf", dbf_table(fp)},    {".shx", std::move(shape.shx)}, {".shp", std::move(shape.shp)},
+    };
+    StagedFiles staged;
+    for (const auto& [suffix, content] : files) {
+      if (staged.add(base + suffix, content, error) != 0) {
+        warn("Footprint of " + slcPath + " not written: " + error);
+        return kFootprintWriteFailed;
+      }
+    }
+    if (staged.commit(error) != 0) {
+      warn("Footprint of " + slcPath + " not written: " + error);
+      return kFootprintWriteFailed;
+    }
+    return 0;
+  } catch (const std::exception& e) {
+    warn("Footprint of " + slcPath + " not written: " + e.what());
+    return kFootprintWriteFailed;
+  }
+}
+
+}  // namespace sar::hostlib
