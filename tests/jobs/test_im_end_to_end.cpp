@@ -4,6 +4,7 @@
 // processed bands predict, and the corners must geolocate the SLC grid.
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cmath>
 #include <cstdio>
 #include <fstream>
@@ -140,8 +141,10 @@ void focus_scene(const Scene& sc) {
   EXPECT_FALSE(fs::exists(slc + ".part"));
   // GDAL opens the quick-look, which fits the 512 x 512 the list asked for and is tied to WGS84.
   const fs::path info = job.dir() / "gdalinfo.txt";
+  std::string quickLook;
   if (std::system(("gdalinfo '" + slc + ".tif' >'" + info.string() + "' 2>&1").c_str()) == 0) {
     const std::string text = slurp(info);
+    quickLook = text;
     std::smatch size;
     ASSERT_TRUE(std::regex_search(text, size, std::regex("Size is ([0-9]+), ([0-9]+)"))) << text;
     EXPECT_EQ(std::max(std::stoi(size[1]), std::stoi(size[2])), 512) << text;
@@ -184,6 +187,39 @@ void focus_scene(const Scene& sc) {
   sar::analyser::ComplexImageView view{image, lines, samples, samples, 0, 0};
   sar::analyser::AnalyserOptions opt;
   const sar::geometry::OrbitData orbit = sar::geometry::read_orbit(t.orbit_path);
+
+  // The quick-look's tie points sit where the SLC's own corners geolocate, within one quick-look
+  // pixel (its size on the ground taken from the tie points themselves).
+  auto ground = [&](double line, double sample) {
+    sar::geometry::grpt_rec rec;
+    rec.azimuth_time = firstLine + line / t.prf;
+    rec.tau = firstSample + sample / fs_;
+    rec.wavelength = t.wavelength;
+    EXPECT_EQ(sar::geometry::geolocate(orbit, rec), 0);
+    return std::array<double, 2>{rec.longitude, rec.latitude};
+  };
+  auto metres = [](std::array<double, 2> a, std::array<double, 2> b) {
+    return std::hypot((a[1] - b[1]) * kPi / 180.0 * 6371000.0,
+                      (a[0] - b[0]) * kPi / 180.0 * 6371000.0 * std::cos(a[1] * kPi / 180.0));
+  };
+  if (!quickLook.empty()) {
+    std::smatch size;
+    ASSERT_TRUE(std::regex_search(quickLook, size, std::regex("Size is ([0-9]+), ([0-9]+)")));
+    const double width = std::stod(size[1]), height = std::stod(size[2]);
+    const std::regex gcp("\\(([-0-9.e]+),([-0-9.e]+)\\) -> \\(([-0-9.e]+),([-0-9.e]+),");
+    std::vector<std::array<double, 4>> points;  // pixel, line, lon, lat
+    for (auto it = std::sregex_iterator(quickLook.begin(), quickLook.end(), gcp); it != std::sregex_iterator(); ++it)
+      points.push_back({std::stod((*it)[1]), std::stod((*it)[2]), std::stod((*it)[3]), std::stod((*it)[4])});
+    ASSERT_EQ(points.size(), 4u) << quickLook;
+    const double across = metres({points[0][2], points[0][3]}, {points[1][2], points[1][3]}) / width;
+    const double along = metres({points[0][2], points[0][3]}, {points[2][2], points[2][3]}) / height;
+    for (const auto& p : points) {
+      const auto truth = ground(p[1] * lines / height, p[0] * samples / width);
+      EXPECT_LT(metres({p[2], p[3]}, truth), std::min(across, along))
+          << "tie point (" << p[0] << ", " << p[1] << "), pixel " << across << " x " << along << " m";
+    }
+  }
+
   int measured = 0;
   for (const auto& target : t.targets) {
     const double line = (target.zero_doppler_time - firstLine) * t.prf;
