@@ -7,7 +7,8 @@
 #   bench/im_job_full.sh [LINES [SAMPLES [THREADS]]]     default 30000 5616 2
 #
 # The simulated product is kept in $SAR_BENCH_DIR (default out/bench_im) and reused by later
-# runs of the same size. The job runs with the shipped parameter file.
+# runs of the same size. The job runs with the shipped parameter file, with Flag_incore set
+# from SAR_BENCH_INCORE (default 1: the range-compressed scene held in memory).
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
@@ -15,6 +16,7 @@ lines="${1:-30000}"
 samples="${2:-5616}"
 threads="${3:-2}"
 work="${SAR_BENCH_DIR:-$here/out/bench_im}"
+incore="${SAR_BENCH_INCORE:-1}"
 
 if [ ! -x /usr/bin/time ]; then
   echo "im_job_full: /usr/bin/time is needed for the peak memory (Debian package 'time')" >&2
@@ -41,6 +43,7 @@ rm -rf "$job"
 exe="$build/src/jobs/focussing"
 "$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
   --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
+sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
 
 echo "== focussing (${threads} threads)"
 set +e
@@ -64,7 +67,7 @@ range_ms=$(echo "$bare" | awk -F, '/BM_RangeLines/ {print $3}')
 azimuth_ms=$(echo "$bare" | awk -F, '/BM_AzimuthColumns/ {print $3}')
 
 echo
-echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads"
+echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
 grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
 awk -v w="$wall" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {

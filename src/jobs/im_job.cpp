@@ -138,10 +138,10 @@ class StageClock {
     const double total = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
     const double writing = stripmap::output_write_seconds() - writing_;
     if (writing > 0.0) {
-      base::LogPrintf("Stage time %-12s %9.2f s\n", stage_, total - writing);
-      base::LogPrintf("Stage time %-12s %9.2f s\n", "SLC writing", writing);
+      base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, total - writing);
+      base::LogPrintf("Stage time %-14s %9.2f s\n", "SLC writing", writing);
     } else {
-      base::LogPrintf("Stage time %-12s %9.2f s\n", stage_, total);
+      base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, total);
     }
   }
 
