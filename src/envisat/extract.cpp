@@ -12,6 +12,7 @@
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "base/run_services.hpp"
+#include "envisat/detail/block_io.hpp"
 
 namespace sar::envisat {
 
@@ -26,8 +27,6 @@ using sar::base::kReportWarning;
 
 constexpr std::int64_t kSyncBlock = 600000;        // bytes scanned for a clean head
 constexpr std::int64_t kResyncStepBack = 66;       // restart two bytes after a bad head
-constexpr std::int64_t kReadBuffer = 0x200000;     // stdio buffer of the product
-constexpr std::int64_t kWriteBuffer = 0x200000;    // stdio buffer of each output
 constexpr int kLookAheadPackets = 10;
 constexpr int kMaxCounterLead = 100;               // a counter further ahead is noise in the stream
 constexpr int kSwstLeapLimit = 100;
@@ -43,90 +42,8 @@ std::string at_text(std::int64_t pos, std::int64_t size) {
 
 double round_half_away(double x) { return x >= 0.0 ? std::floor(x + 0.5) : std::ceil(x - 0.5); }
 
-struct FileCloser {
-  void operator()(std::FILE* f) const {
-    if (f) std::fclose(f);
-  }
-};
-using FilePtr = std::unique_ptr<std::FILE, FileCloser>;
-
-// Sequential reader of the product with bounds checked against the file size: every read that
-// would pass the end is a truncated product.
-class ProductReader {
- public:
-  ProductReader(std::string path, std::int64_t size) : path_(std::move(path)), size_(size) {
-    file_.reset(std::fopen(path_.c_str(), "rb"));
-    if (!file_) fatal(ec::kFileIo, {path_, "level 0 product cannot be opened"});
-    std::setvbuf(file_.get(), nullptr, _IOFBF, static_cast<std::size_t>(kReadBuffer));
-  }
-  std::int64_t pos() const { return pos_; }
-  std::int64_t size() const { return size_; }
-  const std::string& path() const { return path_; }
-
-  void seek(std::int64_t to) {
-    if (to < 0 || to > size_) fatal(ec::kFileIo, {path_, "seek outside the level 0 product", at_text(to, size_)});
-    if (to == pos_) return;
-    if (fseeko(file_.get(), static_cast<off_t>(to), SEEK_SET) != 0)
-      fatal(ec::kFileIo, {path_, "seek failed", at_text(to, size_)});
-    pos_ = to;
-  }
-  /// Reads exactly `out.size()` bytes; a product that ends first is truncated.
-  void read(std::span<std::uint8_t> out, const char* what) {
-    const auto n = static_cast<std::int64_t>(out.size());
-    if (n > size_ - pos_) fatal(ec::kFileIo, {path_, std::string("level 0 product truncated in ") + what, at_text(pos_, size_)});
-    if (std::fread(out.data(), 1, out.size(), file_.get()) != out.size())
-      fatal(ec::kFileIo, {path_, std::string("read failed in ") + what, at_text(pos_, size_)});
-    pos_ += n;
-  }
-  /// Reads up to `out.size()` bytes; returns the count.
-  std::int64_t read_some(std::span<std::uint8_t> out) {
-    const auto want = std::min<std::int64_t>(static_cast<std::int64_t>(out.size()), size_ - pos_);
-    const auto got = static_cast<std::int64_t>(std::fread(out.data(), 1, static_cast<std::size_t>(want), file_.get()));
-    pos_ += got;
-    return got;
-  }
-
- private:
-  std::string path_;
-  std::int64_t size_;
-  std::int64_t pos_ = 0;
-  FilePtr file_;
-};
-
-// An output file that is removed again unless the extraction completes.
-class OutputFile {
- public:
-  OutputFile() = default;
-  explicit OutputFile(std::string path) : path_(std::move(path)) {
-    file_.reset(std::fopen(path_.c_str(), "wb"));
-    if (!file_) fatal(ec::kFileIo, {path_, "output file cannot be created"});
-    std::setvbuf(file_.get(), nullptr, _IOFBF, static_cast<std::size_t>(kWriteBuffer));
-  }
-  OutputFile(OutputFile&&) = default;
-  OutputFile& operator=(OutputFile&&) = default;
-  ~OutputFile() {
-    if (file_ && !committed_) {
-      file_.reset();
-      std::error_code err;
-      std::filesystem::remove(path_, err);
-    }
-  }
-  bool is_open() const { return file_ != nullptr; }
-  void write(const void* data, std::size_t bytes) {
-    if (bytes && std::fwrite(data, 1, bytes, file_.get()) != bytes)
-      fatal(ec::kFileIo, {path_, "write failed"});
-  }
-  void commit() {
-    if (!file_) return;
-    if (std::fclose(file_.release()) != 0) fatal(ec::kFileIo, {path_, "close failed"});
-    committed_ = true;
-  }
-
- private:
-  std::string path_;
-  FilePtr file_;
-  bool committed_ = false;
-};
+using detail::OutputFile;
+using detail::ProductReader;
 
 struct ChannelState {
   std::vector<float> line;   // last decoded echo, 2 x samples floats at least
@@ -148,8 +65,11 @@ class Walker {
  public:
   Walker(const std::string& path, const Level0Header& header, LineTable& table, const FbaqTables& fbaq,
          std::span<const float> gains, std::span<sarpar> channels, extconf& conf)
-      : in_(path, header.fileSize), header_(header), mode_(header.mode), table_(table), fbaq_(fbaq), gains_(gains),
-        par_(channels), conf_(conf), state_(channels.size()) {}
+      : in_(path, header.fileSize), header_(header), mode_(header.mode), table_(table), fbaq_(fbaq), decoder_(fbaq),
+        gains_(gains), pairGains_(2 * gains.size()), par_(channels), conf_(conf), state_(channels.size()) {
+    // Each gain twice, beside the I and the Q it divides, so a line divides as one run of floats.
+    for (std::size_t k = 0; k < gains.size(); ++k) pairGains_[2 * k] = pairGains_[2 * k + 1] = gains[k];
+  }
 
   void run(const WalkRange& range, const ProgressSink& progress);
   void finish();
@@ -194,14 +114,15 @@ class Walker {
   int mode_;
   LineTable& table_;
   const FbaqTables& fbaq_;
+  FbaqEchoDecoder decoder_;
   std::span<const float> gains_;
+  std::vector<float> pairGains_;
   std::span<sarpar> par_;
   extconf& conf_;
   std::vector<ChannelState> state_;
 
   std::array<std::uint8_t, l0::kHeadSize> headBytes_{};
   PacketHead head_;
-  std::vector<std::uint8_t> payload_;
   bool reportHeads_ = true;  // header messages on; off while scanning for synchronisation
   double firstTime_ = 0.0;
   double fillTime_ = 0.0;
@@ -252,11 +173,8 @@ void Walker::read_head() {
   }
 }
 
-std::span<const std::uint8_t> Walker::read_payload() {
-  payload_.resize(static_cast<std::size_t>(head_.payload_bytes()));
-  in_.read(payload_, "a packet payload");
-  return payload_;
-}
+// A view into the reader's block: valid until the product is read again.
+std::span<const std::uint8_t> Walker::read_payload() { return in_.view(head_.payload_bytes(), "a packet payload"); }
 
 void Walker::decode_echo(int channel, std::span<const std::uint8_t> payload) {
   ChannelState& s = state_[static_cast<std::size_t>(channel)];
@@ -267,12 +185,7 @@ void Walker::decode_echo(int channel, std::span<const std::uint8_t> payload) {
   const std::size_t need = 2 * static_cast<std::size_t>(samples) * std::max<std::size_t>(lines, 1);
   if (s.line.size() < need) s.line.resize(need);
   int floats = 0, count = 0;
-  if (fbaq_decode84_f(fbaq_, payload, s.line, samples, 1, floats, count, reportHeads_) != 0) return;
-  for (int k = 0; k < samples; ++k) {
-    const float g = gains_[static_cast<std::size_t>(k)];
-    s.line[static_cast<std::size_t>(2 * k)] /= g;
-    s.line[static_cast<std::size_t>(2 * k + 1)] /= g;
-  }
+  decoder_.decode_divided(payload, s.line, samples, pairGains_, floats, count);
 }
 
 std::int64_t Walker::checkmissing() {
@@ -394,6 +307,8 @@ void Walker::calibration(int channel) {
     return;
   }
   if (is_burst_mode(mode_)) return;  // a calibration pulse in wide swath lies outside the burst's echoes
+  // The stand-in keeps the echo line grid; a noise file holds noise lines only.
+  if (conf_.extract_kind != kExtractEchoes) return;
   write_line(channel, s.line);
   side(channel, s.currentSwst, 1, 0);
   if (is_alternating(mode_)) {

@@ -16,6 +16,7 @@
 #include <cstdint>
 #include <span>
 #include <string>
+#include <vector>
 
 #include "envisat/aux_products.hpp"
 
@@ -56,6 +57,25 @@ std::int64_t noise_line_bytes(std::int64_t samples);
 /// for a sample count below 1.
 bool packet_fits_echo(std::int64_t samples, std::int64_t payloadBytes);
 bool packet_fits_noise(std::int64_t samples, std::int64_t payloadBytes);
+
+/// The reconstruction tables arranged for decoding: per threshold byte, the 16 levels of I and
+/// the 16 of Q in code order, so a block's levels lie in two adjacent cache lines and a sample
+/// costs two look-ups by its nibbles. Built once per run.
+class FbaqEchoDecoder {
+ public:
+  explicit FbaqEchoDecoder(const FbaqTables& tables);
+  /// As `fbaq_decode84_f` with a divisor of 1 and no report; returns false, writing nothing, when
+  /// the payload is no whole number of lines.
+  bool decode(std::span<const std::uint8_t> payload, std::span<float> out, int samples, int& floatCount,
+              int& lineCount) const;
+  /// As `decode`, then float j of every line is divided by divisors[j] (the receive gain, given
+  /// twice per sample, beside its I and its Q). `divisors` must hold 2 x samples floats.
+  bool decode_divided(std::span<const std::uint8_t> payload, std::span<float> out, int samples,
+                      std::span<const float> divisors, int& floatCount, int& lineCount) const;
+
+ private:
+  std::vector<float> levels_;  // 256 thresholds x (16 I, 16 Q)
+};
 
 /// Decodes the echo lines of a payload into float pairs I, Q. `samples` is first divided by
 /// `divisor`, rounding up. `out` must hold 2 x samples x lines floats. Returns 0, or 1 when the

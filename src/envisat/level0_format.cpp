@@ -84,7 +84,15 @@ PacketHead decode_packet_head(HeadBytes h) {
 
 int check_packet_header(HeadBytes head, int mode, std::string* message) {
   const ModeInfo& m = mode_info(mode);
-  const PacketHead p = decode_packet_head(head);
+  // Only the fields scored: the resynchronisation search scores every byte offset of a block.
+  struct {
+    int processId, sequenceCount, fieldHeaderLength, modeId, beamCode;
+  } p{};
+  p.processId = ((head[l0::kProcessId] & 7) << 8) + head[l0::kProcessId + 1];
+  p.sequenceCount = ((head[l0::kSequenceCount] & 63) << 8) + head[l0::kSequenceCount + 1];
+  p.fieldHeaderLength = u16(head, l0::kFieldHeaderLength);
+  p.modeId = head[l0::kModeId];
+  p.beamCode = head[l0::kBeamCode] >> 2;
   int score = 0;
   std::string last;
   const int counterLow = ((head[l0::kModeCounter + 1] & 63) << 8) + head[l0::kModeCounter + 2];

@@ -308,10 +308,69 @@ int init_IM_table(const std::string& level0Path, LineTable& table, std::span<sar
   return 0;
 }
 
+namespace {
+// The builders' common failure: a table the timeline cannot give names the product and both ends.
+[[noreturn]] void bad_timeline(const std::string& level0Path, const std::exception& e, const PacketMark& first,
+                               const PacketMark& last) {
+  char t[96];
+  std::snprintf(t, sizeof t, "first packet counter %d, last %d", first.counter, last.counter);
+  fatal(ec::kFileIo, {level0Path, e.what(), t});
+}
+}  // namespace
+
+int init_AP_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
+                  const std::string& insPath, int mode) {
+  sar::base::Frame frame("init_AP_table");
+  if (!is_alternating(mode)) fatal(ec::kBadArguments, {level0Path, "not an alternating polarisation mode"});
+  const PacketMark first = first_packet(level0Path, mode);
+  if (int st = frame.check(loadparam(level0Path, insPath, mode, channels))) return st;
+  const PacketMark last = last_packet(level0Path, mode);
+  const std::int32_t blockEchoes = channels[0].burst_echoes;
+  channels[1].burst_echoes = blockEchoes;
+  for (std::size_t c = 0; c < 2; ++c) channels[c].cycle_time = ap_cycle_time(channels[0].prf, blockEchoes);
+  try {
+    table = build_ap_table(first, last, channels[0].prf, blockEchoes);
+  } catch (const std::invalid_argument& e) {
+    bad_timeline(level0Path, e, first, last);
+  }
+  return 0;
+}
+
+int init_WS_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
+                  const std::string& insPath) {
+  sar::base::Frame frame("init_WS_table");
+  const PacketMark first = first_packet(level0Path, kModeWS);
+  if (int st = frame.check(loadparam(level0Path, insPath, kModeWS, channels))) return st;
+  const PacketMark last = last_packet(level0Path, kModeWS);
+  std::array<WsSwathTimeline, 5> swaths{};
+  std::array<int, 5> order{};
+  for (std::size_t s = 0; s < 5; ++s) {
+    swaths[s] = {channels[s].prf, channels[s].swath_rank, channels[s].burst_echoes};
+    order[s] = channels[s].ss_order;
+  }
+  try {
+    table = build_ws_table(first, last, swaths, order);
+  } catch (const std::invalid_argument& e) {
+    bad_timeline(level0Path, e, first, last);
+  }
+  return 0;
+}
+
 TableBuilder timeline_table_builder() {
   return [](const std::string& level0Path, const std::string& insPath, int mode, LineTable& table,
             std::span<sarpar> channels) -> int {
     if (mode == kModeIM) return init_IM_table(level0Path, table, channels, insPath);
+    const char* letters = mode >= kModeIM && mode <= kModeGM ? mode_info(mode).letters : "?";
+    fatal(ec::kBadArguments, {level0Path, "no timeline table for the acquisition mode", letters});
+  };
+}
+
+TableBuilder level0_table_builder() {
+  return [](const std::string& level0Path, const std::string& insPath, int mode, LineTable& table,
+            std::span<sarpar> channels) -> int {
+    if (mode == kModeIM) return init_IM_table(level0Path, table, channels, insPath);
+    if (mode == kModeWS) return init_WS_table(level0Path, table, channels, insPath);
+    if (is_alternating(mode)) return init_AP_table(level0Path, table, channels, insPath, mode);
     const char* letters = mode >= kModeIM && mode <= kModeGM ? mode_info(mode).letters : "?";
     fatal(ec::kBadArguments, {level0Path, "no timeline table for the acquisition mode", letters});
   };

@@ -45,8 +45,23 @@ int asainspar(const std::string& insPath, std::span<sarpar> channels, int mode, 
 int init_IM_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
                   const std::string& insPath);
 
-/// The builder that `envi_extract` calls: the table of the product's mode. Modes without a
-/// builder raise the bad-argument code naming the product.
+/// Alternating polarisation table of a product of mode APC, APH or APV; fills both channels'
+/// parameters first, gives channel 1 the block length L of channel 0 and both the cycle time
+/// 2 L / prf. Returns 0.
+int init_AP_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
+                  const std::string& insPath, int mode);
+
+/// Wide swath table; fills the five sub-swaths' parameters first (their firing order in
+/// `ss_order`: entry k names the sub-swath fired k-th). Returns 0.
+int init_WS_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
+                  const std::string& insPath);
+
+/// The builder that the image mode job hands `envi_extract`: IM tables only. Other modes raise
+/// the bad-argument code naming the product.
 TableBuilder timeline_table_builder();
+
+/// The builder of every mode that has a timeline: IM, APC, APH, APV and WS. GM raises the
+/// bad-argument code naming the product.
+TableBuilder level0_table_builder();
 
 }  // namespace sar::envisat

@@ -1,7 +1,9 @@
-// sarsim: writes a simulated ENVISAT ASAR image mode level 0 product of point targets, its
-// DOR_VOR orbit file, the matching ASA_INS and ASA_XCA products and a truth file.
+// sarsim: writes a simulated ENVISAT ASAR level 0 product of point targets (image mode,
+// alternating polarisation or wide swath), its DOR_VOR orbit file, the matching ASA_INS and
+// ASA_XCA products and a truth file.
 //
-//   sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]
+//   sarsim --out DIR [--mode im|apc|aph|apv|ws] [--block-echoes L]
+//          [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]
 //          [--fault NAME]... [--time "dd-MMM-yyyy hh:mm:ss.uuuuuu"] [--ascending] [--seed S]
 //          [--first-counter C] [--ins-template FILE] [--xca-template FILE] [--no-aux]
 //          [--yaw-steering on|off] [--squint-hz F]
@@ -17,6 +19,11 @@
 // The ASA_INS and ASA_XCA are patched copies of real products (by default those of the sample
 // archive the build was configured with); --no-aux writes neither.
 //
+// --mode chooses the acquisition (image mode by default); --lines counts the packets of the
+// stream. AP and WS products start with the acquisition, so their initial noise and calibration
+// packets (210 in AP, 525 in WS) come first; a WS cycle is about 360 packets. --block-echoes sets
+// the AP block length L (default: the ASA_INS template's value for the beam).
+//
 // Faults: lost, corrupt-header, mode-id, seq-wrap, swst-change, truncated.
 #include <cstdio>
 #include <cstdlib>
@@ -31,7 +38,8 @@ namespace {
 
 void usage() {
   std::fputs(
-      "usage: sarsim --out DIR [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]\n"
+      "usage: sarsim --out DIR [--mode im|apc|aph|apv|ws] [--block-echoes L]\n"
+      "              [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]\n"
       "              [--fault lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated]...\n"
       "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
       "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n"
@@ -87,6 +95,10 @@ int main(int argc, char** argv) {
       if (arg == "--out") {
         config.out_dir = value();
         have_out = true;
+      } else if (arg == "--mode") {
+        config.mode = sar::simulator::mode_from_name(value());
+      } else if (arg == "--block-echoes") {
+        config.ap.block_echoes = static_cast<int>(number(value(), "block echoes"));
       } else if (arg == "--lines") {
         config.lines = static_cast<int>(number(value(), "line count"));
       } else if (arg == "--samples") {

@@ -6,6 +6,8 @@
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
+#include <string>
+#include <utility>
 #include <stdexcept>
 #include <vector>
 
@@ -33,7 +35,13 @@ constexpr std::size_t kSampling = 20;
 constexpr std::size_t kGateBias = 69912;
 constexpr std::size_t kFbaqI = 74656;
 constexpr std::size_t kFbaqQ = 103328;
-constexpr std::size_t kImRank = 161620;  // + 2 beam
+// Swath tables, + 2 beam each: echoes per burst or block, then rank.
+constexpr std::size_t kImEchoes = 161606;
+constexpr std::size_t kImRank = 161620;
+constexpr std::size_t kApEchoes = 161662;
+constexpr std::size_t kApRank = 161676;
+constexpr std::size_t kWsEchoes = 161690;
+constexpr std::size_t kWsRank = 161704;
 constexpr std::size_t kGainT = 171368;
 constexpr std::size_t kGainC = 171372;
 
@@ -90,19 +98,51 @@ std::size_t record_position(const std::vector<uint8_t>& bytes, std::size_t recor
   return static_cast<std::size_t>(pos);
 }
 
+// Record offsets of the echoes and rank entries of a row.
+std::pair<std::size_t, std::size_t> row_offsets(const InsSwathRow& row) {
+  const bool ws = row.table == InsTable::kWs;
+  if (ws ? (row.beam < 15 || row.beam > 19) : (row.beam < 1 || row.beam > 7))
+    throw std::invalid_argument("beam code " + std::to_string(row.beam) + " outside the ASA_INS swath table");
+  const std::size_t b = 2 * static_cast<std::size_t>(row.beam);
+  switch (row.table) {
+    case InsTable::kIm: return {kImEchoes + b, kImRank + b};
+    case InsTable::kAp: return {kApEchoes + b, kApRank + b};
+    case InsTable::kWs: return {kWsEchoes + b, kWsRank + b};
+  }
+  return {0, 0};
+}
+
+int get_u16(const std::vector<uint8_t>& bytes, std::size_t pos) {
+  if (pos + 2 > bytes.size()) throw std::runtime_error("auxiliary record too short");
+  return (bytes[pos] << 8) | bytes[pos + 1];
+}
+
 }  // namespace
+
+InsSwathRow read_ins_swath_row(const std::string& ins_path, InsTable table, int beam) {
+  const std::vector<uint8_t> bytes = read_all(ins_path);
+  expect_type(bytes, "ASA_INS_AX", ins_path);
+  const std::size_t r = record_position(bytes, kInsRecordBytes, ins_path);
+  InsSwathRow row{table, beam, 0, 0};
+  const auto [echoes, rank] = row_offsets(row);
+  row.echoes = get_u16(bytes, r + echoes);
+  row.rank = get_u16(bytes, r + rank);
+  return row;
+}
 
 AuxValidity aux_validity_around(double sensing_start) {
   const double midnight = std::floor(sensing_start / 86400.0) * 86400.0;
   return {midnight, midnight + 2.0 * 86400.0 - 1.0};
 }
 
-std::string write_ins_file(const std::string& template_path, const ImParameters& im, int swath_rank,
+std::string write_ins_file(const std::string& template_path, const ImParameters& im, std::span<const InsSwathRow> rows,
                            const AuxValidity& validity, const std::string& out_dir) {
   std::vector<uint8_t> bytes = read_all(template_path);
   expect_type(bytes, "ASA_INS_AX", template_path);
-  if (im.beam_code < 1 || im.beam_code > 7 || swath_rank < 0 || swath_rank > 0xFFFF)
-    throw std::invalid_argument("beam code or rank outside the ASA_INS tables");
+  for (const InsSwathRow& row : rows) {
+    (void)row_offsets(row);  // the beam lies in its table
+    if (row.echoes > 0xFFFF || row.rank > 0xFFFF) throw std::invalid_argument("ASA_INS swath table entry above 16 bits");
+  }
   const std::size_t r = record_position(bytes, kInsRecordBytes, template_path);
 
   // The decoder reads table row (mapped code) by column (block threshold), rows rising.
@@ -118,7 +158,11 @@ std::string write_ins_file(const std::string& template_path, const ImParameters&
   put_f32(bytes, r + kCarrier, static_cast<float>(im.carrier_frequency));
   put_f32(bytes, r + kSampling, static_cast<float>(im.sampling_frequency));
   put_f32(bytes, r + kGateBias, static_cast<float>(im.range_gate_bias));
-  put_u16(bytes, r + kImRank + 2 * static_cast<std::size_t>(im.beam_code), swath_rank);
+  for (const InsSwathRow& row : rows) {
+    const auto [echoes, rank] = row_offsets(row);
+    if (row.echoes >= 0) put_u16(bytes, r + echoes, row.echoes);
+    if (row.rank >= 0) put_u16(bytes, r + rank, row.rank);
+  }
   put_f32(bytes, r + kGainT, static_cast<float>(im.gain_t));
   for (std::size_t k = 0; k < 8; ++k) put_f64(bytes, r + kGainC + 8 * k, im.gain_c[k]);
   return write_renamed(bytes, "ASA_INS_", validity, out_dir);

@@ -6,8 +6,10 @@
 // Rewritten in both: the MPH product name (and the file name with it) and the validity period
 // (SENSING_START, SENSING_STOP). Rewritten in ASA_INS where the simulation differs from the
 // template: the FBAQ reconstruction tables for I and Q (always: the simulator's own table), the
-// carrier and sampling frequencies, the range gate bias, the IM rank of the beam and the gain
-// model. The template file itself is only read.
+// carrier and sampling frequencies, the range gate bias, the gain model, and the rows of the
+// swath tables (echoes per burst or block, rank) of the beams the acquisition used. The
+// template file itself is only read.
+#include <span>
 #include <string>
 
 #include "simulator/simulator.hpp"
@@ -23,9 +25,26 @@ struct AuxValidity {
 /// Validity around an acquisition: from the midnight before `sensing_start` to two days later.
 AuxValidity aux_validity_around(double sensing_start);
 
-/// Writes the ASA_INS copy into `out_dir`; returns its path. Throws std::runtime_error when the
-/// template cannot be read or is no ASA_INS product.
-std::string write_ins_file(const std::string& template_path, const ImParameters& im, int swath_rank,
+/// Swath tables of ASA_INS: one per timeline, indexed by the beam code of the packets (1-7 for
+/// IM and AP, 15-19 for WS).
+enum class InsTable { kIm, kAp, kWs };
+
+/// One row: echoes per burst (IM, WS) or per block (AP), and the rank. An entry below 0 is not
+/// written.
+struct InsSwathRow {
+  InsTable table = InsTable::kIm;
+  int beam = 2;
+  int echoes = -1;
+  int rank = -1;
+};
+
+/// The row of a beam as an ASA_INS product holds it. Throws std::runtime_error for a file that
+/// is no ASA_INS product, std::invalid_argument for a beam outside the table.
+InsSwathRow read_ins_swath_row(const std::string& ins_path, InsTable table, int beam);
+
+/// Writes the ASA_INS copy into `out_dir`, with the rows given; returns its path. Throws
+/// std::runtime_error when the template cannot be read or is no ASA_INS product.
+std::string write_ins_file(const std::string& template_path, const ImParameters& im, std::span<const InsSwathRow> rows,
                            const AuxValidity& validity, const std::string& out_dir);
 
 /// Writes the ASA_XCA copy into `out_dir`; returns its path.

@@ -119,4 +119,36 @@ std::vector<float> fbaq_decode_line(std::span<const uint8_t> bytes, int samples,
   return iq;
 }
 
+namespace {
+// The fixed table of the noise levels in rising order (rows); code c names row 8 + c for c < 8
+// and row 15 - c otherwise, as for echoes.
+constexpr double kNoiseLevels[16] = {-0.05906, -0.051, -0.043, -0.035, -0.0275, -0.02, -0.012, -0.004,
+                                     0.004,    0.012,  0.02,   0.0275, 0.035,   0.043, 0.051,  0.05906};
+
+// Code of the 4-bit ADC level nearest to x counts: magnitude floor(|x|), at most 7, with the sign.
+int noise_code(double x) {
+  const int magnitude = std::min(7, static_cast<int>(std::floor(std::abs(x))));
+  return x >= 0.0 ? magnitude : 8 + magnitude;
+}
+}  // namespace
+
+double noise_level(int code) { return kNoiseLevels[fbaq_code_to_row(code & 15)]; }
+
+std::size_t noise_line_bytes(int samples) {
+  if (samples <= 0) throw std::invalid_argument("line without samples");
+  return static_cast<std::size_t>(samples + samples % 2);
+}
+
+double noise_encode_line(std::span<const double> iq, std::vector<uint8_t>& out) {
+  const std::size_t n = iq.size() / 2;
+  double power = 0.0;
+  for (std::size_t k = 0; k < n; ++k) {
+    const int ci = noise_code(iq[2 * k]), cq = noise_code(iq[2 * k + 1]);
+    power += noise_level(ci) * noise_level(ci) + noise_level(cq) * noise_level(cq);
+    out.push_back(static_cast<uint8_t>((ci << 4) | cq));
+  }
+  if (n % 2 != 0) out.push_back(0);
+  return n == 0 ? 0.0 : power / static_cast<double>(n);
+}
+
 }  // namespace sar::simulator

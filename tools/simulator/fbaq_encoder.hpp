@@ -41,4 +41,18 @@ void fbaq_encode_line(std::span<const float> iq, const FbaqTable& table, std::ve
 /// Decodes one line with the same table (for tests and round-trip checks of the simulator).
 std::vector<float> fbaq_decode_line(std::span<const uint8_t> bytes, int samples, const FbaqTable& table);
 
+// Noise packets carry no blocks and no thresholds: each byte is one complex sample of the 4-bit
+// receiver, I in the high nibble and Q in the low nibble, in the same sign-and-magnitude code.
+// The 16 levels are fixed: the ADC's half-integer levels -7.5 to 7.5 counts, at full scale 1
+// (127.5 counts), as the instrument's table states them. A line is padded to an even length.
+
+/// Level of a noise code 0-15, as the instrument's fixed table gives it.
+double noise_level(int code);
+/// Bytes of a noise line of `samples` complex samples.
+std::size_t noise_line_bytes(int samples);
+/// Quantises one line of interleaved I, Q values in ADC counts to the 4-bit levels (clipping at
+/// 7.5 counts) and appends its bytes to `out`. Returns the line's mean power in level units,
+/// the sum of I^2 + Q^2 of the levels over the samples, divided by their count.
+double noise_encode_line(std::span<const double> iq, std::vector<uint8_t>& out);
+
 }  // namespace sar::simulator

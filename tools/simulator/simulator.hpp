@@ -1,7 +1,13 @@
 #pragma once
-// The test-product simulator: from a scene of point targets it writes an ENVISAT ASAR image
-// mode level 0 product, a DOR_VOR orbit file and a truth file, so that every later stage can be
-// checked against known geometry.
+// The test-product simulator: from a scene of point targets it writes an ENVISAT ASAR level 0
+// product of image mode (IM), alternating polarisation (APC, APH, APV) or wide swath (WS), a
+// DOR_VOR orbit file and a truth file, so that every later stage can be checked against known
+// geometry.
+//
+// Packets follow the instrument's timeline of the mode (timeline.hpp): echoes, noise packets,
+// periodic calibration pulses and, in a product that starts with the acquisition, the initial
+// noise and calibration packets. In AP the two channels share the swath and codes of `im`; in
+// WS each sub-swath has its own PRF, rank, burst length and range window.
 //
 // Signal model. The packet of line l is stamped with the transmit time t_l = t_first + l / PRF of
 // the pulse whose echoes it holds (stop and go: the satellite is taken at S(t_l) for the whole
@@ -17,7 +23,12 @@
 // The sum over targets, plus the echo of distributed clutter when asked for (clutter.hpp), is
 // multiplied by the receive gain g(k) that the decoder divides by, white
 // Gaussian noise is added, the result is quantised to 8 bits (levels at half-integers, -127.5 to
-// 127.5) and packed 8:4 with the simulator's FBAQ table.
+// 127.5) and packed 8:4 with the simulator's FBAQ table. In AP the lines lie on the PRF grid
+// with the skipped PRIs of the change-overs; in WS the packets take the times of the burst
+// timeline, each sub-swath at its own PRF, and PRF, rank and window are those of the packet's
+// sub-swath. Noise packets hold the same white noise alone, in the 4-bit samples of noise
+// packets (fbaq_encoder.hpp); calibration packets the replica through the four paths.
+#include <array>
 #include <complex>
 #include <cstdint>
 #include <optional>
@@ -27,6 +38,7 @@
 #include "simulator/attitude.hpp"
 #include "simulator/clutter.hpp"
 #include "simulator/orbit_model.hpp"
+#include "simulator/timeline.hpp"
 
 namespace sar::simulator {
 
@@ -67,9 +79,37 @@ struct ImParameters {
   double gain_c[8] = {-0.004739, 0.403, 25.0, -0.004232, 0.4697, 175.0, 0.0006683, -0.06206};
 };
 
+/// Alternating polarisation: two channels on the swath of `im`, their blocks interleaved.
+struct ApParameters {
+  int block_echoes = 0;           // L; 0: the value of the ASA_INS template for the beam
+  double cross_polar_gain = 0.5;  // target amplitude in a cross-polarised channel (H/V, V/H)
+};
+
+/// One wide swath sub-swath.
+struct WsSwathParameters {
+  int pri_code = 0;
+  double incidence_deg = 0.0;  // at the centre of the range window
+  int burst_echoes = 0;        // M; 0: the value of the ASA_INS template for the beam
+};
+
+/// Wide swath: the five sub-swaths SS1-SS5 (beam codes 15-19), fired in bursts.
+struct WsParameters {
+  // PRFs 1686, 2058, 1656, 2064 and 1670 Hz; incidences at the middle of each sub-swath. With
+  // the nominal orbit they give the ranks of the instrument's tables (9, 12, 10, 13, 11) and
+  // sampling windows that open within 5000 samples of their pulse, as the extraction expects.
+  std::array<WsSwathParameters, 5> swaths = {{
+      {11392, 21.0, 0}, {9335, 28.5, 0}, {11600, 33.6, 0}, {9305, 37.8, 0}, {11500, 41.0, 0}}};
+  std::array<int, 5> order = {0, 1, 2, 3, 4};  // firing order
+  int target_swath = 2;    // its window is centred on the first target's echo
+  bool vertical = false;   // V/V instead of H/H
+};
+
 struct SimulationConfig {
+  AcquisitionMode mode = AcquisitionMode::kIM;
   std::string out_dir = ".";
-  int lines = 512;     // packets from the first echo to the last packet
+  // Packets of the stream, from the first to the last. IM: from the first echo, unless
+  // first_counter puts the start in the initial calibration.
+  int lines = 512;
   int samples = 1024;  // complex samples of an echo line (SWL code)
   std::vector<Target> targets;
   double noise_db = 20.0;  // noise power of a complex sample, dB relative to 1 count^2; below -100: none
@@ -77,9 +117,13 @@ struct SimulationConfig {
   std::string scene_time = "02-MAR-2008 10:00:00.000000";  // zero-Doppler time of the first target
   bool ascending = false;
   int orbit_number = 31400;  // absolute orbit at the scene time
-  int first_counter = -1;    // mode packet counter of the first packet; -1: chosen
+  // Mode packet counter of the first packet; -1: chosen (IM: mid-cycle; AP and WS: 0, the start
+  // of the acquisition with its initial noise and calibration packets).
+  int first_counter = -1;
   uint64_t seed = 1;
-  ImParameters im;
+  ImParameters im;  // IM and AP: the swath and codes; all modes: frequencies, gate bias, gain
+  ApParameters ap;
+  WsParameters ws;
   double orbit_margin = 7200.0;  // s of orbit file before and after the scene
   // Real ASA_INS and ASA_XCA products whose patched copies are written beside the level 0
   // product (see aux_files.hpp); empty: that product is not written.
@@ -94,7 +138,39 @@ struct SimulationConfig {
   // (middle line, middle sample) is this many Hz; attitude.squint_rad is then ignored.
   std::optional<double> centroid_hz;
   // Distributed clutter added to the echoes of the targets (see clutter.hpp); off by default.
+  // IM and AP only.
   ClutterOptions clutter;
+};
+
+/// One channel of the product: the polarisation of AP, the sub-swath of WS.
+struct ChannelTruth {
+  int beam_code = 0;
+  std::string polarization;  // "H/H", "V/V", "H/V", "V/H"
+  int pri_code = 0;
+  double prf = 0.0;
+  int pulse_code = 0;
+  int bandwidth_code = 0;
+  int swath_rank = 0;
+  int swst_code = 0;
+  int samples = 0;           // SWL of echoes and noise packets
+  double near_range_time = 0.0;  // two-way time of sample 0 at swst_code
+  int burst_echoes = 0;      // WS: M; AP: L (the same for both channels)
+  double target_gain = 1.0;  // factor on the target amplitudes
+  int echo_packets = 0, noise_packets = 0, calibration_packets = 0;  // in the stream, lost ones too
+};
+
+/// One packet of the stream (lost ones included).
+struct PacketTruth {
+  int counter = 0;
+  PacketKind kind = PacketKind::kEcho;
+  int channel = 0;
+  double time = 0.0;          // sec85, the head's stamp
+  bool lost = false;
+  long long cycle = -1;       // timeline cycle from 0; -1 in the initial packets
+  bool burst_start = false;   // WS: first echo of a burst
+  long long grid_line = 0;    // IM, AP: line of the regular PRF grid, 0 at the first echo
+  double noise_power = 0.0;   // noise packets: mean I^2 + Q^2 of the decoded levels
+  int calibration_row = 0;    // calibration packets: the antenna row of the pulse
 };
 
 /// What one target looks like in the product.
@@ -122,12 +198,31 @@ struct ClutterTruth {
 };
 
 struct SimulationTruth {
+  AcquisitionMode mode = AcquisitionMode::kIM;
   std::string level0_path, orbit_path, truth_path, product_name, orbit_name;
   std::string ins_path, xca_path;  // empty when not written
-  double first_line_time = 0.0;  // sec85, microsecond stamp of the first packet (an echo)
+  // sec85, stamp of the first echo: the first packet in IM (unless the product starts in the
+  // initial calibration); AP: the first line of the line grid; WS: the first echo of the first
+  // whole cycle.
+  double first_line_time = 0.0;
+  double first_packet_time = 0.0;  // sec85
   int line_count = 0;            // packets from the first to the last, lost ones included
   int echo_lines = 0;
   std::vector<int> calibration_lines;  // line indices of periodic calibration packets
+  // Channels (one in IM); the fields below (prf, swath_rank, swst_code, near_range_time) are
+  // those of the reference channel: 0, or in WS the sub-swath centred on the first target.
+  std::vector<ChannelTruth> channels;
+  int reference_channel = 0;
+  std::vector<PacketTruth> packets;
+  // IM, AP: PRIs spanned by the stream; and lines per channel of the regular PRF grid from the
+  // first echo to the last (AP: every packet takes a line, and each skipped PRI of a
+  // change-over one more).
+  int grid_lines = 0;
+  int channel_lines = 0;
+  // WS: packets of a cycle, counter of the first whole cycle's first packet, whole cycles.
+  int cycle_packets = 0;
+  int first_cycle_counter = 0;
+  int whole_cycles = 0;
   double prf = 0.0;
   double pulse_length = 0.0;
   double chirp_bandwidth = 0.0;
@@ -148,9 +243,9 @@ struct SimulationTruth {
   long long truncated_at_byte = -1;
   int last_whole_line = -1;  // last line whose record is complete in a truncated file
   long long full_size = 0;   // TOT_SIZE of the MPH
-  // With keep_echoes: line_count x samples values, line by line, of the signal the ADC sees
+  // With keep_echoes: line_count x samples values, packet by packet, of the signal the ADC sees
   // (targets times the receive gain, plus noise), before the 8-bit and the FBAQ quantisation.
-  // Lines of calibration pulses are zero.
+  // Lines of calibration pulses and noise packets are zero.
   std::vector<std::complex<float>> echoes;
   ClutterTruth clutter;
   Attitude attitude;              // as flown, with the squint that was chosen
@@ -163,7 +258,8 @@ SimulationTruth run_simulation(const SimulationConfig& config);
 
 /// The clutter geometry of a simulation whose truth holds the acquisition (prf, pulse, range
 /// window): the orbit of the scene at the middle line, the window of `samples` plus the largest
-/// SWST shift of the product. Tests use it to feed their own reflectivity.
+/// SWST shift of the product, lines on the PRF grid from the first packet. Tests use it to feed
+/// their own reflectivity. IM and AP only.
 ClutterGeometry clutter_geometry(const SimulationConfig& config, const SimulationTruth& truth);
 
 /// Receive gain g(k) of the model in `im`, for k in [0, count).

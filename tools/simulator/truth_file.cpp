@@ -1,5 +1,6 @@
 #include "simulator/truth_file.hpp"
 
+#include <algorithm>
 #include <cstdio>
 #include <fstream>
 #include <stdexcept>
@@ -51,7 +52,12 @@ class TruthWriter {
 void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const OrbitModel& orbit,
                       const std::string& path) {
   TruthWriter w(path);
-  w.raw("Truth of a simulated ENVISAT ASAR image mode level 0 product, written by sarsim.");
+  const bool im = t.mode == AcquisitionMode::kIM;
+  const bool ws = t.mode == AcquisitionMode::kWS;
+  const ChannelTruth& ref = t.channels.at(static_cast<std::size_t>(t.reference_channel));
+  if (im) w.raw("Truth of a simulated ENVISAT ASAR image mode level 0 product, written by sarsim.");
+  else if (ws) w.raw("Truth of a simulated ENVISAT ASAR wide swath level 0 product, written by sarsim.");
+  else w.raw("Truth of a simulated ENVISAT ASAR alternating polarisation level 0 product, written by sarsim.");
   w.raw("Times in UTC; sec85 is seconds since 1-JAN-1985. Ranges in metres, times in seconds.");
 
   w.section("product");
@@ -61,9 +67,9 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.text("orbit_name", t.orbit_name);
   w.text("ins_file", t.ins_path);
   w.text("xca_file", t.xca_path);
-  w.text("mode", "IM");
-  w.text("swath", "IS" + std::to_string(c.im.beam_code));
-  w.text("polarization", "H/H");
+  w.text("mode", mode_codes(t.mode).letters);
+  w.text("swath", ws ? std::string("WS") : "IS" + std::to_string(c.im.beam_code));
+  w.text("polarization", t.channels.front().polarization);
   w.integer("full_size", t.full_size);
 
   w.section("acquisition");
@@ -76,7 +82,7 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.integer("first_counter", t.first_counter);
   w.integer("last_counter", t.last_counter);
   w.number("prf", t.prf, "%.9f");
-  w.integer("pri_code", c.im.pri_code);
+  w.integer("pri_code", ref.pri_code);
   w.integer("swst_code", t.swst_code);
   w.integer("swl_code", c.samples);
   w.integer("line_samples", c.samples);
@@ -89,7 +95,7 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.number("chirp_bandwidth", t.chirp_bandwidth, "%.6f");
   w.number("range_gate_bias", c.im.range_gate_bias, "%.12e");
   w.integer("swath_rank", t.swath_rank);
-  w.integer("beam_code", c.im.beam_code);
+  w.integer("beam_code", ref.beam_code);
   w.number("near_range_time", t.near_range_time, "%.15e");
   w.number("antenna_length", c.im.antenna_length, "%.3f");
   w.number("noise_db", c.noise_db, "%.3f");
@@ -99,6 +105,53 @@ void write_truth_file(const SimulationTruth& t, const SimulationConfig& c, const
   w.number("range_resolution", kSpeedOfLight / (2.0 * t.chirp_bandwidth), "%.6f");
   w.number("azimuth_resolution", c.im.antenna_length / 2.0, "%.6f");
   w.text("echo_convention", "up-chirp from the two-way delay 2R/c over pulse_length, stop and go at the packet time");
+  if (!im) {
+    w.time("first_packet_time", t.first_packet_time);
+    w.integer("channels", static_cast<long long>(t.channels.size()));
+    w.integer("reference_channel", t.reference_channel);
+    if (ws) {
+      w.integer("cycle_packets", t.cycle_packets);
+      w.integer("first_cycle_counter", t.first_cycle_counter);
+      w.integer("whole_cycles", t.whole_cycles);
+      std::vector<std::string> order;
+      for (int s : c.ws.order) order.push_back(std::to_string(s + 1));
+      w.list("firing_order", order);
+    } else {
+      w.integer("grid_lines", t.grid_lines);
+      w.integer("channel_lines", t.channel_lines);
+    }
+    for (std::size_t k = 0; k < t.channels.size(); ++k) {
+      const ChannelTruth& ch = t.channels[k];
+      w.section("channel_" + std::to_string(k + 1));
+      w.text("polarization", ch.polarization);
+      w.integer("beam_code", ch.beam_code);
+      w.integer("pri_code", ch.pri_code);
+      w.number("prf", ch.prf, "%.9f");
+      w.integer("swath_rank", ch.swath_rank);
+      w.integer("swst_code", ch.swst_code);
+      w.number("near_range_time", ch.near_range_time, "%.15e");
+      w.integer("swl_code", ch.samples);
+      w.integer(ws ? "burst_echoes" : "block_echoes", ch.burst_echoes);
+      w.number("target_gain", ch.target_gain, "%.6f");
+      w.integer("echo_packets", ch.echo_packets);
+      w.integer("noise_packets", ch.noise_packets);
+      w.integer("calibration_packets", ch.calibration_packets);
+      if (ws) {
+        // Bursts of the whole cycles: the stamp of each first echo, sec85.
+        const long long first_cycle = (t.first_cycle_counter - kWsInitialPackets) / std::max(1, t.cycle_packets);
+        std::vector<std::string> bursts;
+        for (const PacketTruth& p : t.packets) {
+          if (!p.burst_start || p.channel != static_cast<int>(k) || p.cycle < first_cycle ||
+              p.cycle >= first_cycle + t.whole_cycles)
+            continue;
+          char text[32];
+          std::snprintf(text, sizeof text, "%.6f", p.time);
+          bursts.push_back(text);
+        }
+        w.list("burst_times_sec85", bursts);
+      }
+    }
+  }
 
   w.section("orbit");
   const OrbitElements& e = orbit.elements();

@@ -5,9 +5,12 @@
 // empty list "{}". Keys:
 //
 // [product]     level0_file, orbit_file, product_name, orbit_name, ins_file, xca_file (the
-//               matching ASA_INS and ASA_XCA, empty when not written), mode (IM), swath (IS2),
-//               polarization (H/H), full_size (bytes the MPH announces)
-// [acquisition] first_line_time, first_line_time_sec85 (stamp of the first packet, an echo),
+//               matching ASA_INS and ASA_XCA, empty when not written), mode (IM, APC, APH, APV,
+//               WS), swath (IS2, or WS), polarization (H/H; channel 1's in AP), full_size (bytes
+//               the MPH announces)
+// [acquisition] first_line_time, first_line_time_sec85 (stamp of the first echo: in IM the
+//               first packet, unless it lies in the initial calibration; in WS the first echo
+//               of the first whole cycle),
 //               line_count (packets from the first to the last, lost ones included),
 //               echo_lines, calibration_lines (line indices of periodic calibration pulses),
 //               first_counter, last_counter (mode packet counters), prf, pri_code, swst_code,
@@ -18,7 +21,18 @@
 //               at the middle line and sample; 0 when the beam is steered to zero Doppler),
 //               yaw_steering (0 or 1), squint (rad, positive forward),
 //               range_resolution (c / 2B, m, slant), azimuth_resolution (L / 2, m),
-//               echo_convention (where the echo of a target lies in the line)
+//               echo_convention (where the echo of a target lies in the line); in AP and WS
+//               the values of the reference channel (reference_channel, from 0: channel 1 in
+//               AP, the sub-swath centred on the first target in WS) and also
+//               first_packet_time, first_packet_time_sec85, channels; AP: grid_lines (PRIs
+//               spanned by the stream), channel_lines (lines per channel of the PRF grid from
+//               the first to the last echo); WS: cycle_packets, first_cycle_counter,
+//               whole_cycles, firing_order (sub-swath numbers 1-5)
+// [channel_N]   AP and WS, N from 1 (a polarisation or a sub-swath): polarization, beam_code,
+//               pri_code, prf, swath_rank, swst_code, near_range_time, swl_code, block_echoes
+//               (AP) or burst_echoes (WS), target_gain, echo_packets, noise_packets,
+//               calibration_packets (in the stream); WS: burst_times_sec85 (stamp of the first
+//               echo of each burst of the whole cycles)
 // [orbit]       epoch, epoch_sec85, semi_major_axis, inclination, period, ascending (0 or 1),
 //               absolute_orbit, ascending_node_time, ascending_node_time_sec85
 // [target_N]    (N from 1) latitude, longitude, height, amplitude, x, y, z (Earth-fixed),
