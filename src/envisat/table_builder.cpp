@@ -360,15 +360,6 @@ TableBuilder timeline_table_builder() {
   return [](const std::string& level0Path, const std::string& insPath, int mode, LineTable& table,
             std::span<sarpar> channels) -> int {
     if (mode == kModeIM) return init_IM_table(level0Path, table, channels, insPath);
-    const char* letters = mode >= kModeIM && mode <= kModeGM ? mode_info(mode).letters : "?";
-    fatal(ec::kBadArguments, {level0Path, "no timeline table for the acquisition mode", letters});
-  };
-}
-
-TableBuilder level0_table_builder() {
-  return [](const std::string& level0Path, const std::string& insPath, int mode, LineTable& table,
-            std::span<sarpar> channels) -> int {
-    if (mode == kModeIM) return init_IM_table(level0Path, table, channels, insPath);
     if (mode == kModeWS) return init_WS_table(level0Path, table, channels, insPath);
     if (is_alternating(mode)) return init_AP_table(level0Path, table, channels, insPath, mode);
     const char* letters = mode >= kModeIM && mode <= kModeGM ? mode_info(mode).letters : "?";

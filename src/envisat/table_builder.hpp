@@ -56,12 +56,8 @@ int init_AP_table(const std::string& level0Path, LineTable& table, std::span<sar
 int init_WS_table(const std::string& level0Path, LineTable& table, std::span<sarpar> channels,
                   const std::string& insPath);
 
-/// The builder that the image mode job hands `envi_extract`: IM tables only. Other modes raise
-/// the bad-argument code naming the product.
+/// The builder the jobs hand `envi_extract`, for every mode that has a timeline: IM, APC, APH,
+/// APV and WS. GM raises the bad-argument code naming the product.
 TableBuilder timeline_table_builder();
-
-/// The builder of every mode that has a timeline: IM, APC, APH, APV and WS. GM raises the
-/// bad-argument code naming the product.
-TableBuilder level0_table_builder();
 
 }  // namespace sar::envisat

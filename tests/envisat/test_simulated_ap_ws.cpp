@@ -80,7 +80,7 @@ Extracted extract(const sim::SimulationTruth& t, const std::string& dir, int kin
     EXPECT_EQ(LUTfbaq_f(t.ins_path, fbaq.q, fbaq.i), 0);
     std::vector<float> gains(kGainTableLength);
     EXPECT_EQ(read_gain_table(t.ins_path, gains), 0);
-    EXPECT_EQ(level0_table_builder()(t.level0_path, t.ins_path, header.mode, x.table, x.channels), 0);
+    EXPECT_EQ(timeline_table_builder()(t.level0_path, t.ins_path, header.mode, x.table, x.channels), 0);
     EXPECT_EQ(extract_level0(t.level0_path, header, x.table, fbaq, gains, x.channels, x.conf), 0);
   } catch (const sar::base::CErrorExceptionManager& e) {
     std::string what;

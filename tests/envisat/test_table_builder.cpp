@@ -123,10 +123,10 @@ TEST(ImTable, BadProductsRaiseTheFileErrorNamingThem) {
   // An ASA_INS for a product: the product is no level 0 stream with clean heads.
   const auto e = raised([] { first_packet(sar::test::kInsTemplate, kModeIM); });
   EXPECT_EQ(e.ec(), ec::kFileIo);
-  // A product of another mode has no table builder yet.
+  // Global monitoring has no timeline table.
   std::vector<sarpar> ch(5);
   LineTable table;
-  const auto e3 = raised([&] { timeline_table_builder()("product.N1", sar::test::kInsTemplate, kModeWS, table, ch); });
+  const auto e3 = raised([&] { timeline_table_builder()("product.N1", sar::test::kInsTemplate, kModeGM, table, ch); });
   EXPECT_EQ(e3.ec(), ec::kBadArguments);
 }
 
