@@ -348,9 +348,12 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
         const int p = static_cast<int>(std::floor(x));
         if (p < 0 || p >= M2) continue;
         const double t = x - p;
-        const dcomplex a = dcomplex(z[static_cast<std::size_t>(p)]) * std::polar(1.0 - t, kPi * t);
-        const dcomplex b = dcomplex(z[static_cast<std::size_t>(p + 1)]) * std::polar(t, -kPi * (1.0 - t));
-        const dcomplex v = (a + b) * std::polar(1.0, lineTurn);
+        // Linear interpolation between the two chirp-Z bins, each turned back by its half-bin
+        // phase: (1 - t) e^{j pi t} z_p + t e^{-j pi (1 - t)} z_{p+1}, and the line's own turn.
+        // Since e^{-j pi (1 - t)} = -e^{j pi t}, one rotation serves all three.
+        const dcomplex mix = (1.0 - t) * dcomplex(z[static_cast<std::size_t>(p)]) -
+                             t * dcomplex(z[static_cast<std::size_t>(p + 1)]);
+        const dcomplex v = mix * std::polar(1.0, kPi * t + lineTurn);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
       }
       finish_row(back, out, row, Nout, n);
