@@ -169,7 +169,8 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     base::report(base::kReportError, "Azimuth focusing: no range-compressed lines");
     return frame.check(kRejected);
   }
-  if (az.LinesInBlock <= 2 * ha || az.LinesInBlock > lines || lines <= 2 * ha) {
+  // A block longer than the scene is the whole scene in one block.
+  if (az.LinesInBlock <= 2 * ha || lines <= 2 * ha) {
     base::report(base::kReportError, "Azimuth focusing: blocks of " + std::to_string(az.LinesInBlock) +
                                          " lines with an overlap of " + std::to_string(2 * ha) +
                                          " do not fit a scene of " + std::to_string(lines) + " lines");
@@ -221,7 +222,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     in = std::make_unique<InputRaster>(par.rgfPath, static_cast<int64_t>(lines) * samples * 8, "range-focused file");
     out = std::make_unique<OutputRaster>(par.slcPath);
   }
-  dsp::cvector block(static_cast<std::size_t>(samples) * Lb);
+  dsp::cvector block(static_cast<std::size_t>(samples) * std::min(Lb, lines));
   progress_open("Azimuth Focusing");
   focazwk_result result;
   int64_t written = 0;  // focused lines so far (core mode packs them at pitch So)

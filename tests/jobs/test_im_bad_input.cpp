@@ -121,10 +121,10 @@ TEST_F(ImBadInput, StopsWithTheRightCodeAndLeavesNoProduct) {
        [](ScratchJob& j) { return prepare(j, *late_, kVor); }, ec::kStageFailed, "IMprocessor()"},
       {"product ends inside a packet",
        [](ScratchJob& j) { return prepare(j, *truncated_); }, ec::kFileIo, ""},
-      {"azimuth block larger than the scene",
+      {"azimuth overlap leaves no line of a block",
        [](ScratchJob& j) {
          const std::string cmd = prepare(j, *clean_);
-         set_parameters(j.dir() / "des" / "parameters_IM.hdr", {{"LinesInBlock", "8192"}});
+         set_parameters(j.dir() / "des" / "parameters_IM.hdr", {{"AzimuthOverlap", "2048"}});
          return cmd;
        },
        ec::kStageFailed, "IMprocessor()"},

@@ -205,7 +205,7 @@ TEST(AzimuthFocus, RefusesBlocksThatDoNotFit) {
   struct Case {
     int linesInBlock, azimuthOverlap, samplesInBlock, rangeOverlap;
   };
-  for (const Case c : {Case{4096, 700, 256, 0}, Case{1400, 1400, 256, 0}, Case{1024, 0, 64, 70}}) {
+  for (const Case c : {Case{700, 700, 256, 0}, Case{1400, 1400, 256, 0}, Case{1024, 0, 64, 70}}) {
     Scene s = make_scene(1024, 128, 0.0, {});
     s.az.LinesInBlock = c.linesInBlock;
     s.az.AzimuthOverlap = c.azimuthOverlap / 2;
@@ -213,4 +213,23 @@ TEST(AzimuthFocus, RefusesBlocksThatDoNotFit) {
     s.az.RangeOverlap = c.rangeOverlap / 2;
     EXPECT_EQ(sar::stripmap::azimuthfoc(s.par, s.proc, s.az), 10) << c.linesInBlock << " " << c.azimuthOverlap;
   }
+}
+
+// A block longer than the scene focuses the scene as one block: the same bytes as a block of
+// exactly the scene's lines.
+TEST(AzimuthFocus, BlockLongerThanTheSceneIsTheWholeScene) {
+  std::vector<cf> slc[2];
+  int k = 0;
+  for (const int linesInBlock : {1024, 4096}) {
+    Scene s = make_scene(1024, 128, 0.0, {});
+    s.az.LinesInBlock = linesInBlock;
+    s.az.AzimuthOverlap = 350;
+    s.az.SamplesInBlock = 128;
+    s.az.RangeOverlap = 0;
+    ASSERT_EQ(sar::stripmap::azimuthfoc(s.par, s.proc, s.az), 0) << linesInBlock;
+    EXPECT_EQ(s.proc.focusedLines, 1024 - 700);
+    slc[k++] = std::vector<cf>(s.proc.matrix.begin(), s.proc.matrix.end());
+  }
+  ASSERT_EQ(slc[0].size(), slc[1].size());
+  EXPECT_EQ(0, std::memcmp(slc[0].data(), slc[1].data(), slc[0].size() * sizeof(cf)));
 }
