@@ -46,28 +46,69 @@ struct Weighting {
   double range_weight(double kr) const {
     return (useRange && hr != 0.0) ? taper(std::abs(kr - kr0), ar * B, br * B, hr) : 1.0;
   }
-  // Weight of one sample; adds to the normalisation sums when it lies in the chirp's band.
-  double weight(double kr, double ky, double rangeWeight, double& s1, double& s2) const {
-    if (!active()) return 1.0;
+  // Everything of a sample's weight but the range window: the azimuth window and the antenna
+  // whitening at the look angle of (kr, ky), and the antenna term G of the normalisation.
+  void azimuth_terms(double kr, double ky, double& az, double& G) const {
     const double theta = squint - std::asin(std::clamp(ky / kr, -1.0, 1.0));
-    double w = rangeWeight;
-    if (ha != 0.0) w *= taper(std::abs(theta), aaz * A, baz * A, ha);
+    az = 1.0;
+    if (ha != 0.0) az *= taper(std::abs(theta), aaz * A, baz * A, ha);
     const double t2 = squint - std::asin(std::clamp((ky - dky) / kr, -1.0, 1.0));
     const double t3 = squint - std::asin(std::clamp((ky + dky) / kr, -1.0, 1.0));
     auto g4 = [&](double t) {
       const double s = sinc(Lw * std::sin(t));
       return s * s * s * s;
     };
-    const double G = g4(t2) + g4(t3) + g4(theta);
-    if (whiten) w *= 1.0 / (std::sqrt(G) + 0.0001);
-    if (std::abs(kr - kr0) < normBand) {
-      s1 += G;
-      s2 += w * w * G;
-    }
-    return w;
+    G = g4(t2) + g4(t3) + g4(theta);
+    if (whiten) az *= 1.0 / (std::sqrt(G) + 0.0001);
   }
 };
 
+// The azimuth terms depend on kr only through ky/kr, which moves by a few parts in a thousand
+// across the range band: per Doppler line they are evaluated at a few nodes over the line's kr
+// span and interpolated, which spares the sample loops most of their transcendental calls.
+class LineWeight {
+ public:
+  static constexpr int kNodes = 17;
+  LineWeight(const Weighting& w, double ky, double kLow, double kHigh) : w_(w) {
+    if (!w.active()) return;
+    k0_ = kLow;
+    step_ = (kHigh - kLow) / (kNodes - 1);
+    for (int i = 0; i < kNodes; ++i)
+      w.azimuth_terms(kLow + i * step_, ky, az_[static_cast<std::size_t>(i)], g_[static_cast<std::size_t>(i)]);
+    // A line whose look angles straddle the window's cut has a step inside its span, which
+    // interpolation would smear: such a line is weighted sample by sample.
+    const bool anyCut = std::any_of(az_.begin(), az_.end(), [](double a) { return a == 0.0; });
+    const bool anyPass = std::any_of(az_.begin(), az_.end(), [](double a) { return a != 0.0; });
+    exact_ = anyCut && anyPass;
+    ky_ = ky;
+  }
+  // Weight of one sample; adds to the normalisation sums when it lies in the chirp's band.
+  double weight(double kr, double rangeWeight, double& s1, double& s2) const {
+    if (!w_.active()) return 1.0;
+    double az = 0.0, G = 0.0;
+    if (exact_) {
+      w_.azimuth_terms(kr, ky_, az, G);
+    } else {
+      const double u = step_ > 0.0 ? std::clamp((kr - k0_) / step_, 0.0, kNodes - 1.0) : 0.0;
+      const auto i = std::min(static_cast<std::size_t>(u), static_cast<std::size_t>(kNodes - 2));
+      const double t = u - static_cast<double>(i);
+      az = az_[i] + t * (az_[i + 1] - az_[i]);
+      G = g_[i] + t * (g_[i + 1] - g_[i]);
+    }
+    const double wv = rangeWeight * az;
+    if (std::abs(kr - w_.kr0) < w_.normBand) {
+      s1 += G;
+      s2 += wv * wv * G;
+    }
+    return wv;
+  }
+
+ private:
+  const Weighting& w_;
+  double k0_ = 0.0, step_ = 0.0, ky_ = 0.0;
+  bool exact_ = false;
+  std::array<double, kNodes> az_{}, g_{};
+};
 Weighting make_weighting(const wkparm& wk, bool useRange) {
   Weighting w;
   double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
@@ -270,11 +311,12 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
   for (int j = 0; j < L; ++j) {
     fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
     const double y = ky[static_cast<std::size_t>(j)];
+    const LineWeight lw(w, y, kr0 - (n / 2) * B / n, kr0 + (n - 1 - n / 2) * B / n);
     double s1 = 0.0, s2 = 0.0;
     for (int i = 0; i < n; ++i) {
       const double k = kr[static_cast<std::size_t>(i)];
       const double phi = (y - ky0) * sa + (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k - kr0) * sr;
-      row[i] = rotate(row[i], phi, w.weight(k, y, wr[static_cast<std::size_t>(i)], s1, s2));
+      row[i] = rotate(row[i], phi, lw.weight(k, wr[static_cast<std::size_t>(i)], s1, s2));
     }
   }
   dsp::fft_c(n, n, L, L, -1, 0, wk.data);
@@ -335,10 +377,11 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
       const int m1 = std::max(0, static_cast<int>(std::floor(bin(i1))));
       const int m2 = std::min(M2 - 1, static_cast<int>(std::floor(bin(i2))) + 1);
       double s1 = 0.0, s2 = 0.0;
+      const LineWeight lw(w, y, kr0 + s + m1 * dk, kr0 + s + m2 * dk);
       for (int m = m1; m <= m2; ++m) {
         const double k = kr0 + s + m * dk;
         const double phi = (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k + r - kr0) * sr;
-        z[static_cast<std::size_t>(m)] = rotate(z[static_cast<std::size_t>(m)], phi, w.weight(k, y, 1.0, s1, s2));
+        z[static_cast<std::size_t>(m)] = rotate(z[static_cast<std::size_t>(m)], phi, lw.weight(k, 1.0, s1, s2));
       }
       sums[static_cast<std::size_t>(j)] = {s1, s2};
       std::fill(out.begin(), out.end(), fcomplex{});
@@ -417,10 +460,11 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
       dsp::pfft_c(fwd, std::span<fcomplex>(line, static_cast<std::size_t>(N)));
       dsp::fftshift(std::span<fcomplex>(line, static_cast<std::size_t>(N)), N, 1);
       double s1 = 0.0, s2 = 0.0;
+      const LineWeight lw(w, y, krs, kre);
       for (int m = 0; m < N; ++m) {
         const double k = krs + m * dk;
         const double phi = (std::sqrt(k * k - y * y) - kx0) * (wk.R0 - q) - (k - kr0) * (sr - P * dr) + (y - ky0) * sa;
-        line[m] = rotate(line[m], phi, w.weight(k, y, wr[static_cast<std::size_t>(m)], s1, s2));
+        line[m] = rotate(line[m], phi, lw.weight(k, wr[static_cast<std::size_t>(m)], s1, s2));
       }
       sums[static_cast<std::size_t>(j)] = {s1, s2};
       std::fill(out.begin(), out.end(), fcomplex{});
