@@ -1,12 +1,15 @@
 // Doppler centroid estimation of a range-compressed image mode scene, in core mode: the whole
-// estimator (block statistics, polynomial, WDAR and MLBF on their blocks, result file) and the
-// block statistics alone. A full scene (about 30 000 lines of 5 000 samples, 1.2 GB of samples)
+// estimator (block statistics, polynomial, WDAR and MLBF on their blocks, result file), the
+// block statistics alone and the two ambiguity estimators alone on the blocks the estimator
+// chose. A full scene (about 30 000 lines of 5 000 samples, 1.2 GB of samples)
 // is scaled to 8 192 lines of 5 120 samples; items are lines, so items_per_second is lines per
 // second and scales to the full size. The scene repeats a simulated tile of 2 048 lines with a
 // bright near-range part, so that both ambiguity estimators have blocks to work on. Block
-// statistics run on the OpenMP threads (OMP_NUM_THREADS).
+// statistics and the blocks of each ambiguity estimator run on the OpenMP threads
+// (OMP_NUM_THREADS); the results do not depend on their number.
 #include <benchmark/benchmark.h>
 
+#include <array>
 #include <filesystem>
 #include <vector>
 
@@ -92,6 +95,29 @@ void BM_BlockStatistics(benchmark::State& state) {
   state.SetItemsProcessed(state.iterations() * kLines);
 }
 BENCHMARK(BM_BlockStatistics)->Unit(benchmark::kMillisecond)->UseRealTime();
+
+// MLBF on Nbestblocks blocks (Nummlbf look pairs each) and WDAR on Nwdarblocks blocks, with
+// their inits, as the estimator runs them; items are the scene's lines, as above.
+void BM_AmbiguityEstimators(benchmark::State& state) {
+  dcestconf c = config(1);
+  dcimage image = testing::image_of(scene().shape);
+  DopplerPoly poly{};
+  if (getnadcpoly(image, c, poly) != 0 || c.mlbfBlocks.empty() || c.wdarBlocks.empty()) {
+    state.SkipWithError("no blocks for the ambiguity estimators");
+    return;
+  }
+  // The polynomial in cycles of sample and line indices, as the estimator hands it over.
+  const double prf = image.prf, fs = c.fs;
+  const std::array<double, 7> coef = {poly[0] / prf,        poly[1] / (prf * fs), poly[2] / (prf * prf), poly[3] / (prf * prf * fs),
+                                      poly[4] / (prf * fs * fs), poly[5] / (prf * fs * fs * fs),
+                                      poly[6] / (prf * fs * fs * fs * fs)};
+  for (auto _ : state) {
+    if (bestblocksproc(c, image, coef) != 0) state.SkipWithError("ambiguity estimators failed");
+    benchmark::DoNotOptimize(c.mlbfBlocks.data());
+  }
+  state.SetItemsProcessed(state.iterations() * kLines);
+}
+BENCHMARK(BM_AmbiguityEstimators)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 }  // namespace
 

@@ -1,11 +1,18 @@
 // PRF ambiguity of the centroid: choice of the blocks for the two estimators from the contrast
 // map, their trimmed statistics and the decision between them and the orbit geometry.
 #include <algorithm>
+#include <bit>
 #include <cmath>
+#include <cstdint>
 #include <cstdio>
 #include <fstream>
 #include <numeric>
+#include <string>
 #include <vector>
+
+#ifdef _OPENMP
+#include <omp.h>
+#endif
 
 #include "base/diagnostics.hpp"
 #include "doppler/dcest.hpp"
@@ -176,36 +183,122 @@ int topNpoints(std::span<const float> map, int width, int height, int N, int bw,
   return static_cast<int>(points.size());
 }
 
+namespace {
+
+bool block_inside(const dcestconf& conf, const dcimage& image, int firstLine, int firstSample) {
+  return firstLine >= 0 && firstSample >= 0 && static_cast<int64_t>(firstLine) + conf.Blockl <= image.lines &&
+         static_cast<int64_t>(firstSample) + conf.Blocks <= image.samples;
+}
+
+#if defined(__GNUC__) && defined(__x86_64__) && !defined(__SANITIZE_ADDRESS__)
+#define SAR_COPY_KERNEL [[gnu::target_clones("avx512f", "avx2", "default")]]
+#else
+#define SAR_COPY_KERNEL
+#endif
+
+/// Copies n samples; a sample with a part that is not finite (all exponent bits set) becomes 0.
+SAR_COPY_KERNEL void copy_finite(const fcomplex* __restrict src, fcomplex* __restrict dst, int n) {
+  constexpr std::uint32_t kExponent = 0x7f800000u;
+  for (int s = 0; s < n; ++s) {
+    const std::uint32_t re = std::bit_cast<std::uint32_t>(src[s].real());
+    const std::uint32_t im = std::bit_cast<std::uint32_t>(src[s].imag());
+    const std::uint32_t keep = ((re & kExponent) == kExponent || (im & kExponent) == kExponent) ? 0u : ~0u;
+    dst[s] = fcomplex(std::bit_cast<float>(re & keep), std::bit_cast<float>(im & keep));
+  }
+}
+
+/// Copies a block that lies inside the core matrix; non-finite samples become 0.
+void copy_core_block(const dcestconf& conf, const dcimage& image, int firstLine, int firstSample,
+                     std::vector<fcomplex>& block) {
+  const int ns = conf.Blocks, nl = conf.Blockl;
+  block.resize(static_cast<std::size_t>(ns) * static_cast<std::size_t>(nl));
+  const int64_t samples = image.samples;
+  for (int l = 0; l < nl; ++l) {
+    const fcomplex* src = conf.coreMatrix.data() + (static_cast<int64_t>(firstLine) + l) * samples + firstSample;
+    copy_finite(src, block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(ns), ns);
+  }
+}
+
+/// Runs an estimator on n blocks, spread over the OpenMP threads (each block is computed alone,
+/// so the results do not depend on the thread count). Blocks that come from a file are read on
+/// the calling thread, which alone may report, a few per thread at a time (`fromFile`); blocks
+/// of the core matrix are only checked there and copied by the thread that estimates them,
+/// all in one go. The block headers (`title`, with the block's number and n) and the
+/// estimator's messages come out in block order, as from a run of one block after the other,
+/// and the run stops at the first failing block with its status. `read(i, block)` gives a
+/// status; `estimate(i, block, own, log)` likewise, with `own` a buffer of its thread.
+template <class Read, class Estimate>
+int run_blocks(int n, const char* title, bool fromFile, Read read, Estimate estimate) {
+  int threads = 1;
+#ifdef _OPENMP
+  threads = omp_get_max_threads();
+#endif
+  const int batch = std::max(1, fromFile ? 2 * threads : n);
+  std::vector<std::vector<fcomplex>> blocks(static_cast<std::size_t>(fromFile ? batch : 1));
+  std::vector<std::string> logs(static_cast<std::size_t>(batch));
+  std::vector<int> status(static_cast<std::size_t>(batch), 0);
+  auto slot = [&](int k) -> std::vector<fcomplex>& { return blocks[fromFile ? static_cast<std::size_t>(k) : 0]; };
+  for (int first = 0; first < n; first += batch) {
+    const int count = std::min(batch, n - first);
+    int ready = count, readStatus = 0;
+    for (int k = 0; k < count; ++k) {
+      if (int st = read(first + k, slot(k))) {
+        ready = k;
+        readStatus = st;
+        break;
+      }
+    }
+#pragma omp parallel if (ready > 1)
+    {
+      std::vector<fcomplex> own;
+#pragma omp for schedule(dynamic, 1)
+      for (int k = 0; k < ready; ++k) {
+        const std::size_t i = static_cast<std::size_t>(k);
+        logs[i].clear();
+        status[i] = estimate(first + k, slot(k), own, logs[i]);
+      }
+    }
+    for (int k = 0; k < ready; ++k) {
+      std::printf(title, first + k + 1, n);
+      std::fputs(logs[static_cast<std::size_t>(k)].c_str(), stdout);
+      if (int st = status[static_cast<std::size_t>(k)]) return st;
+    }
+    if (ready < count) {
+      std::printf(title, first + ready + 1, n);
+      return readStatus;
+    }
+  }
+  return 0;
+}
+
+}  // namespace
+
 int read_block(const dcestconf& conf, const dcimage& image, int firstLine, int firstSample,
                std::vector<fcomplex>& block) {
   const int ns = conf.Blocks, nl = conf.Blockl;
-  if (firstLine < 0 || firstSample < 0 || static_cast<int64_t>(firstLine) + nl > image.lines ||
-      static_cast<int64_t>(firstSample) + ns > image.samples) {
+  if (!block_inside(conf, image, firstLine, firstSample)) {
     base::report(base::kReportError, "read_block: the block lies outside the image");
     return 10;
   }
+  if (conf.Flag_incore) {
+    copy_core_block(conf, image, firstLine, firstSample, block);
+    return 0;
+  }
   block.assign(static_cast<std::size_t>(ns) * static_cast<std::size_t>(nl), fcomplex(0.0f, 0.0f));
   const int64_t samples = image.samples;
-  if (conf.Flag_incore) {
-    for (int l = 0; l < nl; ++l) {
-      const fcomplex* src = conf.coreMatrix.data() + (static_cast<int64_t>(firstLine) + l) * samples + firstSample;
-      std::copy(src, src + ns, block.begin() + static_cast<std::ptrdiff_t>(l) * ns);
-    }
-  } else {
-    std::ifstream in(image.path, std::ios::binary);
+  std::ifstream in(image.path, std::ios::binary);
+  if (!in) {
+    base::report(base::kReportError, "Cannot open the range-compressed file " + image.path);
+    return 2;
+  }
+  for (int l = 0; l < nl; ++l) {
+    const int64_t offset = ((static_cast<int64_t>(firstLine) + l) * samples + firstSample) * 8;
+    in.seekg(static_cast<std::streamoff>(offset));
+    in.read(reinterpret_cast<char*>(block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(ns)),
+            static_cast<std::streamsize>(ns) * 8);
     if (!in) {
-      base::report(base::kReportError, "Cannot open the range-compressed file " + image.path);
+      base::report(base::kReportError, "The range-compressed file is shorter than its description: " + image.path);
       return 2;
-    }
-    for (int l = 0; l < nl; ++l) {
-      const int64_t offset = ((static_cast<int64_t>(firstLine) + l) * samples + firstSample) * 8;
-      in.seekg(static_cast<std::streamoff>(offset));
-      in.read(reinterpret_cast<char*>(block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(ns)),
-              static_cast<std::streamsize>(ns) * 8);
-      if (!in) {
-        base::report(base::kReportError, "The range-compressed file is shorter than its description: " + image.path);
-        return 2;
-      }
     }
   }
   for (auto& v : block)
@@ -215,10 +308,26 @@ int read_block(const dcestconf& conf, const dcimage& image, int firstLine, int f
 
 int bestblocksproc(dcestconf& conf, const dcimage& image, std::span<const double> coef) {
   base::Frame frame("bestblocksproc");
-  std::vector<fcomplex> block;
   auto corner = [&](int sample, int line, int& top, int& left) {
     top = std::clamp(line - conf.Blockl / 2, 0, std::max(0, image.lines - conf.Blockl));
     left = std::clamp(sample - conf.Blocks / 2, 0, std::max(0, image.samples - conf.Blocks));
+  };
+  // A block of the core matrix is copied by the thread that estimates it; a file is read on
+  // this thread.
+  const bool fromFile = !conf.Flag_incore;
+  auto read = [&](int sample, int line, std::vector<fcomplex>& block) {
+    int top = 0, left = 0;
+    corner(sample, line, top, left);
+    if (!fromFile && block_inside(conf, image, top, left)) return 0;
+    return read_block(conf, image, top, left, block);
+  };
+  auto load = [&](int sample, int line, const std::vector<fcomplex>& read,
+                  std::vector<fcomplex>& own) -> const std::vector<fcomplex>& {
+    if (fromFile) return read;
+    int top = 0, left = 0;
+    corner(sample, line, top, left);
+    copy_core_block(conf, image, top, left, own);
+    return own;
   };
   if (!conf.mlbfBlocks.empty()) {
     if (int st = frame.check(multimlbf_init(conf))) return st;
@@ -226,36 +335,33 @@ int bestblocksproc(dcestconf& conf, const dcimage& image, std::span<const double
       mlbf_free(conf);
       return st;
     }
-    const int n = static_cast<int>(conf.mlbfBlocks.size());
-    for (int i = 0; i < n; ++i) {
-      std::printf("\nProcessing MLBF best block %d of %d.\n", i + 1, n);
-      int top = 0, left = 0;
-      corner(conf.mlbfBlocks[static_cast<std::size_t>(i)].sample, conf.mlbfBlocks[static_cast<std::size_t>(i)].line, top, left);
-      int st = read_block(conf, image, top, left, block);
-      if (st == 0) st = multimlbf(conf, block, i);
-      if (frame.check(st)) {
-        mlbf_free(conf);
-        return st;
-      }
-    }
+    const int st = run_blocks(
+        static_cast<int>(conf.mlbfBlocks.size()), "\nProcessing MLBF best block %d of %d.\n", fromFile,
+        [&](int i, std::vector<fcomplex>& block) {
+          const auto& b = conf.mlbfBlocks[static_cast<std::size_t>(i)];
+          return read(b.sample, b.line, block);
+        },
+        [&](int i, const std::vector<fcomplex>& block, std::vector<fcomplex>& own, std::string& log) {
+          const auto& b = conf.mlbfBlocks[static_cast<std::size_t>(i)];
+          return multimlbf(conf, load(b.sample, b.line, block, own), i, &log);
+        });
     mlbf_free(conf);
+    if (frame.check(st)) return st;
   }
   if (!conf.wdarBlocks.empty()) {
     if (int st = frame.check(wdar_init(conf))) return st;
-    const int n = static_cast<int>(conf.wdarBlocks.size());
-    for (int i = 0; i < n; ++i) {
-      std::printf("\nProcessing WDAR best block %d of %d.\n", i + 1, n);
-      auto& b = conf.wdarBlocks[static_cast<std::size_t>(i)];
-      int top = 0, left = 0;
-      corner(b.sample, b.line, top, left);
-      int st = read_block(conf, image, top, left, block);
-      if (st == 0) st = wdar_estimate(conf, block, dccycles(coef, b.sample, b.line), b.estimate);
-      if (frame.check(st)) {
-        wdar_free(conf);
-        return st;
-      }
-    }
+    const int st = run_blocks(
+        static_cast<int>(conf.wdarBlocks.size()), "\nProcessing WDAR best block %d of %d.\n", fromFile,
+        [&](int i, std::vector<fcomplex>& block) {
+          const auto& b = conf.wdarBlocks[static_cast<std::size_t>(i)];
+          return read(b.sample, b.line, block);
+        },
+        [&](int i, const std::vector<fcomplex>& block, std::vector<fcomplex>& own, std::string&) {
+          auto& b = conf.wdarBlocks[static_cast<std::size_t>(i)];
+          return wdar_estimate(conf, load(b.sample, b.line, block, own), dccycles(coef, b.sample, b.line), b.estimate);
+        });
     wdar_free(conf);
+    if (frame.check(st)) return st;
   }
   return 0;
 }

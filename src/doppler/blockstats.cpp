@@ -9,6 +9,11 @@
 #include <string>
 #include <vector>
 
+#if defined(__SSE2__)
+#include <emmintrin.h>
+#include <xmmintrin.h>
+#endif
+
 #include "base/diagnostics.hpp"
 #include "base/run_services.hpp"
 #include "doppler/dcest.hpp"
@@ -22,8 +27,6 @@ int rejected(const char* text) {
   base::report(base::kReportError, text);
   return 10;
 }
-
-bool finite(const fcomplex& v) { return std::isfinite(v.real()) && std::isfinite(v.imag()); }
 
 /// Reads `rows` lines of the range file starting at `firstLine` into `buffer`.
 int read_rows(const std::string& path, int64_t samples, int64_t firstLine, int64_t rows, std::vector<fcomplex>& buffer) {
@@ -43,32 +46,229 @@ int read_rows(const std::string& path, int64_t samples, int64_t firstLine, int64
   return 0;
 }
 
-/// Copies one block out of a matrix of `pitch` samples a row, with non-finite samples set to 0
-/// (lines filled with NaN by the extraction carry no signal).
-void copy_block(const fcomplex* topLeft, int64_t pitch, int blocks, int blockl, std::vector<fcomplex>& block) {
-  block.resize(static_cast<std::size_t>(blocks) * static_cast<std::size_t>(blockl));
-  for (int l = 0; l < blockl; ++l) {
-    const fcomplex* src = topLeft + static_cast<int64_t>(l) * pitch;
-    fcomplex* dst = block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(blocks);
-    for (int s = 0; s < blocks; ++s) dst[s] = finite(src[s]) ? src[s] : fcomplex(0.0f, 0.0f);
+/// Real and imaginary parts of n samples; a sample with a non-finite part becomes 0. The
+/// same samples of a line further down (`ahead`, may be null) are asked for meanwhile, a
+/// cache line per cache line read: the lines of a block lie far apart in the image, and each
+/// would start a new stream for the hardware prefetcher.
+void split(const fcomplex* src, const fcomplex* ahead, int n, float* re, float* im) {
+  int s = 0;
+#if defined(__SSE2__)
+  const __m128i exponent = _mm_set1_epi32(0x7f800000);
+  for (; s + 4 <= n; s += 4) {
+    if (ahead && s % 8 == 0) _mm_prefetch(reinterpret_cast<const char*>(ahead + s), _MM_HINT_T0);
+    const __m128 a = _mm_loadu_ps(reinterpret_cast<const float*>(src + s));      // r0 i0 r1 i1
+    const __m128 b = _mm_loadu_ps(reinterpret_cast<const float*>(src + s + 2));  // r2 i2 r3 i3
+    // A part is not finite when its exponent bits are all set; the sample goes with it.
+    __m128i badA = _mm_cmpeq_epi32(_mm_and_si128(_mm_castps_si128(a), exponent), exponent);
+    __m128i badB = _mm_cmpeq_epi32(_mm_and_si128(_mm_castps_si128(b), exponent), exponent);
+    badA = _mm_or_si128(badA, _mm_shuffle_epi32(badA, _MM_SHUFFLE(2, 3, 0, 1)));
+    badB = _mm_or_si128(badB, _mm_shuffle_epi32(badB, _MM_SHUFFLE(2, 3, 0, 1)));
+    const __m128 x = _mm_andnot_ps(_mm_castsi128_ps(badA), a);
+    const __m128 y = _mm_andnot_ps(_mm_castsi128_ps(badB), b);
+    _mm_storeu_ps(re + s, _mm_shuffle_ps(x, y, _MM_SHUFFLE(2, 0, 2, 0)));
+    _mm_storeu_ps(im + s, _mm_shuffle_ps(x, y, _MM_SHUFFLE(3, 1, 3, 1)));
+  }
+#else
+  (void)ahead;
+#endif
+  for (; s < n; ++s) {
+    const bool ok = std::isfinite(src[s].real()) && std::isfinite(src[s].imag());
+    re[s] = ok ? src[s].real() : 0.0f;
+    im[s] = ok ? src[s].imag() : 0.0f;
   }
 }
 
-/// Adds a block's power and squared power to the patch maps. Each patch lies in exactly one
-/// block, so blocks may be added concurrently and in any order.
-void add_to_patch_maps(dcestconf& conf, std::span<const fcomplex> block, int left, int top) {
-  const float area = static_cast<float>(conf.Patchs) * static_cast<float>(conf.Patchl);
-  for (int l = 0; l < conf.Blockl; ++l) {
-    const int64_t rowBase = static_cast<int64_t>((top + l) / conf.Patchl) * conf.patchesAcross;
-    const fcomplex* row = block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(conf.Blocks);
-    for (int s = 0; s < conf.Blocks; ++s) {
-      const std::size_t k = static_cast<std::size_t>(rowBase + (left + s) / conf.Patchs);
-      const float w = std::norm(row[s]);
-      conf.powerMap[k] += w / area;
-      conf.contrastMap[k] += w * w / area;
+// The per-line sums are built for the widest vector unit the processor has: every lane does
+// the operations of the plain loop in the same order, and no multiply-add contraction is
+// allowed in this library, so the choice changes no bit of the result.
+#if defined(__GNUC__) && defined(__x86_64__) && !defined(__SANITIZE_ADDRESS__)
+#define SAR_LINE_KERNEL [[gnu::target_clones("avx512f", "avx2", "default")]]
+#else
+#define SAR_LINE_KERNEL
+#endif
+
+/// Power and squared power of every range bin of one line, and with the previous line
+/// (prevRe, prevIm not null) the lag-one product conj(previous) x.
+SAR_LINE_KERNEL void line_sums(int n, const float* __restrict re, const float* __restrict im,
+                               const float* __restrict prevRe, const float* __restrict prevIm, double* __restrict p,
+                               double* __restrict f, double* __restrict rr, double* __restrict ri) {
+  if (prevRe) {
+    for (int s = 0; s < n; ++s) {
+      const double xr = prevRe[s], xi = prevIm[s], yr = re[s], yi = im[s];
+      const double w = yr * yr + yi * yi;
+      p[s] += w;
+      f[s] += w * w;
+      rr[s] += xr * yr + xi * yi;
+      ri[s] += xr * yi - xi * yr;
+    }
+  } else {
+    for (int s = 0; s < n; ++s) {
+      const double yr = re[s], yi = im[s];
+      const double w = yr * yr + yi * yi;
+      p[s] += w;
+      f[s] += w * w;
     }
   }
 }
+
+/// Patch terms of one line: |x|^2 / area and |x|^4 / area in single precision (a power of two
+/// area as a multiplication by its exact inverse).
+SAR_LINE_KERNEL void patch_terms(int n, const float* __restrict re, const float* __restrict im, float* __restrict w,
+                                 float* __restrict w2, float area, bool pow2) {
+  if (pow2) {
+    const float inverse = 1.0f / area;
+    for (int s = 0; s < n; ++s) {
+      const float v = re[s] * re[s] + im[s] * im[s];
+      w[s] = v * inverse;
+      w2[s] = (v * v) * inverse;
+    }
+  } else {
+    for (int s = 0; s < n; ++s) {
+      const float v = re[s] * re[s] + im[s] * im[s];
+      w[s] = v / area;
+      w2[s] = (v * v) / area;
+    }
+  }
+}
+
+/// One pass over a block in its matrix (`pitch` samples a row): the lag-one statistics of
+/// every range bin and, when maps are given, the block's share of the patch maps. Non-finite
+/// samples count as zero (lines filled with NaN by the extraction carry no signal).
+///
+/// The sums are those of a straightforward loop, term by term in the same order: per range
+/// bin in double over the lines, bins added in range order; per patch in float over its lines
+/// and, within a line, its samples. Only the layout differs: a line is split into real and
+/// imaginary parts once, and the per-bin sums and the patch terms run over whole lines.
+class BlockPass {
+ public:
+  /// Lines read ahead.
+  static constexpr int kAhead = 4;
+
+  BlockPass(int blocks, int blockl) : ns_(blocks), nl_(blockl) {
+    const std::size_t n = static_cast<std::size_t>(blocks);
+    for (auto* v : {&re_, &im_, &prevRe_, &prevIm_, &w_, &w2_}) v->resize(n);
+    for (auto* v : {&p_, &f_, &rr_, &ri_}) v->resize(n);
+  }
+
+  /// Patch maps of `across` patches a row, of patchs x patchl samples of `area` (float).
+  struct Maps {
+    float* power = nullptr;
+    float* contrast = nullptr;
+    int64_t across = 0;
+    int patchs = 1;
+    int patchl = 1;
+    float area = 1.0f;
+  };
+
+  /// The block with top-left corner `topLeft` at (left, top) of the image.
+  void run(const dcestconf& conf, const fcomplex* topLeft, int64_t pitch, dcblock& out, const Maps* maps, int left,
+           int top) {
+    const int ns = ns_;
+    std::fill(p_.begin(), p_.end(), 0.0);
+    std::fill(f_.begin(), f_.end(), 0.0);
+    std::fill(rr_.begin(), rr_.end(), 0.0);
+    std::fill(ri_.begin(), ri_.end(), 0.0);
+    // Division by a power of two is exact as a multiplication by its inverse.
+    int exponent = 0;
+    const bool pow2 = maps && std::frexp(maps->area, &exponent) == 0.5f;
+    for (int l = 0; l < nl_; ++l) {
+      const fcomplex* src = topLeft + static_cast<int64_t>(l) * pitch;
+      float* re = re_.data();
+      float* im = im_.data();
+      split(src, l + kAhead < nl_ ? src + kAhead * pitch : nullptr, ns, re, im);
+      line_sums(ns, re, im, l > 0 ? prevRe_.data() : nullptr, l > 0 ? prevIm_.data() : nullptr, p_.data(), f_.data(),
+                rr_.data(), ri_.data());
+      if (maps) add_line(*maps, pow2, left, top + l);
+      re_.swap(prevRe_);
+      im_.swap(prevIm_);
+    }
+    finish(conf, out);
+  }
+
+ private:
+  void add_line(const Maps& m, bool pow2, int left, int line) {
+    const int ns = ns_;
+    float* w = w_.data();
+    float* w2 = w2_.data();
+    patch_terms(ns, re_.data(), im_.data(), w, w2, m.area, pow2);
+    // The patches of the line, each summed in sample order.
+    const int64_t rowBase = static_cast<int64_t>(line / m.patchl) * m.across;
+    int s = 0;
+    if (left % m.patchs == 0) {
+      // Whole patches four at a time: four independent chains of additions.
+      const int width = m.patchs;
+      for (; s + 4 * width <= ns; s += 4 * width) {
+        const std::size_t k = static_cast<std::size_t>(rowBase + (left + s) / width);
+        float* pw = m.power + k;
+        float* cw = m.contrast + k;
+        float a0 = pw[0], a1 = pw[1], a2 = pw[2], a3 = pw[3];
+        float b0 = cw[0], b1 = cw[1], b2 = cw[2], b3 = cw[3];
+        const float* u = w + s;
+        const float* v = w2 + s;
+        for (int q = 0; q < width; ++q) {
+          a0 += u[q];
+          a1 += u[q + width];
+          a2 += u[q + 2 * width];
+          a3 += u[q + 3 * width];
+          b0 += v[q];
+          b1 += v[q + width];
+          b2 += v[q + 2 * width];
+          b3 += v[q + 3 * width];
+        }
+        pw[0] = a0;
+        pw[1] = a1;
+        pw[2] = a2;
+        pw[3] = a3;
+        cw[0] = b0;
+        cw[1] = b1;
+        cw[2] = b2;
+        cw[3] = b3;
+      }
+    }
+    while (s < ns) {
+      const int x = left + s;
+      const int end = std::min(ns, (x / m.patchs + 1) * m.patchs - left);
+      const std::size_t k = static_cast<std::size_t>(rowBase + x / m.patchs);
+      float a = m.power[k], b = m.contrast[k];
+      for (int t = s; t < end; ++t) {
+        a += w[t];
+        b += w2[t];
+      }
+      m.power[k] = a;
+      m.contrast[k] = b;
+      s = end;
+    }
+  }
+
+  void finish(const dcestconf& conf, dcblock& out) const {
+    const int ns = ns_, nl = nl_;
+    double P = 0.0, F = 0.0, Rr = 0.0, Ri = 0.0;
+    for (int s = 0; s < ns; ++s) {
+      P += p_[static_cast<std::size_t>(s)];
+      F += f_[static_cast<std::size_t>(s)];
+      Rr += rr_[static_cast<std::size_t>(s)];
+      Ri += ri_[static_cast<std::size_t>(s)];
+    }
+    out.valid = 0;
+    out.centroid = 0.0;
+    out.contrast = 0.0;
+    out.power = 0.0;
+    out.noise = 0.0;
+    if (!(F > 0.0) || !std::isfinite(F)) return;
+    const double pm = P / ns;
+    const double a = std::hypot(Rr, Ri) / ns;
+    if (!(a > 0.0) || !(pm / a < conf.Sthr)) return;
+    out.valid = 1;
+    out.centroid = std::atan2(Ri, Rr) / kTwoPi;
+    out.power = pm;
+    out.contrast = static_cast<double>(nl) * ns * F / (P * P);
+    out.noise = conf.r1 > 0.0 ? pm - (conf.r0 / conf.r1) * a : 0.0;
+  }
+
+  int ns_, nl_;
+  std::vector<float> re_, im_, prevRe_, prevIm_, w_, w2_;
+  std::vector<double> p_, f_, rr_, ri_;
+};
 
 /// Box filter of width w over n values taken `stride` apart: each output is the sum of the
 /// inputs from i - w/2 to i + w/2 inside the map, divided by w (edges read lower).
@@ -105,47 +305,13 @@ double bspline3(double x) {
 }
 
 void blockstats(const dcestconf& conf, std::span<const fcomplex> block, dcblock& out) {
-  const int ns = conf.Blocks;
-  const int nl = conf.Blockl;
-  // Per range bin sums in double, in line order; the bins are then added in range order, so
-  // a block's result does not depend on who computes it.
-  std::vector<double> p(static_cast<std::size_t>(ns), 0.0), f(p.size(), 0.0), rr(p.size(), 0.0), ri(p.size(), 0.0);
-  for (int l = 0; l < nl; ++l) {
-    const fcomplex* row = block.data() + static_cast<std::size_t>(l) * static_cast<std::size_t>(ns);
-    const fcomplex* next = l + 1 < nl ? row + ns : nullptr;
-    for (int s = 0; s < ns; ++s) {
-      const double xr = row[s].real(), xi = row[s].imag();
-      const double w = xr * xr + xi * xi;
-      p[static_cast<std::size_t>(s)] += w;
-      f[static_cast<std::size_t>(s)] += w * w;
-      if (next) {
-        const double yr = next[s].real(), yi = next[s].imag();
-        rr[static_cast<std::size_t>(s)] += xr * yr + xi * yi;  // conj(x) y
-        ri[static_cast<std::size_t>(s)] += xr * yi - xi * yr;
-      }
-    }
+  const int ns = conf.Blocks, nl = conf.Blockl;
+  if (ns < 1 || nl < 1 || block.size() < static_cast<std::size_t>(ns) * static_cast<std::size_t>(nl)) {
+    out.valid = 0;
+    return;
   }
-  double P = 0.0, F = 0.0, Rr = 0.0, Ri = 0.0;
-  for (std::size_t s = 0; s < p.size(); ++s) {
-    P += p[s];
-    F += f[s];
-    Rr += rr[s];
-    Ri += ri[s];
-  }
-  out.valid = 0;
-  out.centroid = 0.0;
-  out.contrast = 0.0;
-  out.power = 0.0;
-  out.noise = 0.0;
-  if (!(F > 0.0) || !std::isfinite(F)) return;
-  const double pm = P / ns;
-  const double a = std::hypot(Rr, Ri) / ns;
-  if (!(a > 0.0) || !(pm / a < conf.Sthr)) return;
-  out.valid = 1;
-  out.centroid = std::atan2(Ri, Rr) / kTwoPi;
-  out.power = pm;
-  out.contrast = static_cast<double>(nl) * ns * F / (P * P);
-  out.noise = conf.r1 > 0.0 ? pm - (conf.r0 / conf.r1) * a : 0.0;
+  BlockPass pass(ns, nl);
+  pass.run(conf, block.data(), ns, out, nullptr, 0, 0);
 }
 
 int setprocbuf(dcestconf& conf, dcimage& image) {
@@ -205,22 +371,28 @@ int getnadcbins(dcestconf& conf, const dcimage& image) {
       chunk = rowBuffer.data();
     }
     const int count = rows * nc;
+    BlockPass::Maps maps;
+    maps.power = conf.powerMap.data();
+    maps.contrast = conf.contrastMap.data();
+    maps.across = conf.patchesAcross;
+    maps.patchs = conf.Patchs;
+    maps.patchl = conf.Patchl;
+    maps.area = static_cast<float>(conf.Patchs) * static_cast<float>(conf.Patchl);
+    // Each patch lies in exactly one block, so blocks may be added concurrently to the maps.
 #pragma omp parallel
     {
-      std::vector<fcomplex> block;
+      BlockPass pass(conf.Blocks, conf.Blockl);
 #pragma omp for schedule(static)
       for (int k = 0; k < count; ++k) {
         const int r = k / nc;
         const int c = k - r * nc;
         const int left = c * conf.Blocks;
-        const int topInChunk = r * conf.Blockl;
-        copy_block(chunk + static_cast<int64_t>(topInChunk) * samples + left, samples, conf.Blocks, conf.Blockl, block);
+        const int top = (firstRow + r) * conf.Blockl;
         dcblock& b = conf.blocks[static_cast<std::size_t>(firstRow + r) * static_cast<std::size_t>(nc) +
                                  static_cast<std::size_t>(c)];
-        blockstats(conf, block, b);
+        pass.run(conf, chunk + static_cast<int64_t>(r) * conf.Blockl * samples + left, samples, b, &maps, left, top);
         b.sample = left + conf.Blocks / 2;
-        b.line = (firstRow + r) * conf.Blockl + conf.Blockl / 2;
-        add_to_patch_maps(conf, block, left, (firstRow + r) * conf.Blockl);
+        b.line = top + conf.Blockl / 2;
       }
     }
     if (conf.progressFlag) base::waitbar_update(100.0 * (firstRow + rows) / nr);

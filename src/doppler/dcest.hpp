@@ -75,6 +75,9 @@ double dccycles(std::span<const double> coef, double sample, double line);
 /// 1 unresolved (the field then holds the geometric fallback), 10 a bad `Amb_flag` or no
 /// MLBF block wanted. `coef` is the polynomial in cycles (dccycles layout).
 int estambiguity(dcestconf& conf, const dcimage& image, std::span<const double> coef);
+/// MLBF on conf.mlbfBlocks, then WDAR on conf.wdarBlocks. The blocks of each estimator are
+/// spread over the OpenMP threads; the results and the messages, printed in block order, do
+/// not depend on the thread count.
 int bestblocksproc(dcestconf& conf, const dcimage& image, std::span<const double> coef);
 int dcnastd(dcestconf& conf);
 /// Trimmed mean, standard deviation and count of `values` (loop of growing trims).
@@ -101,13 +104,16 @@ int read_block(const dcestconf& conf, const dcimage& image, int firstLine, int f
 /// Range frequency bins used by WDAR: signed index k with |k| <= RgBand Blocks / 2.
 std::vector<char> wdar_bins(int blocks, double rgBand);
 int wdar_init(dcestconf& conf);
-/// Absolute centroid of one block in PRF; -1 without wdar_init.
-int wdar_estimate(dcestconf& conf, std::span<const fcomplex> block, double centreCycles, double& estimate);
+/// Absolute centroid of one block in PRF; -1 without wdar_init, 10 for a short block. Blocks
+/// may be run concurrently.
+int wdar_estimate(const dcestconf& conf, std::span<const fcomplex> block, double centreCycles, double& estimate);
 void wdar_free(dcestconf& conf);
 int multimlbf_init(dcestconf& conf);
 int cirpZ_init(dcestconf& conf);
-/// Beat frequency estimates of MLBF block `index` from `block`; 1 without the inits.
-int multimlbf(dcestconf& conf, std::span<const fcomplex> block, int index);
+/// Beat frequency estimates of MLBF block `index` from `block`; 1 without the inits, 10 for a
+/// bad index or a short block. The progress messages go to `log` when given (stdout
+/// otherwise). Blocks may be run concurrently: each writes only its own record.
+int multimlbf(dcestconf& conf, std::span<const fcomplex> block, int index, std::string* log = nullptr);
 void mlbf_free(dcestconf& conf);
 
 // ---------------------------------------------------------------- result file

@@ -140,10 +140,22 @@ int getdccoef(dcestconf& conf, const std::array<double, 3>& plane, std::span<dou
   }
   std::array<double, 7> a{};
   std::array<int, 7> mask{};
+  // A narrow or short scene holds too few block columns or rows to fix every term: a power of
+  // the range index needs more distinct columns than its degree, the azimuth term two rows.
+  // Such terms are left out of the fit (and stay zero) instead of making it singular.
+  std::vector<double> columns(xs), rows(ys);
+  std::sort(columns.begin(), columns.end());
+  std::sort(rows.begin(), rows.end());
+  const auto nx = static_cast<int>(std::unique(columns.begin(), columns.end()) - columns.begin());
+  const auto ny = static_cast<int>(std::unique(rows.begin(), rows.end()) - rows.begin());
+  const std::array<bool, 7> determined = {true, nx > 1, ny > 1, nx > 1 && ny > 1, nx > 2, nx > 3, nx > 4};
   bool any = false;
-  for (int j = 0; j < 7; ++j) {
-    mask[static_cast<std::size_t>(j)] = conf.Pol_Weights[static_cast<std::size_t>(j)] != 0 ? 1 : 0;
-    any = any || mask[static_cast<std::size_t>(j)];
+  for (std::size_t j = 0; j < 7; ++j) {
+    mask[j] = conf.Pol_Weights[j] != 0 && determined[j] ? 1 : 0;
+    if (conf.Pol_Weights[j] != 0 && !determined[j])
+      base::report(base::kReportWarning, "Doppler centroid term " + std::to_string(j) +
+                                             " left out: too few block columns or rows to determine it");
+    any = any || mask[j];
   }
   if (any) {
     std::vector<double> index(xs.size());

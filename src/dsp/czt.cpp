@@ -1,13 +1,57 @@
 #include "dsp/czt.hpp"
 
 #include <algorithm>
+#include <bit>
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
+#include <mutex>
 #include <stdexcept>
 #include <vector>
 
+#if defined(__SSE2__)
+#include <emmintrin.h>
+#endif
+#if defined(__GNUC__) && defined(__x86_64__)
+#include <immintrin.h>
+#endif
+
 namespace sar::dsp {
+namespace detail {
+
+/// The tables of one step a: the quadratic phase q[i] = i^2 a / 2 for i = 1-N .. max(N, M) - 1
+/// (stored at i + N - 1), the output chirp exp(j q[k]) for k = 0..M-1 and the forward
+/// transform of the kernel exp(-j q[i]) for i = 1-N .. M-1, zero padded to L.
+struct CztKernel {
+  std::uint64_t aBits = 0;
+  std::vector<double> q;
+  cvector outChirp;
+  cvector kernel;
+};
+
+/// The input chirp exp(j (q[n] - n b)), n = 0..N-1, of one step and start.
+struct CztInputChirp {
+  std::uint64_t aBits = 0;
+  std::uint64_t bBits = 0;
+  cvector d;
+};
+
+class CztTables {
+ public:
+  std::shared_ptr<const CztKernel> kernel(const czt_plan& plan, double a);
+  std::shared_ptr<const CztInputChirp> input(const czt_plan& plan, const CztKernel& k, double b);
+
+ private:
+  // A plan seldom sees more than one step; a few are kept so that alternating steps do not
+  // rebuild the kernel on every call.
+  static constexpr std::size_t kKernels = 4;
+  std::mutex mutex_;
+  std::vector<std::shared_ptr<const CztKernel>> kernels_;  // most recently made first
+  std::shared_ptr<const CztInputChirp> input_;
+};
+
+}  // namespace detail
+
 namespace {
 
 fcomplex mul(fcomplex u, fcomplex v) {
@@ -17,6 +61,101 @@ fcomplex mul(fcomplex u, fcomplex v) {
 
 fcomplex phasor(double phase) { return {static_cast<float>(std::cos(phase)), static_cast<float>(std::sin(phase))}; }
 
+// out[k] = mul(u[k], v[k]) for k < n; out may be u or v. The products of float operands are
+// exact in double, so the plain formula (ar br - ai bi, ai br + ar bi) gives mul's result
+// whenever it is not NaN in both parts; only then (infinite operands) is the library's
+// recovery asked for. The vector versions do the same operations lane by lane; none of them
+// is compiled with fused multiply-add, so all give the same bits.
+void multiply_base(const fcomplex* u, const fcomplex* v, fcomplex* out, int n) {
+#if defined(__SSE2__)
+  const __m128d flipReal = _mm_set_pd(0.0, -0.0);
+  for (int k = 0; k < n; ++k) {
+    const __m128d a = _mm_cvtps_pd(_mm_castpd_ps(_mm_load_sd(reinterpret_cast<const double*>(u + k))));
+    const __m128d b = _mm_cvtps_pd(_mm_castpd_ps(_mm_load_sd(reinterpret_cast<const double*>(v + k))));
+    // (ar br, ai br) + (-ai bi, ar bi)
+    const __m128d p1 = _mm_mul_pd(a, _mm_unpacklo_pd(b, b));
+    const __m128d p2 = _mm_xor_pd(_mm_mul_pd(_mm_shuffle_pd(a, a, 1), _mm_unpackhi_pd(b, b)), flipReal);
+    const __m128d r = _mm_add_pd(p1, p2);
+    if (_mm_movemask_pd(_mm_cmpunord_pd(r, r)) == 3) [[unlikely]] {
+      out[k] = mul(u[k], v[k]);
+    } else {
+      _mm_store_sd(reinterpret_cast<double*>(out + k), _mm_castps_pd(_mm_cvtpd_ps(r)));
+    }
+  }
+#else
+  for (int k = 0; k < n; ++k) {
+    const double ar = u[k].real(), ai = u[k].imag(), br = v[k].real(), bi = v[k].imag();
+    const double re = ar * br - ai * bi, im = ar * bi + ai * br;
+    out[k] = (std::isnan(re) && std::isnan(im)) ? mul(u[k], v[k]) : fcomplex(static_cast<float>(re), static_cast<float>(im));
+  }
+#endif
+}
+
+#if defined(__GNUC__) && defined(__x86_64__)
+#define SAR_CZT_AVX 1
+/// Two samples a step in 256-bit registers (AVX without FMA).
+[[gnu::target("avx")]] void multiply_avx(const fcomplex* u, const fcomplex* v, fcomplex* out, int n) {
+  const __m256d flipReal = _mm256_set_pd(0.0, -0.0, 0.0, -0.0);
+  int k = 0;
+  for (; k + 2 <= n; k += 2) {
+    const __m256d a = _mm256_cvtps_pd(_mm_loadu_ps(reinterpret_cast<const float*>(u + k)));
+    const __m256d b = _mm256_cvtps_pd(_mm_loadu_ps(reinterpret_cast<const float*>(v + k)));
+    const __m256d p1 = _mm256_mul_pd(a, _mm256_movedup_pd(b));
+    const __m256d p2 = _mm256_xor_pd(_mm256_mul_pd(_mm256_permute_pd(a, 0x5), _mm256_permute_pd(b, 0xf)), flipReal);
+    const __m256d r = _mm256_add_pd(p1, p2);
+    const int nan = _mm256_movemask_pd(_mm256_cmp_pd(r, r, _CMP_UNORD_Q));
+    if ((nan & (nan >> 1) & 0x5) != 0) [[unlikely]] {
+      const fcomplex x = mul(u[k], v[k]), y = mul(u[k + 1], v[k + 1]);
+      out[k] = x;
+      out[k + 1] = y;
+      continue;
+    }
+    _mm_storeu_ps(reinterpret_cast<float*>(out + k), _mm256_cvtpd_ps(r));
+  }
+  if (k < n) multiply_base(u + k, v + k, out + k, n - k);
+}
+
+/// Four samples a step in 512-bit registers. The products and the sum use the explicitly
+/// rounded forms, which are never fused into a multiply-add; the masked forms (all lanes set)
+/// stand for the plain ones, whose undefined pass-through operand makes this compiler warn.
+[[gnu::target("avx512f")]] void multiply_avx512(const fcomplex* u, const fcomplex* v, fcomplex* out, int n) {
+  constexpr int kRound = _MM_FROUND_TO_NEAREST_INT | _MM_FROUND_NO_EXC;
+  constexpr __mmask8 all = 0xff;
+  const __m512i flipReal = _mm512_set_epi64(0, INT64_MIN, 0, INT64_MIN, 0, INT64_MIN, 0, INT64_MIN);
+  int k = 0;
+  for (; k + 4 <= n; k += 4) {
+    const __m512d a = _mm512_maskz_cvtps_pd(all, _mm256_loadu_ps(reinterpret_cast<const float*>(u + k)));
+    const __m512d b = _mm512_maskz_cvtps_pd(all, _mm256_loadu_ps(reinterpret_cast<const float*>(v + k)));
+    const __m512d p1 = _mm512_maskz_mul_round_pd(all, a, _mm512_maskz_movedup_pd(all, b), kRound);
+    const __m512d p2 = _mm512_maskz_mul_round_pd(all, _mm512_maskz_permute_pd(all, a, 0x55), _mm512_maskz_permute_pd(all, b, 0xff), kRound);
+    const __m512d r = _mm512_maskz_add_round_pd(all, p1, _mm512_castsi512_pd(_mm512_xor_si512(_mm512_castpd_si512(p2), flipReal)), kRound);
+    const unsigned nan = _mm512_cmp_pd_mask(r, r, _CMP_UNORD_Q);
+    if ((nan & (nan >> 1) & 0x55u) != 0) [[unlikely]] {
+      for (int i = 0; i < 4; ++i) out[k + i] = mul(u[k + i], v[k + i]);
+      continue;
+    }
+    _mm256_storeu_ps(reinterpret_cast<float*>(out + k), _mm512_maskz_cvtpd_ps(all, r));
+  }
+  if (k < n) multiply_avx(u + k, v + k, out + k, n - k);
+}
+#endif
+
+using Multiply = void (*)(const fcomplex*, const fcomplex*, fcomplex*, int);
+
+Multiply pick_multiply() {
+#ifdef SAR_CZT_AVX
+  __builtin_cpu_init();
+  if (__builtin_cpu_supports("avx512f")) return multiply_avx512;
+  if (__builtin_cpu_supports("avx")) return multiply_avx;
+#endif
+  return multiply_base;
+}
+
+void multiply(const fcomplex* u, const fcomplex* v, fcomplex* out, int n) {
+  static const Multiply run = pick_multiply();
+  run(u, v, out, n);
+}
+
 void check_size(const char* which, std::size_t have, std::int64_t need) {
   if (static_cast<std::int64_t>(have) >= need) return;
   char msg[160];
@@ -25,7 +164,72 @@ void check_size(const char* which, std::size_t have, std::int64_t need) {
   throw std::length_error(msg);
 }
 
+/// Working row of one thread, reused from call to call (the transform length of the Stolt
+/// grid is too large for the allocator to keep it cheap).
+cvector& scratch(std::size_t n) {
+  thread_local cvector y;
+  if (y.size() < n) {
+    cvector().swap(y);
+    y.resize(n);
+  }
+  return y;
+}
+
 }  // namespace
+
+namespace detail {
+
+std::shared_ptr<const CztKernel> CztTables::kernel(const czt_plan& plan, double a) {
+  const std::uint64_t bits = std::bit_cast<std::uint64_t>(a);
+  {
+    std::lock_guard lock(mutex_);
+    for (const auto& k : kernels_)
+      if (k->aBits == bits) return k;
+  }
+  const int N = plan.N, M = plan.M, L = plan.L;
+  auto k = std::make_shared<CztKernel>();
+  k->aBits = bits;
+  const int P = std::max(N - 1, M - 1);
+  const int span = N + P;
+  k->q.resize(static_cast<std::size_t>(span));
+  for (int s = 0; s < span; ++s) {
+    const double i = s - (N - 1);
+    k->q[static_cast<std::size_t>(s)] = i * i * a * 0.5;
+  }
+  k->outChirp.resize(static_cast<std::size_t>(M));
+  for (int m = 0; m < M; ++m) k->outChirp[static_cast<std::size_t>(m)] = phasor(k->q[static_cast<std::size_t>(m + N - 1)]);
+  k->kernel.assign(static_cast<std::size_t>(L), fcomplex{});
+  for (int i = 0; i <= N + M - 2; ++i) k->kernel[static_cast<std::size_t>(i)] = phasor(-k->q[static_cast<std::size_t>(i)]);
+  pfft_c(plan.forward, k->kernel);
+
+  std::lock_guard lock(mutex_);
+  // Another thread may have made the same tables meanwhile: keep the first, they are equal.
+  for (const auto& old : kernels_)
+    if (old->aBits == bits) return old;
+  kernels_.insert(kernels_.begin(), k);
+  if (kernels_.size() > kKernels) kernels_.pop_back();
+  return k;
+}
+
+std::shared_ptr<const CztInputChirp> CztTables::input(const czt_plan& plan, const CztKernel& k, double b) {
+  const std::uint64_t bits = std::bit_cast<std::uint64_t>(b);
+  {
+    std::lock_guard lock(mutex_);
+    if (input_ && input_->aBits == k.aBits && input_->bBits == bits) return input_;
+  }
+  const int N = plan.N;
+  auto c = std::make_shared<CztInputChirp>();
+  c->aBits = k.aBits;
+  c->bBits = bits;
+  c->d.resize(static_cast<std::size_t>(N));
+  for (int n = 0; n < N; ++n)
+    c->d[static_cast<std::size_t>(n)] = phasor(k.q[static_cast<std::size_t>(n + N - 1)] - n * b);
+  std::lock_guard lock(mutex_);
+  input_ = c;
+  return c;
+}
+
+}  // namespace detail
 
 int czt_makep_c(czt_plan& plan, int N, int M) {
   plan = czt_plan{};
@@ -38,46 +242,35 @@ int czt_makep_c(czt_plan& plan, int N, int M) {
   plan.N = N;
   plan.M = M;
   plan.L = L;
+  plan.tables = std::make_shared<detail::CztTables>();
   return 0;
 }
 
 int pczt_c(const czt_plan& plan, std::span<const fcomplex> input, std::span<fcomplex> output, double a, double b,
            int rows) {
   const int N = plan.N, M = plan.M, L = plan.L;
-  if (N < 1 || M < 1 || L < 1 || rows < 0) return 10;
+  if (N < 1 || M < 1 || L < 1 || rows < 0 || !plan.tables) return 10;
   check_size("input", input.size(), static_cast<std::int64_t>(rows) * N);
   check_size("output", output.size(), static_cast<std::int64_t>(rows) * M);
+  if (rows == 0) return 0;
 
-  // q[i] = i^2 a / 2 for i = 1-N .. P, stored at i + N - 1.
-  const int P = std::max(N - 1, M - 1);
-  const int span = N + P;
-  std::vector<double> q(static_cast<std::size_t>(span));
-  for (int s = 0; s < span; ++s) {
-    const double i = s - (N - 1);
-    q[static_cast<std::size_t>(s)] = i * i * a * 0.5;
-  }
-  auto qi = [&](int i) { return q[static_cast<std::size_t>(i + N - 1)]; };
+  const auto kernel = plan.tables->kernel(plan, a);
+  const auto chirp = plan.tables->input(plan, *kernel, b);
+  const fcomplex* d = chirp->d.data();
+  const fcomplex* h = kernel->kernel.data();
+  const fcomplex* c = kernel->outChirp.data();
 
-  cvector c(static_cast<std::size_t>(span));
-  for (int s = 0; s < span; ++s) c[static_cast<std::size_t>(s)] = phasor(q[static_cast<std::size_t>(s)]);
-  cvector d(static_cast<std::size_t>(N));
-  for (int n = 0; n < N; ++n) d[static_cast<std::size_t>(n)] = phasor(qi(n) - n * b);
-
-  cvector h(static_cast<std::size_t>(L), fcomplex{});
-  for (int i = 0; i <= N + M - 2; ++i) h[static_cast<std::size_t>(i)] = phasor(-qi(i - (N - 1)));
-  pfft_c(plan.forward, h);
-
-  cvector y(static_cast<std::size_t>(L));
+  cvector& y = scratch(static_cast<std::size_t>(L));
+  const std::span<fcomplex> row(y.data(), static_cast<std::size_t>(L));
   for (int r = 0; r < rows; ++r) {
     const fcomplex* x = input.data() + static_cast<std::ptrdiff_t>(r) * N;
     fcomplex* out = output.data() + static_cast<std::ptrdiff_t>(r) * M;
-    std::fill(y.begin(), y.end(), fcomplex{});
-    for (int n = 0; n < N; ++n) y[static_cast<std::size_t>(n)] = mul(x[n], d[static_cast<std::size_t>(n)]);
-    pfft_c(plan.forward, y);
-    for (int k = 0; k < L; ++k) y[static_cast<std::size_t>(k)] = mul(y[static_cast<std::size_t>(k)], h[static_cast<std::size_t>(k)]);
-    pfft_c(plan.backward, y);
-    for (int k = 0; k < M; ++k)
-      out[k] = mul(y[static_cast<std::size_t>(k + N - 1)], c[static_cast<std::size_t>(k + N - 1)]);
+    multiply(x, d, y.data(), N);
+    std::fill(y.begin() + N, y.begin() + L, fcomplex{});
+    pfft_c(plan.forward, row);
+    multiply(y.data(), h, y.data(), L);
+    pfft_c(plan.backward, row);
+    multiply(y.data() + (N - 1), c, out, M);
   }
   return 0;
 }

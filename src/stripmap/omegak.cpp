@@ -9,6 +9,7 @@
 #include "dsp/czt.hpp"
 #include "dsp/fft.hpp"
 #include "dsp/filters.hpp"
+#include "dsp/phasor.hpp"
 
 namespace sar::stripmap {
 
@@ -19,7 +20,7 @@ using dcomplex = std::complex<double>;
 double sinc(double u) { return u == 0.0 ? 1.0 : std::sin(kPi * u) / (kPi * u); }
 
 fcomplex rotate(fcomplex x, double phase, double weight) {
-  const dcomplex p = std::polar(weight, phase);
+  const dcomplex p = dsp::phasor(phase, weight);
   return fcomplex(static_cast<float>(x.real() * p.real() - x.imag() * p.imag()),
                   static_cast<float>(x.real() * p.imag() + x.imag() * p.real()));
 }
@@ -396,7 +397,7 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
         // Since e^{-j pi (1 - t)} = -e^{j pi t}, one rotation serves all three.
         const dcomplex mix = (1.0 - t) * dcomplex(z[static_cast<std::size_t>(p)]) -
                              t * dcomplex(z[static_cast<std::size_t>(p + 1)]);
-        const dcomplex v = mix * std::polar(1.0, kPi * t + lineTurn);
+        const dcomplex v = mix * dsp::phasor(kPi * t + lineTurn);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
       }
       finish_row(back, out, row, Nout, n);
@@ -477,7 +478,7 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
         // buf index p + t counts from the `order` leading zeros: sample p + t - order of the line.
         dcomplex acc;
         for (int t = 0; t < taps; ++t) acc += dcomplex(buf[static_cast<std::size_t>(p + t)]) * dcomplex(h[t]);
-        acc *= std::polar(1.0, (kx.at(i) - kx0) * q);
+        acc *= dsp::phasor((kx.at(i) - kx0) * q);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(acc.real()), static_cast<float>(acc.imag()));
       }
       finish_row(back, out, row, Nout, n);

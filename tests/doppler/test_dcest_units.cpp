@@ -283,6 +283,34 @@ TEST(DopplerPolynomial, FilledBlocksAndMasksStayOutOfTheFit) {
   for (double v : coef) EXPECT_EQ(v, 0.0);
 }
 
+// A scene one block wide (or two) cannot fix the range terms of the surface: they stay zero and
+// the azimuth slope is still found, where the full fit would be singular.
+TEST(DopplerPolynomial, NarrowGridsFitOnlyTheTermsTheyDetermine) {
+  struct Case {
+    int across, rows;
+    std::array<bool, 7> fitted;  // terms 1, x, y, xy, x^2, x^3, x^4 with a non-zero slope expected
+  };
+  for (const Case k : {Case{1, 12, {true, false, true, false, false, false, false}},
+                       Case{2, 8, {true, true, true, true, false, false, false}}}) {
+    SCOPED_TRACE(k.across);
+    dcestconf c = grid(k.across, k.rows, {});
+    for (auto& b : c.blocks) b.centroid = testing::wrap_half(0.1 + 2e-5 * b.sample - 1e-4 * b.line);
+    const dcimage im = image_for(c);
+    ratesnr(c);
+    ASSERT_EQ(getkrstd(im, c), 0);
+    std::array<double, 3> plane{};
+    ASSERT_EQ(unwrapdcbin(c, plane), 0);
+    std::array<double, 7> coef{};
+    ASSERT_EQ(getdccoef(c, plane, coef), 0);
+    for (double v : coef) EXPECT_TRUE(std::isfinite(v));
+    EXPECT_NEAR(coef[2], -1e-4, 1e-9);
+    if (k.fitted[1]) {
+      EXPECT_NEAR(coef[1], 2e-5, 1e-9);
+    }
+    for (std::size_t j = 4; j < 7; ++j) EXPECT_EQ(coef[j], 0.0) << j;
+  }
+}
+
 TEST(DopplerWdar, BinsAreSymmetricAboutZeroFrequency) {
   // i / Blocks <= h and >= 1 - h in floating point take one bin more on the positive side
   // for these sizes.
