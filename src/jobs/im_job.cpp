@@ -131,15 +131,18 @@ namespace {
 // Wall time of one stage into the log, so that an operator sees where a slow run spent it.
 class StageClock {
  public:
-  explicit StageClock(const char* stage) : stage_(stage), writing_(stripmap::output_write_seconds()) {}
+  // A stage that is itself writing reports its whole time; others report the raster writes
+  // they made apart from their own work.
+  explicit StageClock(const char* stage, bool writing = false)
+      : stage_(stage), writingStage_(writing), writing_(stripmap::output_write_seconds()) {}
   StageClock(const StageClock&) = delete;
   StageClock& operator=(const StageClock&) = delete;
   ~StageClock() {
     const double total = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
     const double writing = stripmap::output_write_seconds() - writing_;
-    if (writing > 0.0) {
+    if (writing > 0.0 && !writingStage_) {
       base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, total - writing);
-      base::LogPrintf("Stage time %-14s %9.2f s\n", "SLC writing", writing);
+      base::LogPrintf("Stage time %-14s %9.2f s\n", "raster writes", writing);
     } else {
       base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, total);
     }
@@ -147,6 +150,7 @@ class StageClock {
 
  private:
   const char* stage_;
+  bool writingStage_;
   double writing_;
   std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
 };
@@ -214,6 +218,8 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
     if (flags[kStageCleanup]) remove_work_file(par.rgfPath);
   }
   if (proc.Flag_incore) {
+    // With the data in memory the SLC is written here.
+    const StageClock clock("SLC writing", true);
     if (int st = frame.check(dest_buffer(par, proc))) return st;
   }
   return 0;
