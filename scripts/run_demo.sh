@@ -26,11 +26,12 @@ exe="$build/src/jobs/focussing"
 
 echo "== running: focussing \"main_focussing_asar_IM#$demo/job.txt\""
 set +e
-VANTERRA_INIT_DIR="$demo" "$exe" "main_focussing_asar_IM#$demo/job.txt"
+# The job's console chatter (estimator progress) goes to a file; its log is Vanterra.log.
+VANTERRA_INIT_DIR="$demo" "$exe" "main_focussing_asar_IM#$demo/job.txt" >"$demo/focussing.out"
 status=$?
 set -e
 echo "== exit status: $status"
-grep -E "EXTR:|Doppler centroid|SLC:" "$demo/Vanterra.log" || true
+grep -E "EXTR:|Doppler centroid|SLC:|Stage time" "$demo/Vanterra.log" || true
 if [ "$status" -ne 0 ]; then
   echo "== error record ($demo/Vanterra.working_error):"
   cat "$demo/Vanterra.working_error"
