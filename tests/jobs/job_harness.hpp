@@ -1,12 +1,14 @@
 #pragma once
 // Runs the real focussing executable in a scratch working directory and reads back what it
 // left for the host.
+#include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <regex>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -43,6 +45,17 @@ inline std::vector<std::string> lines_of(const fs::path& p) {
   std::ifstream in(p);
   for (std::string l; std::getline(in, l);) out.push_back(l);
   return out;
+}
+
+/// Replaces "Key = value" lines of a parameter file; a key the file lacks is a test failure.
+inline void set_parameters(const fs::path& file, const std::vector<std::pair<std::string, std::string>>& values) {
+  std::string text = slurp(file);
+  for (const auto& [key, value] : values) {
+    const std::regex line("(^|\n)" + key + " = [^\n]*");
+    ASSERT_TRUE(std::regex_search(text, line)) << key;
+    text = std::regex_replace(text, line, "$1" + key + " = " + value);
+  }
+  std::ofstream(file, std::ios::binary) << text;
 }
 
 struct RunResult {

@@ -21,16 +21,6 @@ namespace {
 constexpr int kLines = 3000;
 constexpr int kSamples = 800;
 
-void set_parameters(const fs::path& file, const std::vector<std::pair<std::string, std::string>>& values) {
-  std::string text = slurp(file);
-  for (const auto& [key, value] : values) {
-    const std::regex line("(^|\n)" + key + " = [^\n]*");
-    ASSERT_TRUE(std::regex_search(text, line)) << key;
-    text = std::regex_replace(text, line, "$1" + key + " = " + value);
-  }
-  std::ofstream(file, std::ios::binary) << text;
-}
-
 std::string error_text(const ScratchJob& job) {
   std::string text;
   for (const auto& l : job.error_lines()) text += l + "\n";

@@ -27,17 +27,6 @@ namespace {
 
 constexpr double kPi = 3.14159265358979323846;
 
-// Replaces "Key = value" lines of a parameter file.
-void set_parameters(const fs::path& file, const std::vector<std::pair<std::string, std::string>>& values) {
-  std::string text = slurp(file);
-  for (const auto& [key, value] : values) {
-    const std::regex line("(^|\n)" + key + " = [^\n]*");
-    ASSERT_TRUE(std::regex_search(text, line)) << key;
-    text = std::regex_replace(text, line, "$1" + key + " = " + value);
-  }
-  std::ofstream(file, std::ios::binary) << text;
-}
-
 double sinc(double u) { return u == 0.0 ? 1.0 : std::sin(kPi * u) / (kPi * u); }
 
 // Width, peak sidelobe and integrated sidelobe ratios of a symmetric power response p(x), x in

@@ -30,11 +30,8 @@ TEST(ImJobThreads, SlcBytesDoNotDependOnTheThreadCount) {
     const std::string root = (job.dir() / "out").string();
     const std::string list = job.layout({t.level0_path, t.orbit_path, t.ins_path, t.xca_path, root, "128", "128",
                                          "NotOK", "NotOK", "NotOK", "NotOK", "NotOK", "NotOK", "1.0"});
-    std::string parameters = slurp(job.dir() / "des" / "parameters_IM.hdr");
-    parameters = std::regex_replace(parameters, std::regex("(^|\n)LinesInBlock = [^\n]*"), "$1LinesInBlock = 2048");
-    parameters = std::regex_replace(parameters, std::regex("(^|\n)SamplesInBlock = [^\n]*"), "$1SamplesInBlock = 512");
-    parameters = std::regex_replace(parameters, std::regex("(^|\n)RangeOverlap = [^\n]*"), "$1RangeOverlap = 128");
-    std::ofstream(job.dir() / "des" / "parameters_IM.hdr", std::ios::binary) << parameters;
+    set_parameters(job.dir() / "des" / "parameters_IM.hdr",
+                   {{"LinesInBlock", "2048"}, {"SamplesInBlock", "512"}, {"RangeOverlap", "128"}});
     const RunResult r = job.run("main_focussing_asar_IM#" + list, "OMP_NUM_THREADS=" + std::to_string(threads));
     ASSERT_EQ(r.status, 0) << r.err << job.log();
     EXPECT_NE(job.log().find("Doppler centroid at the scene centre"), std::string::npos);
