@@ -10,6 +10,7 @@
 
 #include "base/convert.hpp"
 #include "base/errors.hpp"
+#include "envisat/aux_products.hpp"
 #include "envisat/product_types.hpp"
 
 namespace sar::envisat {
@@ -179,6 +180,12 @@ Level0Header read_level0_header(const std::string& path) {
   const std::array<std::string_view, 4> pols = {"H/H  ", "V/V  ", "H/V  ", "V/H  "};
   for (int k = 0; k < 4; ++k)
     if (pol == pols[static_cast<std::size_t>(k)]) h.polarizationType = k;
+  {
+    const std::string field(mph.substr(kMphTotSizePos, kMphTotSizeWidth));
+    char* end = nullptr;
+    const long long stated = std::strtoll(field.c_str(), &end, 10);
+    if (end != field.c_str()) h.statedSize = stated;
+  }
   const char digit = sph[l0::kSphSwathDigit];
   if (digit >= '0' && digit <= '9') h.swathDigit = digit - '0';
   return h;

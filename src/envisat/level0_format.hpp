@@ -125,6 +125,7 @@ struct Level0Header {
   int polarizationType = -1;         // from the SPH polarisation, -1 when unknown
   int swathDigit = -1;               // IM swath digit, -1 when not a digit
   std::int64_t fileSize = 0;
+  std::int64_t statedSize = -1;  // MPH TOT_SIZE, -1 when the field does not read as a number
 };
 
 /// Reads and checks the headers of a level 0 product. Raises the image-missing code for an

@@ -2,17 +2,14 @@
 
 #include <algorithm>
 #include <cstdio>
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
 #include <vector>
 
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
 #include "base/errors.hpp"
 #include "base/run_services.hpp"
-#include "envisat/aux_products.hpp"
 #include "envisat/extract.hpp"
+#include "envisat/level0_format.hpp"
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
 #include "doppler/dcest.hpp"
@@ -45,18 +42,11 @@ namespace {
 // A product shorter than its main header says was cut in transfer or on disk. Its whole packets
 // can be read, but an image from them would silently miss the rest of the pass.
 void refuse_truncated_product(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
-  std::string mph(envisat::kMphTotSizePos + envisat::kMphTotSizeWidth, '\0');
-  if (!in.read(mph.data(), static_cast<std::streamsize>(mph.size()))) return;  // the reader has said why
-  const std::string field = mph.substr(envisat::kMphTotSizePos, envisat::kMphTotSizeWidth);
-  char* end = nullptr;
-  const long long stated = std::strtoll(field.c_str(), &end, 10);
-  if (end == field.c_str()) return;
-  std::error_code err;
-  const auto size = static_cast<long long>(std::filesystem::file_size(path, err));
-  if (err || size >= stated) return;
+  const envisat::Level0Header h = envisat::read_level0_header(path);
+  if (h.statedSize < 0 || h.fileSize >= h.statedSize) return;
   char where[128];
-  std::snprintf(where, sizeof where, "%lld of the %lld bytes its MPH states", size, stated);
+  std::snprintf(where, sizeof where, "%lld of the %lld bytes its MPH states", static_cast<long long>(h.fileSize),
+                static_cast<long long>(h.statedSize));
   note_failed_stage("envi_extract");
   base::fatal(base::ec::kFileIo, {path, "level 0 product truncated", where});
 }
