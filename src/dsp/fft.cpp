@@ -3,6 +3,7 @@
 #include <sys/mman.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
@@ -181,7 +182,13 @@ void* fft_malloc(std::size_t bytes) {
     // gigabyte costs a few hundred page faults instead of a few hundred thousand.
     const std::size_t rounded = (bytes + kHugePage - 1) / kHugePage * kHugePage;
     void* p = std::aligned_alloc(kHugePage, rounded);
-    if (p) ::madvise(p, rounded, MADV_HUGEPAGE);  // advice only: its failure changes nothing
+    if (p) {
+      // Advice only: where the system has no huge pages it fails, which changes nothing and
+      // must not leave an errno for the callers' frames to report.
+      const int callerErrno = errno;
+      ::madvise(p, rounded, MADV_HUGEPAGE);
+      errno = callerErrno;
+    }
     return p;
   }
   const std::size_t rounded = std::max<std::size_t>(1, (bytes + kAlignment - 1) / kAlignment) * kAlignment;
