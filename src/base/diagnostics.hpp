@@ -8,6 +8,7 @@
 //
 // The layer is process-wide and single-threaded by design: frames and reports belong to the
 // job's main thread, never to worker threads of a parallel loop.
+#include <cerrno>
 #include <cstddef>
 #include <cstdint>
 #include <source_location>
@@ -82,6 +83,19 @@ void report(int level, std::string_view text, std::source_location loc = std::so
 /// Dump a buffer: three int32 (type, dim1, dim2) in machine order, then the data.
 /// Type sizes: 0: 4 bytes, 1: 8, 2: 8, 3: 16, 4: 2.
 int write_debug(const std::string& path, const void* data, int type, int dim1, int dim2);
+
+/// Keeps errno as the caller left it across calls whose failure is expected (a probe for a file
+/// that may be absent, an advice the system may refuse): the next frame would report it.
+class ErrnoGuard {
+ public:
+  ErrnoGuard() : saved_(errno) {}
+  ~ErrnoGuard() { errno = saved_; }
+  ErrnoGuard(const ErrnoGuard&) = delete;
+  ErrnoGuard& operator=(const ErrnoGuard&) = delete;
+
+ private:
+  int saved_;
+};
 
 /// The function frame as a scope guard. Entering checks and clears errno and pushes the name;
 /// leaving pops the depth. A failing callee is passed through `check`:

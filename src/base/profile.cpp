@@ -56,19 +56,6 @@ ProfileCache& cache() {
   return instance;
 }
 
-/// errno stays as the caller left it: a missing file is an empty profile, not a failed call
-/// that the next frame check should report.
-class ErrnoGuard {
- public:
-  ErrnoGuard() : saved_(errno) {}
-  ~ErrnoGuard() { errno = saved_; }
-  ErrnoGuard(const ErrnoGuard&) = delete;
-  ErrnoGuard& operator=(const ErrnoGuard&) = delete;
-
- private:
-  int saved_;
-};
-
 void trim_blanks(std::string& text) {
   const auto first = text.find_first_not_of(' ');
   if (first == std::string::npos) {

@@ -17,6 +17,7 @@
 #include <utility>
 
 #include "base/arguments.hpp"
+#include "base/diagnostics.hpp"
 
 namespace sar::base {
 namespace fs = std::filesystem;
@@ -525,10 +526,11 @@ bool getAndSetPerc(int oldValue, int newValue, const std::string* label) {
   if (!rs().up) return true;
   // The heartbeat is usually absent already: that is not an error of the stage being reported
   // on, whose frames test errno.
-  const int callerErrno = errno;
-  std::error_code ec;
-  fs::remove(heartbeat_file_path(), ec);
-  errno = callerErrno;
+  {
+    const ErrnoGuard keep;
+    std::error_code ec;
+    fs::remove(heartbeat_file_path(), ec);
+  }
   const std::string wf = working_file_path();
   if (!fs::exists(wf)) {
     TracePrintf("getAndSetPerc - Not found the file : %s\n", wf.c_str());

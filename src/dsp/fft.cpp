@@ -3,7 +3,6 @@
 #include <sys/mman.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
@@ -12,6 +11,7 @@
 #include <stdexcept>
 #include <string>
 
+#include "base/diagnostics.hpp"
 #include "dsp/detail/fft_engine.hpp"
 
 namespace sar::dsp {
@@ -185,9 +185,8 @@ void* fft_malloc(std::size_t bytes) {
     if (p) {
       // Advice only: where the system has no huge pages it fails, which changes nothing and
       // must not leave an errno for the callers' frames to report.
-      const int callerErrno = errno;
+      const base::ErrnoGuard keep;
       ::madvise(p, rounded, MADV_HUGEPAGE);
-      errno = callerErrno;
     }
     return p;
   }

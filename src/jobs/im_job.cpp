@@ -311,10 +311,9 @@ int main_focussing_asar_im(const std::string& listPath) {
   par.outputDir = directory_of(slcPath);
   {
     // The output root may name a folder the host has not made yet.
-    const int callerErrno = errno;
+    const base::ErrnoGuard keep;
     std::error_code made;
     std::filesystem::create_directories(par.outputDir, made);
-    errno = callerErrno;
   }
   par.extrPath = par.outputDir + "/EXTR";
   par.rgfPath = par.extrPath + ".rgf";

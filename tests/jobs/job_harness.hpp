@@ -33,6 +33,12 @@ inline const std::string kXca =
 inline const std::string kCon =
     real("ASA_CON_AX", "ASA_CON_AXVIEC20030703_000000_20020301_000000_20020815_000000");
 
+/// Real auxiliary products the simulator patches into its ASA_INS and ASA_XCA.
+inline const std::string kInsTemplate =
+    real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
+inline const std::string kXcaTemplate =
+    real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+
 inline std::string slurp(const fs::path& p) {
   std::ifstream in(p, std::ios::binary);
   std::ostringstream s;

@@ -42,8 +42,8 @@ class ImBadInput : public ::testing::Test {
     c.faults = std::move(faults);
     c.scene_time = sceneTime;
     c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
-    c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
-    c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+    c.ins_template = kInsTemplate;
+    c.xca_template = kXcaTemplate;
     return sim::run_simulation(c);
   }
 

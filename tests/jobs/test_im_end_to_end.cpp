@@ -109,8 +109,8 @@ void focus_scene(const Scene& sc) {
   c.faults = sc.faults;
   c.clutter.power_db = sc.clutterDb;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}, {{45.02, 10.03, 0.0}, 25.0}, {{44.985, 9.99, 0.0}, 25.0}};
-  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
-  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  c.ins_template = kInsTemplate;
+  c.xca_template = kXcaTemplate;
   const sim::SimulationTruth t = sim::run_simulation(c);
   const std::string root = (job.dir() / "out").string();
   const std::string list = job.layout({t.level0_path, t.orbit_path, t.ins_path, t.xca_path, root, "512", "512",

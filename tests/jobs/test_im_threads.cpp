@@ -19,8 +19,8 @@ TEST(ImJobThreads, SlcBytesDoNotDependOnTheThreadCount) {
   c.noise_db = 0.0;
   c.clutter.power_db = 25.0;  // the centroid comes from the data, through the parallel estimator
   c.targets = {{{45.0, 10.0, 0.0}, 40.0}};
-  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
-  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  c.ins_template = kInsTemplate;
+  c.xca_template = kXcaTemplate;
   const sim::SimulationTruth t = sim::run_simulation(c);
 
   std::string slc[2];

@@ -67,8 +67,8 @@ sim::SimulationConfig scene(const fs::path& dir, bool swstChange) {
   c.noise_db = -200.0;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}, {{45.004, 10.030, 0.0}, 20.0}};
   if (swstChange) c.faults = {sim::Fault::kSwstChange};
-  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
-  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  c.ins_template = kInsTemplate;
+  c.xca_template = kXcaTemplate;
   return c;
 }
 

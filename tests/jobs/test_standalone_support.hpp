@@ -25,8 +25,8 @@ inline simulator::SimulationTruth simulate_small(const fs::path& dir, const std:
   c.noise_db = -10.0;
   c.scene_time = sceneTime;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
-  c.ins_template = real("ASA_INS_AX", "ASA_INS_AXVIEC20101222_143805_20101022_000000_20141231_235959");
-  c.xca_template = real("ASA_XCA_AX", "ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000");
+  c.ins_template = kInsTemplate;
+  c.xca_template = kXcaTemplate;
   return simulator::run_simulation(c);
 }
 
