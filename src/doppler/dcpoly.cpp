@@ -264,7 +264,7 @@ constexpr double kSignalFactor = 3.0;
 // variance model knows only the antenna, the SNR and the contrast; real clutter varies in
 // texture and brightness from block to block, which this allowance absorbs, while blocks that
 // see only part of a point target's aperture scatter by tenths of a cycle.
-constexpr double kScatterBound = 4.0;
+constexpr double kScatterBound = 10.0;
 
 double wrap_cycles(double v) { return v - std::round(v); }
 
@@ -410,7 +410,18 @@ int dcnapoly(const dcimage& image, dcestconf& conf, DopplerPoly& poly) {
   std::array<double, 7> c{};
   int status = 0;
   g.source = CentroidSource::Fit;
-  const bool surface = fitted_surface(image, conf, c, status) && slope_gate(conf, image, c) && scatter_gate(conf, c);
+  bool surface = fitted_surface(image, conf, c, status);
+  if (surface) {
+    // Both checks are made, so that the result file shows both values; the first to fail is named.
+    const bool slopeOk = slope_gate(conf, image, c);
+    const std::string slopeFailed = g.failed, slopeReason = g.reason;
+    const bool scatterOk = scatter_gate(conf, c);
+    if (!slopeOk) {
+      g.failed = slopeFailed;
+      g.reason = slopeReason;
+    }
+    surface = slopeOk && scatterOk;
+  }
   if (status != 0) return frame.check(status);
   if (!surface) {
     c = {};

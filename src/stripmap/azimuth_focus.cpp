@@ -261,21 +261,23 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   // half overlap, widened where the centroid moves the apertures off centre or the aperture is
   // longer than the overlap, so that no output line's aperture is cut by its block.
   const ApertureMargins need = aperture_margins(par, proc, sceneAzimuthShift);
-  const int32_t lead = std::max(ha, need.lead), trail = std::max(ha, need.trail);
+  int32_t lead = std::max(ha, need.lead), trail = std::max(ha, need.trail);
   int32_t Lb = az.LinesInBlock;
-  const int32_t minNet = std::min(512, Lb - 2 * ha);
-  if (Lb - lead - trail < minNet) Lb = lead + trail + minNet;
-  if (lead != ha || trail != ha) {
+  if (lines <= lead + trail) {
+    // Not one line of this scene has its whole aperture: focus what there is with the
+    // configured overlap, and say that apertures are cut.
+    base::report(base::kReportWarning,
+                 "Azimuth focusing: a scene of " + std::to_string(lines) + " lines is too short for whole apertures (" +
+                     std::to_string(need.lead) + " lines before and " + std::to_string(need.trail) +
+                     " after each output line): focused with the configured overlap, apertures cut");
+    lead = trail = ha;
+  } else if (lead != ha || trail != ha) {
+    const int32_t minNet = std::min(512, Lb - 2 * ha);
+    if (Lb - lead - trail < minNet) Lb = lead + trail + minNet;
     base::LogPrintf("Azimuth blocks: apertures of %.0f lines centred %.0f lines before their output lines need %d "
                     "lines before and %d after the output of each block (AzimuthOverlap gives %d each): blocks of %d "
                     "lines hold them\n",
                     need.aperture, need.offset, need.lead, need.trail, ha, Lb);
-  }
-  if (lines <= lead + trail) {
-    base::report(base::kReportError, "Azimuth focusing: a scene of " + std::to_string(lines) +
-                                         " lines cannot hold the apertures of its targets (" +
-                                         std::to_string(lead + trail) + " lines needed around the output)");
-    return frame.check(kRejected);
   }
   int32_t Ln = Lb - lead - trail;
   const int32_t full = (lines - lead - trail) / Ln;
