@@ -90,6 +90,7 @@ struct CentroidGates {
   int32_t signalBlocks = 0;     ///< blocks whose lag-one correlation shows a signal
   double slopeLow = 0.0, slopeHigh = 0.0;  ///< allowed range slopes, Hz/s
   double slopeWorst = 0.0;      ///< fitted slope farthest from the geometric one, Hz/s
+  double outliers = 0.0;        ///< blocks set aside as lying off the surface of the others
   double scatter = 0.0;         ///< weighted scatter of the block centroids about the fit over its prediction
   double scatterBound = 0.0;
   double constantCycles = 0.0;  ///< the fractional centroid of all signal blocks, cycles
@@ -147,6 +148,9 @@ struct dcestconf {
   double slopeTolerance = 0.0;
   /// Largest attitude error (yaw and pitch, degrees) the slope tolerance allows for.
   double AttitudeErrorBound = 1.0;
+  /// Largest weighted scatter of the block centroids about the fit, in standard deviations of
+  /// the blocks' own phase variance.
+  double CentroidScatterBound = 10.0;
   /// Core mode: the range-compressed matrix, lines x samples of the image description.
   std::span<const fcomplex> coreMatrix;
 

@@ -260,11 +260,10 @@ namespace {
 // block passes with probability exp(-k^2), about 1e-4 for k = 3).
 constexpr double kSignalFactor = 3.0;
 // The weighted scatter of the block centroids about the fit may exceed what their phase
-// variances predict by this factor (in standard deviations) before the fit is refused. The
-// variance model knows only the antenna, the SNR and the contrast; real clutter varies in
-// texture and brightness from block to block, which this allowance absorbs, while blocks that
-// see only part of a point target's aperture scatter by tenths of a cycle.
-constexpr double kScatterBound = 10.0;
+// variances predict by dcestconf::CentroidScatterBound (10 by default, in standard deviations)
+// before the fit is refused. The variance model knows only the antenna, the SNR and the
+// contrast: clutter of varying texture and bright scatterers scatter up to about 5 of them,
+// while blocks that each see part of a point target's aperture scatter by a hundred and more.
 
 double wrap_cycles(double v) { return v - std::round(v); }
 
@@ -327,7 +326,7 @@ bool slope_gate(dcestconf& conf, const dcimage& image, std::span<const double> c
 }
 
 /// The blocks that measured their centroid must lie about the surface as their phase variances
-/// predict: sqrt(chi^2 / degrees of freedom) at most kScatterBound.
+/// predict: sqrt(chi^2 / degrees of freedom) at most dcestconf::CentroidScatterBound.
 bool scatter_gate(dcestconf& conf, std::span<const double> c) {
   auto& g = conf.gates;
   double chi2 = 0.0;
@@ -342,11 +341,11 @@ bool scatter_gate(dcestconf& conf, std::span<const double> c) {
   for (std::size_t j = 0; j < 7; ++j) terms += c[j] != 0.0 ? 1 : 0;
   const int dof = std::max(1, n - terms);
   g.scatter = std::sqrt(chi2 / dof);
-  g.scatterBound = kScatterBound;
-  if (g.scatter <= kScatterBound) return true;
+  g.scatterBound = conf.CentroidScatterBound;
+  if (g.scatter <= g.scatterBound) return true;
   g.failed = "block scatter";
   g.reason = format("weighted scatter of %.0f blocks about the fit %.3g times their predicted spread (bound %.3g)",
-                    static_cast<double>(n), g.scatter, kScatterBound);
+                    static_cast<double>(n), g.scatter, g.scatterBound);
   return false;
 }
 
@@ -390,6 +389,42 @@ bool fitted_surface(const dcimage& image, dcestconf& conf, std::array<double, 7>
   if (getdccoef(conf, conf.plane, c) != 0) {
     g.failed = "signal blocks";
     g.reason = "the surface fit failed";
+    return false;
+  }
+  // Blocks that see part of a bright point target's aperture (or a patch moving on its own)
+  // give centroids far off the surface of the rest: they are set aside and the surface fitted
+  // again without them, twice at most. Off means beyond three robust standard deviations of the
+  // normalised residuals, and never within three of the blocks' own predicted spread.
+  const auto fitted = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const dcblock& b) { return b.good && !b.filled; });
+  for (int pass = 0; pass < 2; ++pass) {
+    std::vector<double> z;
+    for (const auto& b : conf.blocks)
+      if (b.good && !b.filled && b.phaseVariance > 0.0)
+        z.push_back(std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance));
+    if (z.size() < 8) break;
+    std::vector<double> sorted(z);
+    const auto mid = sorted.begin() + static_cast<std::ptrdiff_t>(sorted.size() / 2);
+    std::nth_element(sorted.begin(), mid, sorted.end());
+    const double limit = std::max(3.0, 3.0 * 1.4826 * *mid);
+    int dropped = 0;
+    for (auto& b : conf.blocks)
+      if (b.good && !b.filled && b.phaseVariance > 0.0 &&
+          std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance) > limit) {
+        b.good = 0;
+        ++dropped;
+      }
+    if (dropped == 0) break;
+    g.outliers += dropped;
+    if (getdccoef(conf, conf.plane, c) != 0) {
+      g.failed = "block scatter";
+      g.reason = "too few blocks left on the surface once those off it are set aside";
+      return false;
+    }
+  }
+  if (3 * g.outliers > fitted) {
+    g.failed = "block scatter";
+    g.reason = format("%.0f of %.0f blocks lie off the fitted surface (at most a third may)", g.outliers,
+                      static_cast<double>(fitted));
     return false;
   }
   return true;

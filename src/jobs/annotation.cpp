@@ -97,7 +97,7 @@ std::array<double, 3> range_coefficients(const stripmap::DopplerPoly& a, double 
 /// first focused line landed against the raw first line and the overlap.
 double azimuth_pixel_shift(const sarpar& par, const procparm& proc, const azimuthconf& az) {
   if (std::fabs(az.azimuthShift) < par.lines) return az.azimuthShift * par.prf;
-  return (proc.firstLineTime - par.azimuthStartTime) * par.prf - az.AzimuthOverlap;
+  return (proc.firstLineTime - par.azimuthStartTime) * par.prf - (proc.focusedLead > 0 ? proc.focusedLead : az.AzimuthOverlap);
 }
 
 /// The five state vectors' Earth-fixed z velocity at `time`, Lagrange through the nodes.

@@ -109,6 +109,11 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
     if (base::GetProfileDoubleArray(dcs, "AttitudeErrorBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
         bound > 0.0)
       dc.AttitudeErrorBound = bound;
+    // Optional: how far the block centroids may scatter about the fit, in their own standard
+    // deviations.
+    if (base::GetProfileDoubleArray(dcs, "CentroidScatterBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
+        bound > 0.0)
+      dc.CentroidScatterBound = bound;
   }
   dc.progressFlag = proc.progressFlag;
   dc.Flag_incore = proc.Flag_incore;

@@ -338,6 +338,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   proc.focusedLines = static_cast<int32_t>(written);
   proc.firstSampleTime = par.nearRangeTime - sceneRangeShift + hr / fs;
   proc.firstLineTime = lead / prf + par.azimuthStartTime + sceneAzimuthShift;
+  proc.focusedLead = lead;
   proc.outputCentroid = proc.dopplerCentroid;
   proc.outputRate = proc.dopplerRate;
   progress_update(100.0);
