@@ -236,7 +236,7 @@ const std::vector<Row>& rows() {
     t.push_back(row("clutter_yaw_bias_range_slope", std::nullopt, 25.0, Source::Fit));
     t.back().yawBiasDeg = 0.8;
     t.push_back(row("bright_target_weak_clutter", 0.3, 5.0, Source::Any));
-    t.back().brightAmplitude = 400.0;
+    t.back().brightAmplitude = 100.0;
     t.push_back(row("noise_alone", std::nullopt, -200.0, Source::Geometry));
     t.back().noTargets = true;
     return t;
