@@ -283,6 +283,7 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
     tt.beam_centre_time = bisect([&](double x) { return beam_sine(orbit.state(x), tt.ecef); }, tt.zero_doppler_time - 30.0,
                                  tt.zero_doppler_time + 30.0);
     tt.doppler_centroid = doppler(orbit.state(tt.beam_centre_time), tt.ecef);
+    tt.beam_centre_range_time = 2.0 * (tt.ecef - orbit.state(tt.beam_centre_time).position).norm() / kSpeedOfLight;
     const double h = 0.01;
     tt.doppler_rate = (doppler(orbit.state(tt.zero_doppler_time + h), tt.ecef) -
                        doppler(orbit.state(tt.zero_doppler_time - h), tt.ecef)) / (2.0 * h);
@@ -428,6 +429,7 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
     num("doppler_rate", tt.doppler_rate);
     num("doppler_centroid", tt.doppler_centroid);
     tim("beam_centre_time", tt.beam_centre_time);
+    num("beam_centre_range_time", tt.beam_centre_range_time);
   }
   if (!out) throw std::runtime_error("cannot write " + truth.truth_path);
   return truth;

@@ -122,6 +122,7 @@ struct RsatTargetTruth {
   double zero_doppler_time = 0.0, slant_range = 0.0, range_time = 0.0;
   double azimuth_line = 0.0, range_sample = 0.0;  // on the raw grid: line 0, W of line 0
   double beam_centre_time = 0.0, doppler_centroid = 0.0, doppler_rate = 0.0;
+  double beam_centre_range_time = 0.0;  // two-way time of the leading edge at the crossing
 };
 
 struct RsatTruth {
