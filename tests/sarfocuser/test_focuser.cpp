@@ -11,6 +11,8 @@
 #include <unistd.h>
 
 #include "analyser/irf.hpp"
+#include "geometry/geolocation.hpp"
+#include "geometry/orbit_interp.hpp"
 #include "radarsat/extract.hpp"
 #include "sarfocuser/sarfocuser.hpp"
 #include "simulator/rsat_product.hpp"
@@ -105,5 +107,61 @@ TEST(Focuser, PointTargetsOfBothBeamsUnweighted) {
     EXPECT_NEAR(m.peak_sample, sample, 0.1);
     EXPECT_NEAR(m.res_rg_px, c.rangeWidth, 0.05 * c.rangeWidth);
     EXPECT_NEAR(m.pslr_rg_db, -13.3, 1.0);
+    // Unweighted azimuth: one PRF of a 15 m antenna's band, the pattern tapering its edges.
+    EXPECT_NEAR(m.res_az_px, 1.12, 0.05);
+    EXPECT_LT(m.pslr_az_db, -18.0);
+
+    // The measured peak geolocated through the leader's orbit lands on the target.
+    const auto& p = f.focuser->proc();
+    geometry::grpt_rec rec;
+    for (std::size_t k = 0; k < 5; ++k)
+      rec.state_vectors[k] = {p.orbitPositions[3 * k], p.orbitPositions[3 * k + 1], p.orbitPositions[3 * k + 2]};
+    rec.t0 = p.orbitStartTime;
+    rec.dt = p.orbitSpacing;
+    rec.azimuth_time = p.firstLineTime + m.peak_line / f.truth.prf;
+    rec.tau = p.firstSampleTime + m.peak_sample / f.truth.sampling_frequency;
+    rec.wavelength = 0.05656;
+    ASSERT_EQ(geometry::gr_pt_lat_lon(rec), 0);
+    const auto& truth = f.truth.targets[0].ecef;
+    const geometry::Vec3 error{rec.x - truth.x, rec.y - truth.y, rec.z - truth.z};
+    const auto v = geometry::orbit_state_at(f.acq.orbit, rec.azimuth_time).velocity;
+    const double along = geometry::dot(error, geometry::unit(v));
+    const double across = std::sqrt(std::max(0.0, geometry::dot(error, error) - along * along));
+    const double azimuthPixel = rec.ground_velocity / f.truth.prf;
+    const double groundRangePixel = 0.5 * 299792458.0 / f.truth.sampling_frequency / std::sin(rec.incidence * M_PI / 180.0);
+    std::printf("%s: geolocation error %.2f m along track (pixel %.2f m), %.2f m across (pixel %.2f m)\n", c.beam, along,
+                azimuthPixel, across, groundRangePixel);
+    EXPECT_LT(std::abs(along), azimuthPixel);
+    EXPECT_LT(across, groundRangePixel);
   }
+}
+
+TEST(Focuser, TargetAcrossGapSwstChangeAndAttenuationStepFocusesLikeOneThatIsNot) {
+  rs::RsatConfig c = scene("S3");
+  c.lines = 4096;
+  // The first target's echoes span lines 1600-2500; the second's, imaged earlier, 770-1670.
+  c.targets = {{{45.0, 10.0, 0.0}, 3.0}, {{45.04, 10.0, 0.0}, 3.0}};
+  c.gap_line = 2100;
+  c.gap_length = 5;
+  c.swst_change_line = 1950;
+  c.swst_change_counts = 12;
+  c.attenuation_step_line = 2200;
+  c.attenuation_step_db = 5;
+  Focused f("S3_faults", c, true);
+  ASSERT_EQ(f.status, 0) << f.focuser->failed_stage();
+  EXPECT_EQ(f.acq.missing_lines, 5);
+  const auto across = f.measure(0), clean = f.measure(1);
+  ASSERT_TRUE(across.valid) << across.problem;
+  ASSERT_TRUE(clean.valid) << clean.problem;
+  std::printf("across the faults: widths rg %.3f az %.3f, PSLR rg %.2f az %.2f; clean: rg %.3f az %.3f, PSLR rg %.2f az %.2f\n",
+              across.res_rg_px, across.res_az_px, across.pslr_rg_db, across.pslr_az_db, clean.res_rg_px, clean.res_az_px,
+              clean.pslr_rg_db, clean.pslr_az_db);
+  for (std::size_t i = 0; i < 2; ++i) {
+    const auto m = i == 0 ? across : clean;
+    const auto [line, sample] = f.expected(i);
+    EXPECT_NEAR(m.peak_line, line, 0.1) << i;
+    EXPECT_NEAR(m.peak_sample, sample, 0.1) << i;
+  }
+  EXPECT_NEAR(across.res_rg_px, clean.res_rg_px, 0.02 * clean.res_rg_px);
+  EXPECT_NEAR(across.res_az_px, clean.res_az_px, 0.02 * clean.res_az_px);
 }
