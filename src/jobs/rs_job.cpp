@@ -26,7 +26,7 @@ constexpr std::string_view kRsParameterFile = "parameters_RS.hdr";
 
 [[noreturn]] void extraction_failed(const radarsat::CeosError& e) {
   note_failed_stage("RADARExtract");
-  base::report(base::kReportFileIo, e.what());
+  base::report(base::kReportError, e.what());
   base::fatal(base::ec::kStageFailed, {"RADARExtract()", e.what()});
 }
 
@@ -67,8 +67,10 @@ int main_focussing_asar_rs(const std::string& listPath) {
   // A focused CEOS product needs no focuser; its extraction is not part of this system.
   try {
     if (radarsat::read_leader(leaderFile).is_slc()) {
+      const std::string text = leaderFile + ": CEOS SLC products are not extracted by this system";
       note_failed_stage("extractSLC");
-      base::fatal(base::ec::kStageFailed, {"extractSLC()", leaderFile + ": CEOS SLC products are not extracted"});
+      base::report(base::kReportError, text);
+      base::fatal(base::ec::kStageFailed, {"extractSLC()", text});
     }
   } catch (const radarsat::CeosError& e) {
     extraction_failed(e);
