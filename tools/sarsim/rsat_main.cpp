@@ -6,6 +6,7 @@
 //             [--noise DB] [--time "dd-MMM-yyyy hh:mm:ss.uuuuuu"] [--ascending] [--seed S]
 //             [--replica-every K] [--gap LINE,COUNT] [--swst-change LINE,COUNTS]
 //             [--attenuation-step LINE,DB] [--repeated-index LINE]
+//             [--clutter-db DB] [--clutter-contrast low|high]
 //
 // The lines are centred on the first target's beam-centre crossing; with the unsteered beam
 // of RADARSAT-1 its zero-Doppler time lies seconds away, outside the raw lines. --samples is a
@@ -26,7 +27,8 @@ void usage() {
       "usage: sarsim-rs --out DIR [--beam F1|S3] [--lines N] [--samples M] [--target LAT,LON,H,AMP]...\n"
       "                 [--noise DB] [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S]\n"
       "                 [--replica-every K] [--gap LINE,COUNT] [--swst-change LINE,COUNTS]\n"
-      "                 [--attenuation-step LINE,DB] [--repeated-index LINE]\n",
+      "                 [--attenuation-step LINE,DB] [--repeated-index LINE]\n"
+      "                 [--clutter-db DB] [--clutter-contrast low|high]\n",
       stderr);
 }
 
@@ -95,6 +97,10 @@ int main(int argc, char** argv) {
         const auto v = numbers(value(), 2, "attenuation step (LINE,DB)");
         c.attenuation_step_line = static_cast<int>(v[0]);
         c.attenuation_step_db = static_cast<int>(v[1]);
+      } else if (arg == "--clutter-db") {
+        c.clutter.power_db = numbers(value(), 1, "clutter power")[0];
+      } else if (arg == "--clutter-contrast") {
+        c.clutter.contrast = sar::simulator::clutter_contrast_from_name(value());
       } else if (arg == "--repeated-index") {
         c.repeated_index_line = integer("line");
       } else if (arg == "--help" || arg == "-h") {

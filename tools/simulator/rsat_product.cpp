@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <optional>
 #include <random>
 #include <stdexcept>
 
@@ -69,6 +70,19 @@ Vec3 inertial_velocity(const StateVector& s) {
 double beam_sine(const StateVector& s, const Vec3& p) { return (p - s.position).unit().dot(inertial_velocity(s).unit()); }
 
 double doppler(const StateVector& s, const Vec3& p) { return 2.0 / kWavelength * (p - s.position).unit().dot(s.velocity); }
+
+/// Beam-centre Doppler at two-way time tau of the unsteered beam at time offset dt: the look
+/// direction perpendicular to the inertial velocity meets a sphere of radius `radius`.
+double beam_centre_doppler_at(const OrbitModel& orbit, double dt, double tau, double radius) {
+  const StateVector s = orbit.state_at_offset(dt);
+  const Vec3 along = inertial_velocity(s).unit();
+  const Vec3 up = (s.position.unit() - along * s.position.unit().dot(along)).unit();
+  const Vec3 right = along.cross(up);
+  const double range = 0.5 * kSpeedOfLight * tau, rs = s.position.norm();
+  const double cosLook = std::clamp((rs * rs + range * range - radius * radius) / (2.0 * rs * range), -1.0, 1.0);
+  const Vec3 look = up * (-cosLook) + right * std::sqrt(1.0 - cosLook * cosLook);
+  return 2.0 / kWavelength * look.dot(s.velocity);
+}
 
 double sinc(double x) { return std::abs(x) < 1e-12 ? 1.0 : std::sin(kPi * x) / (kPi * x); }
 
@@ -302,6 +316,27 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
     replica[2 * k + 1] = encode_nibble(static_cast<float>(v.imag()));
   }
 
+  // Clutter, made block by block as the lines go by.
+  std::optional<ClutterEcho> clutter;
+  if (c.clutter.enabled()) {
+    ClutterGeometry g;
+    g.lines = c.lines;
+    g.samples = c.samples;
+    g.prf = prf;
+    g.sampling_frequency = 1.0 / dt;
+    g.carrier_frequency = kSpeedOfLight / kWavelength;
+    g.pulse_length = kPulseLength;
+    g.chirp_bandwidth = bm.bandwidth;
+    g.near_range_time = truth.near_range_time;
+    g.antenna_length = kAntennaLength;
+    const double midOffset = truth.first_line_time + 0.5 * (c.lines - 1) / prf - orbit.elements().epoch;
+    const double radius = p0.norm();
+    g.doppler_centroid = [orbit, midOffset, radius](double tau) { return beam_centre_doppler_at(orbit, midOffset, tau, radius); };
+    set_orbit_geometry(g, orbit, midOffset, c.targets[0].position.height);
+    truth.clutter_centroid_mid = g.doppler_centroid(truth.near_range_time + 0.5 * c.samples * dt);
+    clutter.emplace(g, random_reflectivity(c.clutter, g, c.seed ^ 0x5A75A7ull));
+  }
+
   std::mt19937_64 random(c.seed);
   std::normal_distribution<double> normal(0.0, 1.0);
   const double sigma = std::sqrt(0.5 * std::pow(10.0, c.noise_db / 10.0));
@@ -331,6 +366,13 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
         const double x = u - 0.5 * kPulseLength;
         echo[static_cast<std::size_t>(k)] += tt.target.amplitude * pattern * std::polar(1.0, kPi * rate * x * x + carrier);
       }
+    }
+    if (clutter) {
+      // The clutter keeps the first line's window: after an SWST change its samples move.
+      const auto cl = clutter->line(l);
+      const int shift = static_cast<int>(std::lround((w - truth.swst_count) * bm.time_unit / dt));
+      for (int k = 0; k + shift < c.samples; ++k)
+        if (k + shift >= 0) echo[static_cast<std::size_t>(k)] += std::complex<double>(cl[static_cast<std::size_t>(k + shift)]);
     }
     const double gain = std::pow(10.0, (c.attenuation_db - att) / 20.0);
     DataRecord rec;
@@ -403,6 +445,11 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
   num("antenna_length", kAntennaLength);
   num("noise_db", c.noise_db);
   num("doppler_centroid", truth.doppler_centroid);
+  if (clutter) {
+    num("clutter_power_db", c.clutter.power_db);
+    num("clutter_doppler_centroid_mid", truth.clutter_centroid_mid);
+    num("clutter_ambiguity_mid", std::lround(truth.clutter_centroid_mid / prf));
+  }
   num("range_resolution", kSpeedOfLight / (2.0 * bm.bandwidth));
   num("azimuth_resolution", kAntennaLength / 2.0);
   line("echo_convention", "leading edge of the pulse at range_time");

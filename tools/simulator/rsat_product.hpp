@@ -25,6 +25,7 @@
 #include <string>
 #include <vector>
 
+#include "simulator/clutter.hpp"
 #include "simulator/orbit_model.hpp"
 #include "simulator/simulator.hpp"
 
@@ -112,6 +113,9 @@ struct RsatConfig {
   int attenuation_step_line = -1, attenuation_step_db = 0;  // attenuation grows from that line
   int attenuation_db = 10;    // attenuation of the first line
   int repeated_index_line = -1;  // this record carries the index of the one before
+  // Distributed clutter (homogeneous or textured, see clutter.hpp) with the beam's centroid;
+  // its window is that of the first line (an SWST change does not move it).
+  ClutterOptions clutter;
   int vectors = 21;
   double vector_interval = 30.0;
 };
@@ -131,6 +135,7 @@ struct RsatTruth {
   double prf = 0.0, first_line_time = 0.0, near_range_time = 0.0, sampling_frequency = 0.0;
   int swst_count = 0, rx_duration = 0, lines = 0, samples = 0;
   double doppler_centroid = 0.0;  // at the scene centre, Hz
+  double clutter_centroid_mid = 0.0;  // beam-centre centroid of the clutter at mid range, Hz (0 without)
   std::vector<RsatTargetTruth> targets;
 };
 
