@@ -2,6 +2,7 @@
 // extracted to a raw raster and a replica, focused by the raw-data focuser, annotated as a
 // RADARSAT-1 stripmap SLC.
 #include <cerrno>
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
 
@@ -78,12 +79,15 @@ int main_focussing_asar_rs(const std::string& listPath) {
 
   connect_stage_progress();
   radarsat::Acquisition acquisition;
+  const auto extractionStart = std::chrono::steady_clock::now();
   try {
     base::waitbar_open("Extracting Radarsat RAW Data");
     acquisition = radarsat::radar_extract(request);
   } catch (const radarsat::CeosError& e) {
     extraction_failed(e);
   }
+  base::LogPrintf("Stage time %-14s %9.2f s\n", "extraction",
+                  std::chrono::duration<double>(std::chrono::steady_clock::now() - extractionStart).count());
   base::LogPrintf("RADARSAT-1 %s: %lld lines of %d samples, PRF %.3f Hz, %lld missing lines, %lld records dropped\n",
                   acquisition.beam.c_str(), static_cast<long long>(acquisition.lines), acquisition.samples,
                   acquisition.prf, static_cast<long long>(acquisition.missing_lines),

@@ -1,6 +1,7 @@
 #include "sarfocuser/sarfocuser.hpp"
 
 #include <algorithm>
+#include <chrono>
 #include <cmath>
 #include <filesystem>
 #include <span>
@@ -34,6 +35,22 @@ int getInt(const char* section, const char* key, const std::string& file) {
 double getDouble(const char* section, const char* key, const std::string& file) {
   return base::GetCheckMyProfileDouble(section, key, file);
 }
+
+// Wall time of one stage into the log, so that an operator sees where a slow run spent it.
+class StageClock {
+ public:
+  explicit StageClock(const char* stage) : stage_(stage) {}
+  StageClock(const StageClock&) = delete;
+  StageClock& operator=(const StageClock&) = delete;
+  ~StageClock() {
+    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
+    base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, s);
+  }
+
+ private:
+  const char* stage_;
+  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+};
 
 bool exists(const std::string& path) {
   const base::ErrnoGuard keep;
@@ -233,6 +250,7 @@ int SARFocuser::process() {
   if (int st = frame.check(envisat::envi_syntchirp(par_, proc_))) return fail("chirp", st);
 
   if (conf_.Flag_rangefoc) {
+    const StageClock clock("range");
     if (int st = frame.check(stripmap::rangefoc(par_, proc_))) return fail("rangefoc", st);
   }
 
@@ -253,6 +271,7 @@ int SARFocuser::process() {
     poly[0] = conf_.DCref;
     base::LogPrintf("DCref: %f\n", conf_.DCref);
   } else if (conf_.Flag_dcest) {
+    const StageClock clock("Doppler");
     stripmap::progress_open("DC Estimation");
     doppler::dcimage image;
     image.path = par_.rgfPath;
@@ -295,6 +314,7 @@ int SARFocuser::process() {
   if (int st = frame.check(stripmap::getgeopoly(par_, proc_))) return fail("getgeopoly", st);
 
   if (conf_.Flag_azimuthfoc) {
+    const StageClock clock("azimuth");
     stripmap::azimuthconf az = conf_.az;
     // A shift equal to the image size asks for the geometric shift of the squint.
     az.azimuthShift = conf_.ApplyAzShift ? static_cast<double>(par_.lines) : 0.0;
