@@ -42,10 +42,10 @@ struct Product {
   ~Product() { fs::remove_all(dir); }
   void leader(int vectors = 21, const std::string& mission = "R1", const std::string& sensor = "RSAT-1-C -    -HH") const {
     const auto orbit = sim::OrbitModel::for_scene({45.0, 10.0, 0.0}, kFirstLine, 38.0, false, 30000);
-    auto spec = sim::rsat::leader_from_orbit(orbit, kVectorsStart, vectors, 30.0, 12.0);
-    spec.mission = mission;
-    spec.sensor = sensor;
-    sim::rsat::write_leader(request.leader_file, spec);
+    auto content = sim::rsat::leader_from_orbit(orbit, kVectorsStart, vectors, 30.0, 12.0);
+    content.mission = mission;
+    content.sensor = sensor;
+    sim::rsat::write_leader(request.leader_file, content);
   }
   bool outputs_absent() const {
     for (const auto& e : fs::directory_iterator(dir)) {

@@ -95,12 +95,12 @@ TEST(SimulatedLeader, InertialVectorsComeBackEarthFixedInAnyUnits) {
   const fs::path dir = temp_dir("units");
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
-    sim::rsat::LeaderSpec spec = sim::rsat::leader_from_orbit(orbit, first, 21, 30.0, 201.5);
-    spec.frame = c.frame;
-    for (auto& p : spec.positions) p = p * c.positionScale;
-    for (auto& v : spec.velocities) v = v * c.velocityScale;
+    sim::rsat::LeaderContent content = sim::rsat::leader_from_orbit(orbit, first, 21, 30.0, 201.5);
+    content.frame = c.frame;
+    for (auto& p : content.positions) p = p * c.positionScale;
+    for (auto& v : content.velocities) v = v * c.velocityScale;
     const std::string path = (dir / "lea_01.001").string();
-    sim::rsat::write_leader(path, spec);
+    sim::rsat::write_leader(path, content);
     const auto data = leader_orbit(read_leader(path));
     ASSERT_EQ(data.vectors.size(), 21u);
     EXPECT_NEAR(data.vectors.front().time, first, 1e-6);

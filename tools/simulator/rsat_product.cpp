@@ -160,7 +160,7 @@ void write_data_file(const std::string& path, const std::vector<DataRecord>& rec
   for (const auto& b : bodies) write_all(out, b, path);
 }
 
-void write_leader(const std::string& path, const LeaderSpec& s) {
+void write_leader(const std::string& path, const LeaderContent& s) {
   std::ofstream out(path, std::ios::binary | std::ios::trunc);
   if (!out) throw std::runtime_error("cannot write " + path);
   std::vector<uint8_t> fdr = ceos_record(1, {0x3F, 0xC0, 0x12, 0x12}, 720);
@@ -201,8 +201,8 @@ void write_leader(const std::string& path, const LeaderSpec& s) {
   write_all(out, ceos_record(6, {0x0A, 0x32, 0x12, 0x14}, 4232), path);  // radiometric
 }
 
-LeaderSpec leader_from_orbit(const OrbitModel& orbit, double first, int count, double interval, double gha_deg) {
-  LeaderSpec s;
+LeaderContent leader_from_orbit(const OrbitModel& orbit, double first, int count, double interval, double gha_deg) {
+  LeaderContent s;
   const double dayStart = std::floor(first / 86400.0) * 86400.0;
   std::string text;
   if (base::sec852myascii(dayStart, text) != 0) throw std::runtime_error("orbit time before 1985");
@@ -407,7 +407,7 @@ RsatTruth simulate_rsat(const RsatConfig& c) {
   truth.truth_path = (std::filesystem::path(c.out_dir) / "truth.txt").string();
   const double mid = truth.first_line_time + 0.5 * c.lines / prf;
   const double firstVector = std::round(mid - 0.5 * (c.vectors - 1) * c.vector_interval);
-  LeaderSpec leader = leader_from_orbit(orbit, firstVector, c.vectors, c.vector_interval, 123.456789);
+  LeaderContent leader = leader_from_orbit(orbit, firstVector, c.vectors, c.vector_interval, 123.456789);
   leader.orbit_configuration = c.ascending ? "ASCENDING" : "DESCENDING";
   write_leader(truth.leader_path, leader);
   write_data_file(truth.data_path, records);

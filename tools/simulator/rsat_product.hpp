@@ -64,7 +64,7 @@ struct DataFileOptions {
 };
 void write_data_file(const std::string& path, const std::vector<DataRecord>& records, const DataFileOptions& options = {});
 
-struct LeaderSpec {
+struct LeaderContent {
   std::string scene_id = "R1SIMULATED00001";
   std::string orbit_configuration = "DESCENDING";
   std::string mission = "R1";
@@ -79,11 +79,11 @@ struct LeaderSpec {
   std::vector<Vec3> positions;   // written as given (km for an inertial leader)
   std::vector<Vec3> velocities;  // m/s
 };
-void write_leader(const std::string& path, const LeaderSpec& spec);
+void write_leader(const std::string& path, const LeaderContent& content);
 
 /// Leader vectors of the orbit: `count` inertial vectors (km, m/s) `interval` s apart from
 /// `first` (sec85), turned with the hour angle `gha_deg` at the first, with the date fields.
-LeaderSpec leader_from_orbit(const OrbitModel& orbit, double first, int count, double interval, double gha_deg);
+LeaderContent leader_from_orbit(const OrbitModel& orbit, double first, int count, double interval, double gha_deg);
 
 /// Beam set-ups of the simulator: "F1" (ADC 0, 32.32 MHz, 30 MHz) and "S3" (ADC 1, 18.47 MHz,
 /// 17.28 MHz), both at a PRF near 1257 Hz with 8 pulses in flight.
