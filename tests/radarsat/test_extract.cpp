@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <cstdio>
 #include <cmath>
 #include <complex>
 #include <filesystem>
@@ -197,6 +198,51 @@ TEST(Extract, AttenuationStepSwstChangeSkipAndExtract) {
   EXPECT_FLOAT_EQ(raw[1].samples[0].real(), 4.5f);
   EXPECT_NEAR(raw[2].samples[0].real(), 5.5 * std::pow(10.0, 0.3), 1e-4);  // brought back to 10 dB
   EXPECT_NEAR(raw[2].time - raw[1].time, 40 * 4.6415e-07, 1e-9);
+}
+
+TEST(Extract, TextOrbitReplacesTheLeadersVectors) {
+  Product p("text_orbit");
+  p.leader(4);  // too few for an orbit of its own
+  sim::rsat::write_data_file(p.request.data_file, records({1, 2, 3}));
+  // The same orbit as a text orbit: inertial metres, the Greenwich angle in radians.
+  const auto orbit = sim::OrbitModel::for_scene({45.0, 10.0, 0.0}, kFirstLine, 38.0, false, 30000);
+  const auto content = sim::rsat::leader_from_orbit(orbit, kVectorsStart, 21, 30.0, 12.0);
+  std::ofstream text(p.dir / "orbit.txt");
+  text << "GENERATION TIME: simulated\nORBIT NUMBER: 30000\n; comment\n";
+  char line[200];
+  std::snprintf(line, sizeof line, "GREENWICH ANGLE: %.15f\n", 12.0 * M_PI / 180.0);
+  text << line << "1ST MODEL\n2ND MODEL\n";
+  for (std::size_t k = 0; k < content.positions.size(); ++k) {
+    const double sod = content.seconds_of_day + 30.0 * static_cast<double>(k);
+    const int ms = static_cast<int>(std::lround((sod - std::floor(sod)) * 1000.0));
+    std::snprintf(line, sizeof line, "%04d %03d %02d %02d %02d %03d\n", content.year, content.day_of_year,
+                  static_cast<int>(sod / 3600), static_cast<int>(sod / 60) % 60, static_cast<int>(sod) % 60, ms);
+    text << line;
+    const auto& q = content.positions[k];
+    const auto& v = content.velocities[k];
+    std::snprintf(line, sizeof line, "%.4f %.4f %.4f\n%.7f %.7f %.7f\n", q.x * 1000.0, q.y * 1000.0, q.z * 1000.0, v.x, v.y,
+                  v.z);
+    text << line;
+  }
+  text.close();
+  p.request.orbit_file = (p.dir / "orbit.txt").string();
+  const Acquisition a = radar_extract(p.request);
+  ASSERT_EQ(a.orbit.vectors.size(), 21u);
+  EXPECT_EQ(a.orbit.family, sar::geometry::OrbitFamily::kTextOrbit);
+  for (const auto& sv : a.orbit.vectors) {
+    const auto truth = orbit.state(sv.time);
+    EXPECT_NEAR(sv.position[0], truth.position.x, 0.01);
+    EXPECT_NEAR(sv.position[2], truth.position.z, 0.01);
+    EXPECT_NEAR(sv.velocity[1], truth.velocity.y, 1e-4);
+  }
+  // A missing text orbit is refused, naming it.
+  p.request.orbit_file = (p.dir / "missing.txt").string();
+  try {
+    radar_extract(p.request);
+    ADD_FAILURE() << "missing orbit accepted";
+  } catch (const CeosError& e) {
+    EXPECT_NE(std::string(e.what()).find("missing.txt"), std::string::npos) << e.what();
+  }
 }
 
 TEST(Extract, BrokenDataSetsAreRefusedWithTheFileNamed) {
