@@ -9,7 +9,7 @@
 
 namespace sar::envisat {
 
-int envi_orbit(const std::string& orbitPath, sarpar& par, stripmap::procparm& proc) {
+int envi_orbit(const std::string& orbitPath, sarpar& par, metadata::SceneReferences& proc) {
   base::Frame frame("envi_orbit");
   if (par.prf <= 0.0 || par.lines <= 0) return 10;
   const double duration = par.lines / par.prf;
@@ -26,7 +26,7 @@ int envi_orbit(const std::string& orbitPath, sarpar& par, stripmap::procparm& pr
   return 0;
 }
 
-int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, stripmap::procparm& proc) {
+int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, metadata::SceneReferences& proc) {
   base::Frame frame("envi_rgpattern");
   const XcaRecord xca = XcaRecord::read(xcaPath);
   const InsRecord ins = InsRecord::read(insPath);
@@ -40,7 +40,7 @@ int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpa
   return 0;
 }
 
-int envi_syntchirp(sarpar& par, stripmap::procparm& proc) {
+int envi_syntchirp(sarpar& par, metadata::SceneReferences& proc) {
   base::Frame frame("envi_syntchirp");
   const double resampling = par.resampling_factor > 0 ? par.resampling_factor : 1;
   const double fs = par.samplingRate / resampling;

@@ -1,10 +1,10 @@
 #pragma once
-// The three steps that complete a stripmap job's record after extraction: the orbit sampled
-// over the scene, the elevation pattern of the channel, and the nominal range chirp.
+// The three steps that complete what a job knows of the scene after extraction: the orbit
+// sampled over the scene, the elevation pattern of the channel, and the nominal range chirp.
 #include <string>
 
 #include "envisat/records.hpp"
-#include "stripmap/procparm.hpp"
+#include "metadata/scene_references.hpp"
 
 namespace sar::envisat {
 
@@ -14,12 +14,12 @@ inline constexpr double kPatternStep = 0.05;
 
 /// Five state vectors T/3 apart centred on the scene (T = lines / PRF), the orbit number and
 /// the ascending node time. Returns 0 or the orbit reader's status.
-int envi_orbit(const std::string& orbitPath, sarpar& par, stripmap::procparm& proc);
+int envi_orbit(const std::string& orbitPath, sarpar& par, metadata::SceneReferences& proc);
 /// Pattern of the channel's beam and polarisation from ASA_XCA (dB to linear amplitude), its
 /// centre look angle from ASA_INS. Returns 0, or kFileIo-class failures as raised by the readers.
-int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, stripmap::procparm& proc);
+int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, metadata::SceneReferences& proc);
 /// The nominal linear FM replica: N = round(fs * tau / resampling), centred (zero phase in the
 /// middle), every part scaled by B / N.
-int envi_syntchirp(sarpar& par, stripmap::procparm& proc);
+int envi_syntchirp(sarpar& par, metadata::SceneReferences& proc);
 
 }  // namespace sar::envisat

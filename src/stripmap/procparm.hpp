@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "dsp/fft.hpp"
+#include "metadata/scene_references.hpp"
 
 namespace sar::stripmap {
 
@@ -21,7 +22,8 @@ struct LocatedPoint {
   double longitude = 0.0;
 };
 
-struct procparm {
+/// The scene's orbit, range reference and elevation pattern come from the sensor reader.
+struct procparm : metadata::SceneReferences {
   int32_t progressFlag = 0;
   int32_t rangeSamples = 0;
   int32_t lines = 0;
@@ -38,21 +40,6 @@ struct procparm {
   DopplerPoly lookAngle{};
   DopplerPoly incidenceAngle{};
   double centroidOverride = 0.0;
-  // Orbit over the scene: five Earth-fixed state vectors (x, y, z each), the first at
-  // orbitStartTime (sec85), orbitSpacing seconds apart.
-  std::array<double, 15> orbitPositions{};
-  std::array<double, 15> orbitVelocities{};
-  double orbitStartTime = 0.0;
-  double orbitSpacing = 0.0;
-  int32_t orbitNumber = 0;
-  // Range reference: the nominal chirp, centred, amplitude bandwidth / length.
-  std::vector<std::complex<float>> replica;
-  int32_t replicaLength = 0;
-  // Elevation antenna pattern, linear amplitude, patternStep degrees apart around patternCentre.
-  int32_t patternLength = 0;
-  std::vector<float> pattern;
-  double patternCentre = 0.0;
-  double patternStep = 0.0;
   int32_t Report_level = 0;
   int32_t Flag_ortog = 0;
   int32_t Flag_swstal = 0;

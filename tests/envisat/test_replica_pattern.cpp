@@ -48,7 +48,7 @@ TEST(Replica, CentredScaledChirpSweepsTheBandwidth) {
     par.pulse_length = c.tau;
     par.chirp_bandwidth = c.bandwidth;
     par.resampling_factor = c.resampling;
-    sar::stripmap::procparm proc;
+    sar::metadata::SceneReferences proc;
     ASSERT_EQ(envi_syntchirp(par, proc), 0);
     ASSERT_EQ(proc.replicaLength, c.n);
     ASSERT_EQ(proc.replica.size(), static_cast<std::size_t>(c.n));
@@ -73,7 +73,7 @@ TEST(Replica, CentredScaledChirpSweepsTheBandwidth) {
   one.samplingRate = 1.0;
   one.pulse_length = 1.0;
   one.chirp_bandwidth = 5.0;
-  sar::stripmap::procparm proc;
+  sar::metadata::SceneReferences proc;
   ASSERT_EQ(envi_syntchirp(one, proc), 0);
   ASSERT_EQ(proc.replicaLength, 1);
   EXPECT_FLOAT_EQ(proc.replica[0].real(), 5.0f);
@@ -86,7 +86,7 @@ TEST(ElevationPattern, LinearAmplitudeAroundTheInsReferenceAngle) {
     sarpar par;
     par.swath_number = beam;
     par.polarization_type = 0;
-    sar::stripmap::procparm proc;
+    sar::metadata::SceneReferences proc;
     ASSERT_EQ(envi_rgpattern(kXca, kIns, par, proc), 0);
     ASSERT_EQ(proc.patternLength, 201);
     ASSERT_EQ(proc.pattern.size(), 201u);
@@ -115,7 +115,7 @@ TEST(SceneOrbit, FiveStateVectorsCentredOnTheScene) {
   par.azimuthStartTime = sar::base::ascii2sec85("02-MAR-2008 10:00:00.000000");
   par.prf = 1652.0;
   par.lines = 30000;
-  sar::stripmap::procparm proc;
+  sar::metadata::SceneReferences proc;
   ASSERT_EQ(envi_orbit(kVor, par, proc), 0);
   const double duration = par.lines / par.prf;
   EXPECT_DOUBLE_EQ(proc.orbitSpacing, duration / 3);
