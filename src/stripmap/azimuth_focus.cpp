@@ -52,8 +52,8 @@ wkparm scene_wkparm(const sarpar& par, const procparm& proc, const azimuthconf& 
 }
 
 /// Lines an azimuth block must hold before and after the lines it outputs, so that each
-/// output line's target has its whole processed aperture (one PRF of Doppler around the
-/// centroid, PRF / |Ka| seconds) inside the block. A target's echoes are centred
+/// output line's target has its whole processed aperture (the processed band of Doppler around
+/// the centroid, band / |Ka| seconds) inside the block. A target's echoes are centred
 /// -(fd / Ka + shift) seconds from the time of its output line: with no azimuth shift that is
 /// the beam-centre offset of a squinted beam, which puts the aperture off centre, before the
 /// output line for a positive centroid. Taken over the swath's near, middle and far range and
@@ -63,7 +63,7 @@ struct ApertureMargins {
   double offset = 0.0, aperture = 0.0;  ///< lines, where the lead is largest
 };
 
-ApertureMargins aperture_margins(const sarpar& par, const procparm& proc, double shift) {
+ApertureMargins aperture_margins(const sarpar& par, const procparm& proc, double shift, double band) {
   ApertureMargins m;
   const double prf = par.prf, fs = par.samplingRate;
   const int32_t lines = proc.lines, samples = proc.rangeSamples;
@@ -77,7 +77,7 @@ ApertureMargins aperture_margins(const sarpar& par, const procparm& proc, double
       const double ka = DCeval(proc.dopplerRate, tau, t);
       if (!std::isfinite(fd) || !std::isfinite(ka) || ka == 0.0) continue;
       const double offset = -(fd / ka + shift) * prf;
-      const double aperture = prf * prf / std::fabs(ka);
+      const double aperture = band * prf / std::fabs(ka);
       if (!any || offset + aperture / 2 > lead) {
         m.offset = offset;
         m.aperture = aperture;
@@ -260,7 +260,11 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   // Lines each block holds before (lead) and after (trail) the lines it outputs: the configured
   // half overlap, widened where the centroid moves the apertures off centre or the aperture is
   // longer than the overlap, so that no output line's aperture is cut by its block.
-  const ApertureMargins need = aperture_margins(par, proc, sceneAzimuthShift);
+  // The processed band: the azimuth window's look band when the window is on, else the PRF.
+  const double band = az.AzimuthWindowHammingParameter > 0.0 && az.AzimuthLookBandwidth > 0.0
+                          ? std::min(prf, az.AzimuthLookBandwidth)
+                          : prf;
+  const ApertureMargins need = aperture_margins(par, proc, sceneAzimuthShift, band);
   int32_t lead = std::max(ha, need.lead), trail = std::max(ha, need.trail);
   int32_t Lb = az.LinesInBlock;
   if (lines <= lead + trail) {
