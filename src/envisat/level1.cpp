@@ -261,6 +261,9 @@ int read_level1(const std::string& path, Level1Product& p, std::string& error) {
     g.lines = base::ch2uint4(bytes(data, o + 17), 'm');
     g.firstSample = base::ch2uint4(bytes(data, o + 25), 'm');
     g.firstSlantTime = base::ch2float4(bytes(data, o + 69), 'm') * 1e-9;
+    g.firstIncidence = base::ch2float4(bytes(data, o + 113), 'm');
+    g.firstLatitude = base::ch2int4(bytes(data, o + 157), 'm') * 1e-6;
+    g.firstLongitude = base::ch2int4(bytes(data, o + 201), 'm') * 1e-6;
     g.swath = trimmed(std::string_view(data).substr(o + 499, 3));
     p.geolocation.push_back(std::move(g));
   }

@@ -14,7 +14,8 @@
 //   DOP CENTROID COEFFS ADS (55 bytes): zero-Doppler time (0), slant time of the polynomial's
 //     origin in ns (13), five coefficients (17), confidence (37), below-threshold flag (41).
 //   GEOLOCATION GRID ADS (521 bytes): first zero-Doppler time (0), line number and lines of the
-//     granule (13, 17), first tie point's sample number (25) and slant time in ns (69), swath
+//     granule (13, 17), first tie point's sample number (25), slant time in ns (69), incidence
+//     (113, deg), latitude and longitude (157, 201, millionths of a degree), swath
 //     name (499..501; its last character is the sub-swath digit of a WSS product).
 // The ANT and chirp data sets are located but not parsed.
 #include <array>
@@ -77,6 +78,9 @@ struct GeolocationRecord {
   uint32_t lines = 0;
   uint32_t firstSample = 0;
   double firstSlantTime = 0.0;  // s
+  double firstIncidence = 0.0;  // deg
+  double firstLatitude = 0.0;   // deg
+  double firstLongitude = 0.0;  // deg
   std::string swath;            // "IS2", "SS3", ...
   int subSwath() const;         // 1..5 for "SSd", 0 otherwise
 };

@@ -96,6 +96,9 @@ TEST(Level1Reader, RealImsHeadersAndAnnotation) {
   EXPECT_EQ(p.geolocation[0].subSwath(), 0);
   EXPECT_EQ(p.geolocation[0].firstSample, 1u);
   EXPECT_NEAR(p.geolocation[0].firstSlantTime, 5.5259775e-3, 1e-10);
+  EXPECT_NEAR(p.geolocation[0].firstIncidence, 18.71879, 1e-4);
+  EXPECT_NEAR(p.geolocation[0].firstLatitude, 41.453451, 1e-6);  // the SPH's FIRST_NEAR_LAT
+  EXPECT_NEAR(p.geolocation[0].firstLongitude, 11.945478, 1e-6);
   EXPECT_EQ(p.geolocation[12].lineNumber, 27985u);
   EXPECT_EQ(p.geolocation[12].lines, 2324u);
 

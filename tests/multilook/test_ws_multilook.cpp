@@ -1,0 +1,164 @@
+// Wide swath multilook of simulated WSS products: a uniform scene comes out flat across the
+// sub-swath seams and along azimuth, with the looks its weights and range looks give.
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <filesystem>
+#include <numeric>
+
+#include "envisat/level1.hpp"
+#include "multilook/wss_input.hpp"
+#include "multilook/ws_multilook.hpp"
+#include "simulator/wss_product.hpp"
+#include "strip_fixture.hpp"
+
+namespace sar::multilook {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::read_float_raster;
+using testing::temp_dir;
+
+const std::string kOrbit =
+    std::string(SAR_REAL_DATA_DIR) + "/DOR_VOR_AX/DOR_VOR_AXVF-P20080331_075200_20080301_215527_20080303_002327";
+
+struct WsRun {
+  int status = -1;
+  WsMultilookResult result;
+  std::vector<float> amplitude;
+  int lines = 0, samples = 0;
+  std::array<WsSubSwath, 5> swaths;
+};
+
+/// A uniform wide scene: sub-swaths of 1800 samples, so that the incidence (and with it the look
+/// band) changes from the first to the last.
+const simulator::WssProduct& uniform_product() {
+  static simulator::WssProduct product = [] {
+    simulator::WssConfig c;
+    c.out_dir = temp_dir("wss_uniform");
+    c.orbit_path = kOrbit;
+    c.samples = 1800;
+    c.overlap = 120;
+    c.bursts = 5;
+    c.burst_lines = 320;
+    c.cycle_lines = 200;
+    return simulator::write_wss_product(c);
+  }();
+  return product;
+}
+
+WsRun multilook(const std::string& product, WsMultilookConfig cfg) {
+  WsRun r;
+  envisat::Level1Product p;
+  std::string error;
+  EXPECT_EQ(envisat::read_level1(product, p, error), 0) << error;
+  EXPECT_EQ(wss_sub_swaths(p, r.swaths, error), 0) << error;
+  SlcGrid orbit;
+  EXPECT_EQ(orbit_geometry(kOrbit, p.firstLineTime, 5.331e9, orbit, error), 0) << error;
+  cfg.lineStep = p.lineTimeInterval;
+  cfg.samplingRate = 299792458.0 / (2.0 * p.rangeSpacing);
+  const std::string out = fs::path(product).parent_path() / (cfg.groundRange ? "scene_gr" : "scene_pwr");
+  r.status = run_ws_multilook(r.swaths, cfg, orbit, out, r.result);
+  if (r.status == 0) r.amplitude = read_float_raster(out, r.lines, r.samples);
+  return r;
+}
+
+TEST(WsLooks, WeightsOfOverlappingBurstsAddUpToOne) {
+  for (double w1 : {0.0, 0.25, 0.4}) {
+    const double w2 = 1.0 - 2.0 * w1;
+    for (double v = -1.0; v <= 1.0; v += 0.01) {
+      const double a = burst_weight(v, w1, w2), b = burst_weight(v - 1.0, w1, w2), c = burst_weight(v + 1.0, w1, w2);
+      EXPECT_NEAR(a * a + b * b + c * c, 1.0, 1e-12) << "W1 " << w1 << " v " << v;
+    }
+  }
+  EXPECT_EQ(burst_weight(0.9, 0.25, 0.5), 0.0);  // beyond W1 + W2
+  EXPECT_EQ(burst_weight(0.0, -0.1, 0.5), 0.0);  // a negative W1
+}
+
+TEST(WsLooks, LookPlansAndCentres) {
+  // Needed band n = (c/2 / sin(theta)) / resolution; usable 0.8 B; k = floor(1.3 u / n) made odd.
+  struct Case {
+    double incidence;
+    int resolution;
+    int looks;  // 0: refused, more than 15
+  } cases[] = {{20.0, 150, 5}, {31.0, 150, 7}, {40.0, 150, 9}, {20.0, 20, 1}, {20.0, 300, 11}, {20.0, 1000, 0}};
+  for (const auto& c : cases) {
+    LookPlan plan;
+    const int st = plan_looks(16e6, c.incidence, c.resolution, plan);
+    ASSERT_EQ(st, c.looks == 0 ? 1 : 0) << c.incidence << " " << c.resolution;
+    if (st != 0) continue;
+    EXPECT_EQ(plan.looks, c.looks) << c.incidence << " " << c.resolution;
+    EXPECT_EQ(plan.looks % 2, 1);
+    ASSERT_EQ(static_cast<int>(plan.centres.size()), plan.looks);
+    const auto [lo, hi] = std::minmax_element(plan.centres.begin(), plan.centres.end());
+    if (plan.looks > 1) {
+      EXPECT_NEAR(*hi + plan.band / 2, 8e6, 1.0);  // the outer looks reach the band's edges
+      EXPECT_NEAR(*lo - plan.band / 2, -8e6, 1.0);
+    }
+  }
+  LookPlan plan;
+  EXPECT_EQ(plan_looks(16e6, 20.0, 8, plan), 0);  // a resolution finer than the band: one look
+  EXPECT_EQ(plan.looks, 1);
+}
+
+TEST(WsLooks, BurstsFromRecordTimes) {
+  const double dt = 1e-3;
+  std::vector<double> t;
+  for (int b = 0; b < 3; ++b)
+    for (int l = 0; l < 5; ++l) t.push_back(100.0 + b * 3 * dt + l * dt);  // bursts overlap by two lines
+  const auto bursts = find_bursts(t, dt);
+  ASSERT_EQ(bursts.size(), 3u);
+  EXPECT_EQ(bursts[1].firstRecord, 5);
+  EXPECT_EQ(bursts[2].lines, 5);
+  EXPECT_DOUBLE_EQ(bursts[2].firstTime, 100.006);
+}
+
+// The level of a uniform scene across the seams and along azimuth, and its speckle.
+TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
+  const auto& product = uniform_product();
+  WsMultilookConfig cfg;
+  const WsRun r = multilook(product.path, cfg);
+  ASSERT_EQ(r.status, 0) << r.result.error;
+  ASSERT_GT(r.lines, 0);
+  // Lines where every sub-swath has bursts either side (not the first and last bursts' halves).
+  const int firstLine = 400, lastLine = r.lines - 400;
+  ASSERT_GT(lastLine - firstLine, 150);
+  auto p = [&](int l, int c) {
+    const double a = r.amplitude[static_cast<std::size_t>(l) * r.samples + c];
+    return a * a;
+  };
+  double total = 0.0;
+  std::size_t count = 0;
+  for (int l = firstLine; l < lastLine; ++l)
+    for (int c = 0; c < r.samples; ++c, ++count) total += p(l, c);
+  const double mean = total / count;
+  // Range: blocks of columns, each some 60 columns wide, seams included.
+  const int block = 60;
+  for (int c0 = 0; c0 + block <= r.samples; c0 += block) {
+    double s = 0.0;
+    for (int l = firstLine; l < lastLine; ++l)
+      for (int c = c0; c < c0 + block; ++c) s += p(l, c);
+    const double db = 10.0 * std::log10(s / ((lastLine - firstLine) * block) / mean);
+    EXPECT_LT(std::fabs(db), 0.2) << "columns " << c0 << ".." << c0 + block;
+  }
+  // Azimuth: blocks of ten lines across the bursts' weights, in each sub-swath on its own (the
+  // sub-swaths' bursts come at other times of the cycle, so their sum would hide a scalloping).
+  for (int s = 0; s < 5; ++s) {
+    const int c0 = s * r.samples / 5 + r.samples / 20, c1 = (s + 1) * r.samples / 5 - r.samples / 20;
+    double level = 0.0;
+    for (int l = firstLine; l < lastLine; ++l)
+      for (int c = c0; c < c1; ++c) level += p(l, c);
+    level /= static_cast<double>(lastLine - firstLine) * (c1 - c0);
+    for (int l0 = firstLine; l0 + 10 <= lastLine; l0 += 10) {
+      double sum = 0.0;
+      for (int l = l0; l < l0 + 10; ++l)
+        for (int c = c0; c < c1; ++c) sum += p(l, c);
+      const double db = 10.0 * std::log10(sum / (10.0 * (c1 - c0)) / level);
+      EXPECT_LT(std::fabs(db), 0.2) << "sub-swath " << s + 1 << " lines " << l0;
+    }
+  }
+}
+
+}  // namespace
+}  // namespace sar::multilook
