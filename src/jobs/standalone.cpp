@@ -234,6 +234,7 @@ std::vector<std::string> job_arguments(const ModeRow& mode, const std::string& p
     a[0] = product;
     a[1] = root;
     a[2] = orbit;
+    if (req.groundRange) a[6] = "OK";
   } else {
     a[0] = product;
     a[1] = orbit;
@@ -317,8 +318,8 @@ std::optional<StandaloneOutcome> prepare(const StandaloneRequest& req, Prepared&
   if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (im, ap, ws, rs or wss)");
   if (!req.multilook.empty() && req.mode != "im" && req.mode != "ap")
     return bad_request("--multilook is for the stripmap modes im and ap");
-  if (req.multilook.empty() && (req.groundRange || req.groundStep > 0.0))
-    return bad_request("--ground-range and --ground-step go with --multilook");
+  if (req.multilook.empty() && req.mode != "wss" && (req.groundRange || req.groundStep > 0.0))
+    return bad_request("--ground-range and --ground-step go with --multilook (or mode wss)");
   std::error_code ec;
   if (req.product.empty() || !(p.mode->setup == std::string("RS") ? fs::exists(req.product, ec)
                                                                     : fs::is_regular_file(req.product, ec)))
@@ -469,6 +470,12 @@ bool outputs_complete(const StandaloneRequest& req) {
   const std::string stem = product_stem(req.product);
   std::vector<std::string> required = {stem + "_slc", stem + "_slc_hdr"};
   if (req.quickLook) required.push_back(stem + "_slc.tif");
+  if (req.mode == "wss") {
+    // The level 1 job leaves a multilooked image only.
+    const std::string image = looked_product_name(stem, req.groundRange);
+    required = {image, image + "_hdr"};
+    if (req.quickLook) required.push_back(image + ".tif");
+  }
   if (!req.multilook.empty()) required.push_back(looked_product_name(stem, req.groundRange));
   bool modeOk = false, productOk = false;
   std::size_t found = 0;
@@ -741,7 +748,8 @@ const char* kModeOptions =
     "  --trace              keep a trace of the run in the work folder\n"
     "  --multilook AZxRG    also a detected multilooked image, AZ lines by RG samples a look\n"
     "                       (auto: the looks the annotation suggests); im and ap\n"
-    "  --ground-range       the multilooked image in ground range (<product>_gr, else _pwr)\n"
+    "  --ground-range       the multilooked image in ground range (<product>_gr, else _pwr);\n"
+    "                       wss: its image in ground range\n"
     "  --ground-step M      its ground step in metres (default: the looked slant cells' mean)\n"
     "  --skip-complete      do nothing when an earlier run's outputs are complete\n"
     "  --help               this text\n"

@@ -40,7 +40,7 @@ struct WssConfig {
   int overlap = 40;                               // samples shared by neighbouring sub-swaths
   double near_range = 850.0e3;                    // m, slant range of SS1's first sample
   int bursts = 6;
-  int burst_lines = 300;                          // focused lines of a burst
+  int burst_lines = 320;                          // focused lines of a burst
   int cycle_lines = 200;                          // lines from one burst of a sub-swath to the next
   std::array<int, 5> swath_offset_lines = {0, 40, 80, 120, 160};  // acquisition time in the cycle
   double clutter_std = 300.0;                     // counts at the reference range
