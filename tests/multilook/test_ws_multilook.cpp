@@ -117,7 +117,7 @@ TEST(WsLooks, BurstsFromRecordTimes) {
 // The level of a uniform scene across the seams and along azimuth, and its speckle.
 TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
   const auto& product = uniform_product();
-  WsMultilookConfig cfg;
+  const WsMultilookConfig cfg;
   const WsRun r = multilook(product.path, cfg);
   ASSERT_EQ(r.status, 0) << r.result.error;
   ASSERT_GT(r.lines, 0);
@@ -142,7 +142,8 @@ TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
     const double db = 10.0 * std::log10(s / ((lastLine - firstLine) * block) / mean);
     EXPECT_LT(std::fabs(db), 0.2) << "columns " << c0 << ".." << c0 + block;
   }
-  // Azimuth: blocks of ten lines across the bursts' weights, in each sub-swath on its own (the
+  // Azimuth: blocks of 20 lines (a tenth of a cycle) across the bursts' weights, in each
+  // sub-swath on its own (the
   // sub-swaths' bursts come at other times of the cycle, so their sum would hide a scalloping).
   for (int s = 0; s < 5; ++s) {
     const int c0 = s * r.samples / 5 + r.samples / 20, c1 = (s + 1) * r.samples / 5 - r.samples / 20;
@@ -150,13 +151,101 @@ TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
     for (int l = firstLine; l < lastLine; ++l)
       for (int c = c0; c < c1; ++c) level += p(l, c);
     level /= static_cast<double>(lastLine - firstLine) * (c1 - c0);
-    for (int l0 = firstLine; l0 + 10 <= lastLine; l0 += 10) {
+    for (int l0 = firstLine; l0 + 20 <= lastLine; l0 += 20) {
       double sum = 0.0;
-      for (int l = l0; l < l0 + 10; ++l)
+      for (int l = l0; l < l0 + 20; ++l)
         for (int c = c0; c < c1; ++c) sum += p(l, c);
-      const double db = 10.0 * std::log10(sum / (10.0 * (c1 - c0)) / level);
+      const double db = 10.0 * std::log10(sum / (20.0 * (c1 - c0)) / level);
       EXPECT_LT(std::fabs(db), 0.2) << "sub-swath " << s + 1 << " lines " << l0;
     }
+  }
+
+  // Speckle: in the middle of each sub-swath the ENL is that of its range looks (overlapping
+  // bands correlate) times the azimuth looks its burst weights give, line by line.
+  const int looks = r.result.rangeLooks;
+  const double cycleLines = 200.0, burstLines = 320.0;
+  const int offsets[5] = {0, 40, 80, 120, 160};
+  for (int s = 0; s < 5; ++s) {
+    LookPlan plan;
+    ASSERT_EQ(plan_looks(16e6, r.swaths[s].incidence, 150, plan), 0);
+    const auto centres = look_centres(looks, plan.band, 16e6);
+    // Correlation of two looks: the overlap of their windowed bands, on a fine frequency grid.
+    auto correlation = [&](double a, double b) {
+      double cross = 0.0, own = 0.0;
+      for (double f = -9e6; f <= 9e6; f += 2e3) {
+        auto win = [&](double centre) {
+          const double x = (f - centre) / plan.band + 0.5;
+          return x < 0.0 || x >= 1.0 ? 0.0 : 0.54 - 0.46 * std::cos(2.0 * M_PI * x);
+        };
+        cross += win(a) * win(b);
+        own += win(a) * win(a);
+      }
+      return cross / own;
+    };
+    double rho2 = 0.0;
+    for (double a : centres)
+      for (double b : centres) rho2 += std::pow(correlation(a, b), 2.0);
+    const double rangeEnl = looks * looks / rho2;
+    double inverse = 0.0, sum = 0.0, sum2 = 0.0;
+    std::size_t n = 0;
+    const int c0 = s * r.samples / 5 + r.samples / 20, c1 = (s + 1) * r.samples / 5 - r.samples / 20;
+    for (int l = firstLine; l < lastLine; ++l) {
+      double w2 = 0.0, w4 = 0.0;
+      for (int b = 0; b < 5; ++b) {
+        const double centre = b * cycleLines + offsets[s] + 0.5 * (burstLines - 1);
+        const double w = burst_weight((l - centre) / cycleLines, cfg.w1, cfg.w2);
+        w2 += w * w;
+        w4 += w * w * w * w;
+      }
+      inverse += 1.0 / (rangeEnl * w2 * w2 / w4);
+      for (int c = c0; c < c1; ++c, ++n) {
+        sum += p(l, c);
+        sum2 += p(l, c) * p(l, c);
+      }
+    }
+    const double expected = (lastLine - firstLine) / inverse;
+    const double m = sum / n, enl = m * m / (sum2 / n - m * m);
+    EXPECT_NEAR(enl / expected, 1.0, 0.1) << "sub-swath " << s + 1 << ": ENL " << enl << ", expected " << expected;
+  }
+}
+
+// A target in the overlap of two sub-swaths is in both their data; the joined image shows it
+// once, where its slant time puts it.
+TEST(WsMultilook, TargetInAnOverlapAppearsOnceAtItsPosition) {
+  simulator::WssConfig c;
+  c.out_dir = temp_dir("wss_targets");
+  c.orbit_path = kOrbit;
+  c.samples = 400;
+  c.overlap = 60;
+  c.bursts = 4;
+  c.clutter_std = 30.0;
+  const double line = 430.0, inSs3 = 20.0;  // 20 samples into SS3, in the overlap with SS2
+  c.targets = {{2, line, c.samples - c.overlap + inSs3, 30000.0}, {3, line, inSs3, 30000.0},
+               {4, line, 250.0, 30000.0}};
+  const auto product = simulator::write_wss_product(c);
+  const WsRun r = multilook(product.path, WsMultilookConfig{});
+  ASSERT_EQ(r.status, 0) << r.result.error;
+  const int d = r.result.decimation;
+  const double expected[2] = {(2.0 * (c.samples - c.overlap) + inSs3) / d, (3.0 * (c.samples - c.overlap) + 250.0) / d};
+  // Peaks: cells that are the brightest within 8 cells and 100 times the clutter.
+  std::vector<std::pair<int, int>> peaks;
+  double background = 0.0;
+  for (float a : r.amplitude) background += static_cast<double>(a) * a;
+  background /= static_cast<double>(r.amplitude.size());
+  for (int l = 8; l < r.lines - 8; ++l)
+    for (int col = 8; col < r.samples - 8; ++col) {
+      const float a = r.amplitude[static_cast<std::size_t>(l) * r.samples + col];
+      if (static_cast<double>(a) * a < 100.0 * background) continue;
+      bool highest = true;
+      for (int dl = -8; dl <= 8 && highest; ++dl)
+        for (int dc = -8; dc <= 8 && highest; ++dc)
+          if ((dl || dc) && r.amplitude[static_cast<std::size_t>(l + dl) * r.samples + col + dc] > a) highest = false;
+      if (highest) peaks.emplace_back(l, col);
+    }
+  ASSERT_EQ(peaks.size(), 2u);
+  for (int k = 0; k < 2; ++k) {
+    EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].first, line, 1.0);
+    EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].second, expected[k], 1.0);
   }
 }
 
