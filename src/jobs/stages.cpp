@@ -18,6 +18,7 @@
 #include "stripmap/coords.hpp"
 #include "stripmap/geopoly.hpp"
 #include "stripmap/progress.hpp"
+#include "stripmap/range_calibration.hpp"
 #include "stripmap/range_focus.hpp"
 
 namespace sar::jobs {
@@ -135,7 +136,9 @@ int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm
   return st;
 }
 int getgeopoly(sarpar& par, procparm& proc) { return named("getgeopoly", stripmap::getgeopoly(par, proc)); }
-int IMCalibration(sarpar&, procparm&) { return stage_not_built("IMCalibration"); }
+int IMCalibration(sarpar& par, procparm& proc) {
+  return named("IMCalibration", stripmap::range_antenna_calibration(par, proc));
+}
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az) {
   const int st = named("azimuthfoc", stripmap::azimuthfoc(par, proc, az));
   if (st == 0)

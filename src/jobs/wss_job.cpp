@@ -74,6 +74,7 @@ int WSwritepars_kelvor(const std::string& headerPath, const envisat::Level1Produ
                                     (res.nearTime + 0.5 * res.samples * res.slantStep) * 149896229.0,
                                     (res.nearTime + res.samples * res.slantStep) * 149896229.0};
   if (!ground) WriteProfileDoubleArray(p, "SlantRange", slant, f);
+  if (ground) WriteProfileDoubleArray(p, "GroundRangeSlantTimeCoeff", res.groundSlantTime, f);
   WriteMyProfileDouble(p, "PixelSpacingRg", res.rangeSpacing, f);
   WriteMyProfileDouble(p, "PixelSpacingAz", product.azimuthSpacing, f);
   WriteMyProfileDouble(p, "AzimuthTimeStep", res.lineStep, f);

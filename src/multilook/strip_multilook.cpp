@@ -7,6 +7,8 @@
 #include <stdexcept>
 #include <system_error>
 
+#include <Eigen/Dense>
+
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
 #include "base/profile.hpp"
@@ -78,6 +80,7 @@ int write_annotation(const std::string& slcAnnotation, const std::string& outAnn
   WriteProfileDoubleArray(p, "FastTime", {&res.nearTime, 1}, f);
   WriteMyProfileStringQuote(p, "AzimuthStartTime", time_text(res.firstLineTime), f);
   WriteMyProfileStringQuote(p, "AzimuthStopTime", time_text(res.firstLineTime + res.lines * res.lineStep), f);
+  if (req.groundRange) WriteProfileDoubleArray(p, "GroundRangeSlantTimeCoeff", res.groundSlantTime, f);
   if (!req.groundRange) {
     const double step = res.rangeLooks / grid.samplingRate;
     const std::array<double, 3> slantRange{res.nearTime * kHalfLightSpeed,
@@ -200,6 +203,34 @@ std::vector<double> ground_to_slant(const std::vector<double>& distance, double 
   return where;
 }
 
+std::array<double, 5> fit_ground_columns(const std::vector<double>& where, double nearTime, double slantStep,
+                                         double& worst) {
+  std::array<double, 5> c{};
+  worst = 0.0;
+  const Eigen::Index n = static_cast<Eigen::Index>(where.size());
+  if (n == 0) return c;
+  // Columns scaled to [0, 1] for the fit's conditioning, then the coefficients scaled back.
+  const double span = std::max<double>(1.0, static_cast<double>(n - 1));
+  Eigen::MatrixXd a(n, 5);
+  Eigen::VectorXd y(n);
+  for (Eigen::Index j = 0; j < n; ++j) {
+    const double x = static_cast<double>(j) / span;
+    double p = 1.0;
+    for (int k = 0; k < 5; ++k, p *= x) a(j, k) = p;
+    y(j) = where[static_cast<std::size_t>(j)] * slantStep;  // from the near time, s
+  }
+  const Eigen::VectorXd b = a.colPivHouseholderQr().solve(y);
+  double scale = 1.0;
+  for (int k = 0; k < 5; ++k, scale /= span) c[static_cast<std::size_t>(k)] = b(k) * scale;
+  c[0] += nearTime;
+  for (Eigen::Index j = 0; j < n; ++j) {
+    double v = 0.0, p = 1.0;
+    for (int k = 0; k < 5; ++k, p *= static_cast<double>(j)) v += c[static_cast<std::size_t>(k)] * p;
+    worst = std::max(worst, std::fabs(v - (nearTime + y(j))));
+  }
+  return c;
+}
+
 void resample_power(const std::vector<double>& power, const std::vector<double>& where, std::vector<float>& amplitude) {
   amplitude.assign(where.size(), 0.0f);
   if (power.empty()) return;
@@ -258,6 +289,8 @@ int run_strip_multilook(const StripMultilookRequest& req, StripMultilookResult& 
     where = ground_to_slant(distance, step);
     if (where.empty()) return fail(res, kRejected, "the ground distances of the slant cells do not increase");
     res.rangeSpacing = step;
+    double worst = 0.0;
+    res.groundSlantTime = fit_ground_columns(where, res.nearTime, fr / grid.samplingRate, worst);
   }
   res.lines = lines;
   res.samples = req.groundRange ? static_cast<int>(where.size()) : slantSamples;

@@ -19,7 +19,8 @@
 // centre time (Earth-fixed chords between neighbours, summed).
 //
 // Output files, for output raster R: R (written as "R.part" and renamed when whole), R.hdr and
-// the GDAL sidecar R.vrt, and the annotation R_hdr (the SLC's, with the multilooked grid).
+// the GDAL sidecar R.vrt, and the annotation R_hdr (the SLC's, with the multilooked grid; in
+// ground range also Processing.GroundRangeSlantTimeCoeff, the slant time of each column).
 // Returns 0; 10 for a rejected request (look factors below 1, an input that is not complex, an
 // annotation without the grid); 1 for a failed read or write. Nothing named R is left behind
 // by a failure.
@@ -64,6 +65,12 @@ std::vector<double> ground_to_slant(const std::vector<double>& distance, double 
 /// written as amplitude.
 void resample_power(const std::vector<double>& power, const std::vector<double>& where, std::vector<float>& amplitude);
 
+/// The two-way slant time of ground column j as a polynomial sum_k c_k j^k (degree 4), fitted
+/// to the ground cells' fractional slant cells `where` of a slant grid (nearTime, slantStep).
+/// `worst` receives the largest misfit in seconds.
+std::array<double, 5> fit_ground_columns(const std::vector<double>& where, double nearTime, double slantStep,
+                                         double& worst);
+
 struct StripMultilookRequest {
   std::string slc;         ///< the SLC raster
   std::string output;      ///< the output raster R
@@ -83,6 +90,7 @@ struct StripMultilookResult {
   double lineStep = 0.0;       ///< s
   double nearTime = 0.0;       ///< two-way s of the first output sample
   double rangeSpacing = 0.0;   ///< m (slant, or ground with groundRange)
+  std::array<double, 5> groundSlantTime{};  ///< ground range: slant time of column j, see fit_ground_columns
   std::string error;           ///< why a run failed
 };
 

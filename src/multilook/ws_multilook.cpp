@@ -282,6 +282,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     if (where.empty()) return fail(res, kRejected, "the ground distances of the slant columns do not increase");
     res.samples = static_cast<int>(where.size());
     res.rangeSpacing = cfg.groundStep;
+    double worst = 0.0;
+    res.groundSlantTime = fit_ground_columns(where, sw[0].nearTime, outStep, worst);
   }
 
   const std::string part = output + ".part";

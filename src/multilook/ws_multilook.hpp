@@ -92,6 +92,7 @@ struct WsMultilookResult {
   double slantStep = 0.0;    // s between slant columns
   double rangeSpacing = 0.0; // m of an output column
   double cycle = 0.0;        // s
+  std::array<double, 5> groundSlantTime{};  // ground range: slant time of column j (fit_ground_columns)
   std::string error;
 };
 
