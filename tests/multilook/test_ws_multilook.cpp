@@ -114,6 +114,34 @@ TEST(WsLooks, BurstsFromRecordTimes) {
   EXPECT_DOUBLE_EQ(bursts[2].firstTime, 100.006);
 }
 
+// Weights that would not add up to one, or that reach beyond what a burst holds (half of its 320
+// lines is 0.8 of the 200-line cycle), and burst counts beyond the product are refused.
+TEST(WsMultilook, RefusesWeightsAndBurstCountsItCannotHonour) {
+  const auto& product = uniform_product();
+  struct Case {
+    double w1, w2;
+    int skip, process;
+    int status;
+    const char* words;
+  } cases[] = {
+      {0.2, 0.5, 0, 0, 10, "whole number"},        // 2 W1 + W2 = 0.9: a ripple of 3 dB
+      {0.3, 0.5, 0, 0, 10, "whole number"},        // 1.1
+      {0.0, 1.0, 0, 0, 10, "beyond"},              // sums to one, but needs a whole cycle each side
+      {0.25, 0.5, 4, 2, 10, "Bursts To Skip + Bursts To Process are greater than available bursts"},
+      {0.25, 0.5, 5, 0, 10, "Bursts To Skip + Bursts To Process are greater than available bursts"},
+  };
+  for (const auto& c : cases) {
+    WsMultilookConfig cfg;
+    cfg.w1 = c.w1;
+    cfg.w2 = c.w2;
+    cfg.burstsToSkip = c.skip;
+    cfg.burstsToProcess = c.process;
+    const WsRun r = multilook(product.path, cfg);
+    EXPECT_EQ(r.status, c.status) << c.w1 << " " << c.w2 << " " << c.skip << " " << c.process;
+    EXPECT_NE(r.result.error.find(c.words), std::string::npos) << r.result.error;
+  }
+}
+
 // The level of a uniform scene across the seams and along azimuth, and its speckle.
 TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
   const auto& product = uniform_product();
