@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <filesystem>
+#include <numbers>
 #include <span>
 #include <stdexcept>
 #include <system_error>
@@ -232,15 +233,27 @@ std::array<double, 5> fit_ground_columns(const std::vector<double>& where, doubl
 }
 
 void resample_power(const std::vector<double>& power, const std::vector<double>& where, std::vector<float>& amplitude) {
+  // A 13-tap sinc under a Hann window: detected power is band-limited to twice the look band,
+  // which the looked slant cells sample; linear interpolation would widen a point target.
+  constexpr int kHalf = 6;
   amplitude.assign(where.size(), 0.0f);
   if (power.empty()) return;
-  const std::size_t last = power.size() - 1;
+  const int last = static_cast<int>(power.size()) - 1;
   for (std::size_t g = 0; g < where.size(); ++g) {
     const double x = std::clamp(where[g], 0.0, static_cast<double>(last));
-    const std::size_t i0 = std::min(static_cast<std::size_t>(x), last);
-    const std::size_t i1 = std::min(i0 + 1, last);
-    const double w = x - static_cast<double>(i0);
-    amplitude[g] = static_cast<float>(std::sqrt(std::max(0.0, (1.0 - w) * power[i0] + w * power[i1])));
+    const int centre = static_cast<int>(std::floor(x));
+    const double frac = x - centre;
+    double sum = 0.0, weights = 0.0;
+    for (int k = -kHalf + 1; k <= kHalf; ++k) {
+      const double d = k - frac;
+      const double sinc = std::fabs(d) < 1e-12 ? 1.0 : std::sin(std::numbers::pi * d) / (std::numbers::pi * d);
+      const double hann = 0.5 + 0.5 * std::cos(std::numbers::pi * d / (kHalf + 1));
+      const double w = sinc * hann;
+      const int i = std::clamp(centre + k, 0, last);  // the edge sample repeats beyond the ends
+      sum += w * power[static_cast<std::size_t>(i)];
+      weights += w;
+    }
+    amplitude[g] = static_cast<float>(std::sqrt(std::max(0.0, weights != 0.0 ? sum / weights : 0.0)));
   }
 }
 

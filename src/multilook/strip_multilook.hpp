@@ -14,7 +14,7 @@
 // first line and sample, with steps F times the input's; a point at input position p lands at
 // output position (p - (F - 1)/2) / F.
 //
-// Ground range: each multilooked line is resampled in power onto a grid of equal steps on the
+// Ground range: each multilooked line is resampled in power (windowed sinc) onto a grid of equal steps on the
 // ellipsoid, from the distances of the slant cells' zero-Doppler ground points at the scene's
 // centre time (Earth-fixed chords between neighbours, summed).
 //
@@ -61,8 +61,8 @@ int ground_distances(const SlcGrid& grid, double azimuthTime, double nearTime, d
 /// from increasing `distance`. Empty when the distances do not increase.
 std::vector<double> ground_to_slant(const std::vector<double>& distance, double step);
 
-/// Resamples a line of power (linear between slant cells) at the fractional cells `where`,
-/// written as amplitude.
+/// Resamples a line of power at the fractional cells `where` (12 cells of Hann-windowed sinc
+/// around each, normalised to sum to one), written as amplitude.
 void resample_power(const std::vector<double>& power, const std::vector<double>& where, std::vector<float>& amplitude);
 
 /// The two-way slant time of ground column j as a polynomial sum_k c_k j^k (degree 4), fitted

@@ -22,7 +22,9 @@ constexpr int kRejected = 10;
 constexpr double kHalfLightSpeed = 149896229.0;
 constexpr int kMostLooks = 15;
 constexpr int kMostDecimation = 32767;
-constexpr double kLookHamming = 0.54;
+// Zero padding of a range line, as a share of its samples: the tails of a bright target's looks
+// wrap around the transform into the padding, not onto the far end of the line.
+constexpr int kPaddingShare = 4;
 
 int fail(WsMultilookResult& res, int status, std::string text) {
   res.error = std::move(text);
@@ -56,15 +58,6 @@ std::vector<Burst> find_bursts(const std::vector<double>& times, double lineStep
     ++bursts.back().lines;
   }
   return bursts;
-}
-
-std::vector<float> look_window(int bins) {
-  std::vector<float> w(static_cast<std::size_t>(std::max(bins, 0)), 1.0f);
-  if (bins < 2) return w;
-  for (int j = 0; j < bins; ++j)
-    w[static_cast<std::size_t>(j)] =
-        static_cast<float>(kLookHamming - (1.0 - kLookHamming) * std::cos(2.0 * std::numbers::pi * (j + 0.5) / bins));
-  return w;
 }
 
 double burst_weight(double v, double w1, double w2) {
@@ -191,7 +184,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   std::array<std::vector<float>, 5> power;
   std::array<int, 5> outSamples{};
   for (std::size_t s = 0; s < 5; ++s) {
-    const int n = dsp::genpow((sw[s].samples + decimation - 1) / decimation, 1) * decimation;
+    const int padded = sw[s].samples + sw[s].samples / kPaddingShare;
+    const int n = dsp::genpow((padded + decimation - 1) / decimation, 1) * decimation;
     const int k = n / decimation;
     outSamples[s] = sw[s].samples / decimation;
     power[s].assign(static_cast<std::size_t>(lines) * outSamples[s], 0.0f);
@@ -199,14 +193,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     const int bandBins = std::max(1, round_half_away(plan.band / fs * n));
     const int fullBins = std::max(1, round_half_away(cfg.rangeBand / fs * n));
     if (bandBins > k) return fail(res, kRejected, "a range look is wider than the decimated rate");
-    // Each look is weighted by a Hamming window over its band, which keeps the sidelobes of a
-    // bright target (and their wrap around the line) below the clutter; the scale takes the
-    // window's mean square out again, so the level stays that of the scene.
-    const std::vector<float> window = look_window(bandBins);
-    double meanSquare = 0.0;
-    for (float v : window) meanSquare += static_cast<double>(v) * v;
-    meanSquare /= bandBins;
-    const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks * meanSquare);
+    // Looks are cut square: their resolution is the ground resolution asked for.
+    const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks);
     dsp::cvector spectrum(static_cast<std::size_t>(n)), small(static_cast<std::size_t>(k));
     dsp::fft_plan forward, backward;
     if (dsp::fft_makep_c(forward, n, n, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(backward, k, k, 1, 1, -2, 0, 1) != 0)
@@ -242,7 +230,7 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
           for (int j = 0; j < bandBins; ++j) {
             const int rel = j - bandBins / 2;  // from the look's centre
             small[static_cast<std::size_t>(((rel % k) + k) % k)] =
-                window[static_cast<std::size_t>(j)] * spectrum[static_cast<std::size_t>((((centreBin + rel) % n) + n) % n)];
+                spectrum[static_cast<std::size_t>((((centreBin + rel) % n) + n) % n)];
           }
           dsp::pfft_c(backward, small);
           for (int i = 0; i < outSamples[s]; ++i) acc[static_cast<std::size_t>(i)] += std::norm(small[static_cast<std::size_t>(i)]);

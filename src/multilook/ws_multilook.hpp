@@ -9,8 +9,8 @@
 //     of overlapping bursts add up to one at every line, so the bursts sum in power into one
 //     continuous image without scalloping. The burst centre is the middle of the burst's lines.
 //   - range: m looks of band b each, spread evenly over the sub-swath's band B, cut from the
-//     line's spectrum under a Hamming window, brought to base band at the decimated rate and
-//     detected; each look's
+//     line's spectrum (square, so that a look resolves the ground resolution asked for), brought
+//     to base band at the decimated rate and detected; each look's
 //     power is scaled by its share of the band, so a uniform scene keeps its level whatever b is
 //     in each sub-swath, and the m looks are averaged.
 // The sub-swaths are joined on the decimated range grid of the first, each keeping its columns
@@ -62,9 +62,6 @@ struct Burst {
 /// Bursts from the record times: a new burst starts where the time does not move on by about
 /// one line step.
 std::vector<Burst> find_bursts(const std::vector<double>& times, double lineStep);
-
-/// The Hamming window (0.54) over the `bins` bins of a range look, centred on the look.
-std::vector<float> look_window(int bins);
 
 /// Weight (amplitude) of a line v burst cycles from its burst's centre.
 double burst_weight(double v, double w1, double w2);

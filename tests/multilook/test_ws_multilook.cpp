@@ -197,22 +197,10 @@ TEST(WsMultilook, UniformSceneIsFlatAcrossSeamsAndBursts) {
     LookPlan plan;
     ASSERT_EQ(plan_looks(16e6, r.swaths[s].incidence, 150, plan), 0);
     const auto centres = look_centres(looks, plan.band, 16e6);
-    // Correlation of two looks: the overlap of their windowed bands, on a fine frequency grid.
-    auto correlation = [&](double a, double b) {
-      double cross = 0.0, own = 0.0;
-      for (double f = -9e6; f <= 9e6; f += 2e3) {
-        auto win = [&](double centre) {
-          const double x = (f - centre) / plan.band + 0.5;
-          return x < 0.0 || x >= 1.0 ? 0.0 : 0.54 - 0.46 * std::cos(2.0 * M_PI * x);
-        };
-        cross += win(a) * win(b);
-        own += win(a) * win(a);
-      }
-      return cross / own;
-    };
+    // Two looks of a flat spectrum correlate by the share of band they have in common.
     double rho2 = 0.0;
     for (double a : centres)
-      for (double b : centres) rho2 += std::pow(correlation(a, b), 2.0);
+      for (double b : centres) rho2 += std::pow(std::max(0.0, 1.0 - std::fabs(a - b) / plan.band), 2.0);
     const double rangeEnl = looks * looks / rho2;
     double inverse = 0.0, sum = 0.0, sum2 = 0.0;
     std::size_t n = 0;
@@ -275,6 +263,59 @@ TEST(WsMultilook, TargetInAnOverlapAppearsOnceAtItsPosition) {
     EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].first, line, 1.0);
     EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].second, expected[k], 1.0);
   }
+}
+
+}  // namespace
+}  // namespace sar::multilook
+
+namespace sar::multilook {
+namespace {
+
+// Ground range: a point target measures 0.886 GrResolution across its -3 dB width (looks cut
+// square to the band of GrResolution), sampled every GrSamplingStep.
+TEST(WsMultilook, GroundRangeResolutionOfAPointTarget) {
+  simulator::WssConfig c;
+  c.out_dir = temp_dir("wss_resolution");
+  c.orbit_path = kOrbit;
+  c.samples = 600;
+  c.overlap = 60;
+  c.bursts = 4;
+  c.clutter_std = 3.0;
+  c.targets = {{3, 430.0, 300.0, 30000.0}};
+  const auto product = simulator::write_wss_product(c);
+  WsMultilookConfig cfg;
+  cfg.groundRange = 1;
+  const WsRun r = multilook(product.path, cfg);
+  ASSERT_EQ(r.status, 0) << r.result.error;
+  std::size_t peak = 0;
+  for (std::size_t i = 0; i < r.amplitude.size(); ++i)
+    if (r.amplitude[i] > r.amplitude[peak]) peak = i;
+  const int line = static_cast<int>(peak / r.samples), column = static_cast<int>(peak % r.samples);
+  // The power cut across range, interpolated finely (the detected looks are band-limited to
+  // twice the look band, which the 75 m steps sample).
+  const int half = 16, over = 32, n = 2 * half;
+  ASSERT_GE(column - half, 0);
+  ASSERT_LE(column + half, r.samples);
+  std::vector<std::complex<double>> cut(n);
+  for (int k = 0; k < n; ++k) {
+    const double a = r.amplitude[static_cast<std::size_t>(line) * r.samples + column - half + k];
+    cut[k] = a * a;
+  }
+  // Interpolation by the sum of shifted sincs of the samples (periodic over the cut).
+  auto power_at = [&](double x) {
+    double v = 0.0;
+    for (int k = 0; k < n; ++k) {
+      const double d = x - k;
+      v += cut[k].real() * (std::fabs(d) < 1e-12 ? 1.0 : std::sin(M_PI * d) / (M_PI * d));
+    }
+    return v;
+  };
+  const double top = power_at(half);
+  double left = half, right = half;
+  while (left > 0 && power_at(left) > 0.5 * top) left -= 1.0 / over;
+  while (right < n - 1 && power_at(right) > 0.5 * top) right += 1.0 / over;
+  const double width = (right - left) * cfg.groundStep;
+  EXPECT_NEAR(width, 0.886 * cfg.groundResolution, 0.05 * 0.886 * cfg.groundResolution);
 }
 
 }  // namespace
