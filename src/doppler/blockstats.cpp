@@ -254,6 +254,9 @@ class BlockPass {
     out.contrast = 0.0;
     out.power = 0.0;
     out.noise = 0.0;
+    out.meanPower = std::isfinite(P) ? P / (static_cast<double>(ns) * nl) : 0.0;
+    out.lag1 = std::isfinite(Rr) && std::isfinite(Ri) ? std::complex<double>(Rr, Ri) : std::complex<double>();
+    out.lagTerms = static_cast<int64_t>(ns) * std::max(0, nl - 1);
     if (!(F > 0.0) || !std::isfinite(F)) return;
     const double pm = P / ns;
     const double a = std::hypot(Rr, Ri) / ns;
@@ -436,6 +439,18 @@ int getnadcpoly(dcimage& image, dcestconf& conf, DopplerPoly& poly) {
       !std::isfinite(image.platformSpeed))
     return rejected("getnadcpoly: PRF, antenna length, sampling rate and carrier must be positive");
 
+  conf.gates = CentroidGates{};
+  if (conf.Blocks > 0 && conf.Blockl > 0 && (image.samples < conf.Blocks || image.lines < conf.Blockl)) {
+    // Too small a scene for one block: the geometry is all there is to go by.
+    conf.gates.source = CentroidSource::Geometry;
+    conf.gates.failed = "block grid";
+    conf.gates.reason = "the image (" + std::to_string(image.lines) + " lines of " + std::to_string(image.samples) +
+                        " samples) is smaller than one estimation block";
+    base::report(base::kReportWarning, "Doppler centroid: " + conf.gates.reason + ": the geometric centroid applied");
+    conf.decision = AmbiguityDecision::GeometryFallback;
+    poly[0] = conf.geometricCentroid;
+    return 0;
+  }
   print_progress(conf, "* Setting Processable Buffer\n");
   if (int st = frame.check(setprocbuf(conf, image))) return st;
 

@@ -31,8 +31,13 @@ struct dcblock {
   double noise = 0.0;      ///< noise power per range bin
   double snr = 0.0;
   double phaseVariance = 0.0;
-  int32_t good = 0;    ///< valid with a positive SNR: enters the polynomial fit
+  int32_t good = 0;    ///< valid with a positive SNR and a signal: enters the polynomial fit
   int32_t filled = 0;  ///< centroid taken from neighbours
+  // Kept for every block, valid or not.
+  double meanPower = 0.0;             ///< mean power per sample
+  std::complex<double> lag1{};        ///< lag-one azimuth correlation summed over the block
+  int64_t lagTerms = 0;               ///< products in that sum
+  int32_t signal = 0;  ///< its lag-one correlation stands clear of what the noise floor gives
 };
 
 /// A high-contrast block chosen for the multi-look beat frequency estimator.
@@ -66,6 +71,30 @@ enum class AmbiguityDecision : int32_t {
   Mlbf = 2,              ///< beat frequency estimator, reliable
   Wdar = 3,              ///< wavelength diversity estimator alone (beat frequency unreliable)
   GeometryFallback = 4,  ///< neither estimator could decide: geometric prediction applied
+};
+
+/// Where the applied centroid came from.
+enum class CentroidSource : int32_t {
+  Fit = 0,       ///< the fitted surface of the blocks, all gates passed
+  Constant = 1,  ///< one fractional centroid from the lag-one correlation of all signal blocks
+  Geometry = 2,  ///< the orbit and attitude law alone
+};
+
+/// The plausibility checks of a data estimate and what they found. A bound of 0 means the
+/// check was not made.
+struct CentroidGates {
+  CentroidSource source = CentroidSource::Fit;
+  std::string failed;           ///< the first gate that failed ("" when none did)
+  std::string reason;           ///< its value against its bound, in words
+  double noiseFloor = 0.0;      ///< mean noise power per sample the signal test used
+  int32_t signalBlocks = 0;     ///< blocks whose lag-one correlation shows a signal
+  double slopeLow = 0.0, slopeHigh = 0.0;  ///< allowed range slopes, Hz/s
+  double slopeWorst = 0.0;      ///< fitted slope farthest from the geometric one, Hz/s
+  double outliers = 0.0;        ///< blocks set aside as lying off the surface of the others
+  double scatter = 0.0;         ///< weighted scatter of the block centroids about the fit over its prediction
+  double scatterBound = 0.0;
+  double constantCycles = 0.0;  ///< the fractional centroid of all signal blocks, cycles
+  double constantCoherence = 0.0;  ///< its lag-one magnitude over the noise-only magnitude
 };
 
 namespace detail {
@@ -111,6 +140,17 @@ struct dcestconf {
   double carrier = 0.0;            ///< radar frequency, Hz
   double fs = 0.0;                 ///< range sampling rate, Hz
   double geometricCentroid = 0.0;  ///< Hz at scene centre, from the orbit geometry
+  /// Range slope of the centroid across the swath the orbit and the attitude law predict, and
+  /// the largest change of it an attitude error can bring (Hz per second of two-way time). A
+  /// fitted slope outside geometricSlope +- slopeTolerance is not applied; a tolerance of 0
+  /// switches the check off.
+  double geometricSlope = 0.0;
+  double slopeTolerance = 0.0;
+  /// Largest attitude error (yaw and pitch, degrees) the slope tolerance allows for.
+  double AttitudeErrorBound = 1.0;
+  /// Largest weighted scatter of the block centroids about the fit, in standard deviations of
+  /// the blocks' own phase variance.
+  double CentroidScatterBound = 10.0;
   /// Core mode: the range-compressed matrix, lines x samples of the image description.
   std::span<const fcomplex> coreMatrix;
 
@@ -134,6 +174,7 @@ struct dcestconf {
   std::vector<float> contrastMap;  ///< mean squared power per patch, then the contrast
   ambstats mlbfStats;
   ambstats wdarStats;
+  CentroidGates gates;
   /// Plane of the phase field: range slope, azimuth slope (cycles per sample, per line), offset.
   std::array<double, 3> plane{};
   std::shared_ptr<detail::WdarState> wdar;

@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstdio>
 #include <numbers>
+#include <string>
 #include <vector>
 
 #include "base/diagnostics.hpp"
@@ -252,27 +253,248 @@ int fillblocks(dcestconf& conf, const dcimage& image) {
   return 0;
 }
 
+namespace {
+
+// A block votes when the magnitude of its lag-one correlation stands this many times above the
+// magnitude pure noise at the floor gives (that magnitude is Rayleigh distributed: a noise
+// block passes with probability exp(-k^2), about 1e-4 for k = 3).
+constexpr double kSignalFactor = 3.0;
+// The weighted scatter of the block centroids about the fit may exceed what their phase
+// variances predict by dcestconf::CentroidScatterBound (10 by default, in standard deviations)
+// before the fit is refused. The variance model knows only the antenna, the SNR and the
+// contrast: clutter of varying texture and bright scatterers scatter up to about 5 of them,
+// while blocks that each see part of a point target's aperture scatter by a hundred and more.
+
+double wrap_cycles(double v) { return v - std::round(v); }
+
+std::string format(const char* fmt, double a, double b = 0.0, double c = 0.0) {
+  char t[256];
+  std::snprintf(t, sizeof t, fmt, a, b, c);
+  return t;
+}
+
+/// The noise floor (median power per sample over the blocks: most blocks of a dark scene hold
+/// noise alone, and over clutter the median errs high, which only makes the test stricter than
+/// needed for blocks far brighter than noise) and the signal test of every block.
+void mark_signal_blocks(dcestconf& conf) {
+  std::vector<double> powers;
+  for (const auto& b : conf.blocks)
+    if (b.lagTerms > 0 && b.meanPower > 0.0 && std::isfinite(b.meanPower)) powers.push_back(b.meanPower);
+  double floor = 0.0;
+  if (!powers.empty()) {
+    const auto mid = powers.begin() + static_cast<std::ptrdiff_t>(powers.size() / 2);
+    std::nth_element(powers.begin(), mid, powers.end());
+    floor = *mid;
+  }
+  conf.gates.noiseFloor = floor;
+  conf.gates.signalBlocks = 0;
+  for (auto& b : conf.blocks) {
+    const double noiseOnly = std::sqrt(static_cast<double>(b.lagTerms)) * floor;
+    b.signal = b.lagTerms > 0 && std::abs(b.lag1) > kSignalFactor * noiseOnly ? 1 : 0;
+    if (!b.signal) b.good = 0;
+    conf.gates.signalBlocks += b.signal;
+  }
+}
+
+/// Range slope (Hz per second of two-way time) of the polynomial in cycles at (x, y).
+double slope_hz(std::span<const double> c, double x, double y, double prf, double fs) {
+  const double d = c[1] + c[3] * y + 2.0 * c[4] * x + 3.0 * c[5] * x * x + 4.0 * c[6] * x * x * x;
+  return d * prf * fs;
+}
+
+/// The fitted surface's range slope must lie where the geometry can put it, across the whole
+/// swath and at the top, middle and bottom of the scene.
+bool slope_gate(dcestconf& conf, const dcimage& image, std::span<const double> c) {
+  auto& g = conf.gates;
+  if (!(conf.slopeTolerance > 0.0)) return true;
+  g.slopeLow = conf.geometricSlope - conf.slopeTolerance;
+  g.slopeHigh = conf.geometricSlope + conf.slopeTolerance;
+  const double rows[3] = {static_cast<double>(conf.blocks.front().line), image.lines / 2.0,
+                          static_cast<double>(conf.blocks.back().line)};
+  g.slopeWorst = conf.geometricSlope;
+  for (const double y : rows)
+    for (int k = 0; k <= 8; ++k) {
+      const double x = (image.samples - 1) * k / 8.0;
+      const double v = slope_hz(c, x, y, image.prf, conf.fs);
+      if (std::fabs(v - conf.geometricSlope) > std::fabs(g.slopeWorst - conf.geometricSlope)) g.slopeWorst = v;
+    }
+  if (g.slopeWorst >= g.slopeLow && g.slopeWorst <= g.slopeHigh) return true;
+  g.failed = "range slope";
+  g.reason = format("fitted range slope %.4g Hz/s outside the geometric band %.4g .. %.4g Hz/s", g.slopeWorst,
+                    g.slopeLow, g.slopeHigh);
+  return false;
+}
+
+/// The blocks that measured their centroid must lie about the surface as their phase variances
+/// predict: sqrt(chi^2 / degrees of freedom) at most dcestconf::CentroidScatterBound.
+bool scatter_gate(dcestconf& conf, std::span<const double> c) {
+  auto& g = conf.gates;
+  double chi2 = 0.0;
+  int n = 0;
+  for (const auto& b : conf.blocks) {
+    if (!b.good || b.filled || !(b.phaseVariance > 0.0)) continue;
+    const double r = wrap_cycles(b.centroid - dccycles(c, b.sample, b.line));
+    chi2 += r * r / b.phaseVariance;
+    ++n;
+  }
+  int terms = 0;
+  for (std::size_t j = 0; j < 7; ++j) terms += c[j] != 0.0 ? 1 : 0;
+  const int dof = std::max(1, n - terms);
+  g.scatter = std::sqrt(chi2 / dof);
+  g.scatterBound = conf.CentroidScatterBound;
+  if (g.scatter <= g.scatterBound) return true;
+  g.failed = "block scatter";
+  g.reason = format("weighted scatter of %.0f blocks about the fit %.3g times their predicted spread (bound %.3g)",
+                    static_cast<double>(n), g.scatter, g.scatterBound);
+  return false;
+}
+
+/// One fractional centroid from the lag-one correlations of every signal block summed as
+/// complex numbers: each block counts with its power, and the blocks that each hold part of a
+/// point target's aperture add up to the whole aperture. False when the sum does not stand
+/// clear of noise.
+bool constant_centroid(dcestconf& conf) {
+  auto& g = conf.gates;
+  std::complex<double> sum{};
+  double terms = 0.0;
+  for (const auto& b : conf.blocks)
+    if (b.signal) {
+      sum += b.lag1;
+      terms += static_cast<double>(b.lagTerms);
+    }
+  const double noiseOnly = std::sqrt(terms) * g.noiseFloor;
+  g.constantCoherence = noiseOnly > 0.0 ? std::abs(sum) / noiseOnly : (std::abs(sum) > 0.0 ? HUGE_VAL : 0.0);
+  g.constantCycles = std::abs(sum) > 0.0 ? std::arg(sum) / kTwoPi : 0.0;
+  return terms > 0.0 && g.constantCoherence > kSignalFactor;
+}
+
+/// The surface of the blocks: fill, phase variances, plane, fit. False (with the reason in the
+/// gates) when the blocks cannot carry a surface; a status of a failure that is no property
+/// of the data (a file, a transform) is returned through `status`.
+bool fitted_surface(const dcimage& image, dcestconf& conf, std::array<double, 7>& c, int& status) {
+  auto& g = conf.gates;
+  status = 0;
+  const auto good = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const dcblock& b) { return b.good; });
+  if (good <= 7) {
+    g.failed = "signal blocks";
+    g.reason = format("%.0f blocks with a signal, at least 8 needed for a surface", static_cast<double>(good));
+    return false;
+  }
+  if (fillblocks(conf, image) != 0 || getkrstd(image, conf) != 0) {
+    g.failed = "signal blocks";
+    g.reason = "the block statistics do not carry a surface";
+    return false;
+  }
+  if ((status = unwrapdcbin(conf, conf.plane)) != 0) return false;
+  if (getdccoef(conf, conf.plane, c) != 0) {
+    g.failed = "signal blocks";
+    g.reason = "the surface fit failed";
+    return false;
+  }
+  // Blocks that see part of a bright point target's aperture (or a patch moving on its own)
+  // give centroids far off the surface of the rest: they are set aside and the surface fitted
+  // again without them, twice at most. Off means beyond three robust standard deviations of the
+  // normalised residuals, and never within three of the blocks' own predicted spread.
+  const auto fitted = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const dcblock& b) { return b.good && !b.filled; });
+  for (int pass = 0; pass < 2; ++pass) {
+    std::vector<double> z;
+    for (const auto& b : conf.blocks)
+      if (b.good && !b.filled && b.phaseVariance > 0.0)
+        z.push_back(std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance));
+    if (z.size() < 8) break;
+    std::vector<double> sorted(z);
+    const auto mid = sorted.begin() + static_cast<std::ptrdiff_t>(sorted.size() / 2);
+    std::nth_element(sorted.begin(), mid, sorted.end());
+    const double limit = std::max(3.0, 3.0 * 1.4826 * *mid);
+    int dropped = 0;
+    for (auto& b : conf.blocks)
+      if (b.good && !b.filled && b.phaseVariance > 0.0 &&
+          std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance) > limit) {
+        b.good = 0;
+        ++dropped;
+      }
+    if (dropped == 0) break;
+    g.outliers += dropped;
+    if (getdccoef(conf, conf.plane, c) != 0) {
+      g.failed = "block scatter";
+      g.reason = "too few blocks left on the surface once those off it are set aside";
+      return false;
+    }
+  }
+  if (3 * g.outliers > fitted) {
+    g.failed = "block scatter";
+    g.reason = format("%.0f of %.0f blocks lie off the fitted surface (at most a third may)", g.outliers,
+                      static_cast<double>(fitted));
+    return false;
+  }
+  return true;
+}
+
+}  // namespace
+
 int dcnapoly(const dcimage& image, dcestconf& conf, DopplerPoly& poly) {
   base::Frame frame("dcnapoly");
   if (conf.blocks.empty()) return 10;
+  conf.gates = CentroidGates{};
   ratesnr(conf);
-  if (int st = frame.check(fillblocks(conf, image))) return st;
+  mark_signal_blocks(conf);
+  auto& g = conf.gates;
 
-  // Phase variances, dominant plane, fit of the residual.
-  if (int st = frame.check(getkrstd(image, conf))) return st;
-  if (int st = frame.check(unwrapdcbin(conf, conf.plane))) return st;
+  // The surface of the blocks, if it is plausible; else one constant from all signal blocks;
+  // else the geometry. Each step down is reported with the gate that sent it there.
   std::array<double, 7> c{};
-  if (int st = frame.check(getdccoef(conf, conf.plane, c))) return st;
-
-  // The ambiguity field always holds the value that is applied: an unresolved ambiguity leaves
-  // the geometric fallback in it and is reported.
-  const int st = estambiguity(conf, image, c);
-  if (st == 1) {
-    std::printf("\nWARNING: unresolved ambiguity!\n");
-  } else if (st != 0) {
-    return frame.check(st);
+  int status = 0;
+  g.source = CentroidSource::Fit;
+  bool surface = fitted_surface(image, conf, c, status);
+  if (surface) {
+    // Both checks are made, so that the result file shows both values; the first to fail is named.
+    const bool slopeOk = slope_gate(conf, image, c);
+    const std::string slopeFailed = g.failed, slopeReason = g.reason;
+    const bool scatterOk = scatter_gate(conf, c);
+    if (!slopeOk) {
+      g.failed = slopeFailed;
+      g.reason = slopeReason;
+    }
+    surface = slopeOk && scatterOk;
   }
-  c[0] += conf.ambiguity;
+  if (status != 0) return frame.check(status);
+  if (!surface) {
+    c = {};
+    if (constant_centroid(conf)) {
+      g.source = CentroidSource::Constant;
+      c[0] = g.constantCycles;
+    } else {
+      g.source = CentroidSource::Geometry;
+      if (g.failed.empty() || g.signalBlocks == 0) {
+        g.failed = "signal blocks";
+        g.reason = format("%.0f blocks with a signal above the noise floor %.4g", static_cast<double>(g.signalBlocks),
+                          g.noiseFloor);
+      }
+    }
+    static constexpr const char* kApplied[3] = {"the fitted surface", "one constant fractional centroid of all signal blocks",
+                                                "the geometric centroid"};
+    const std::string text = "Doppler centroid: " + g.failed + " check failed (" + g.reason + "): " +
+                             kApplied[static_cast<int>(g.source)] + " applied";
+    base::report(base::kReportWarning, text);
+    std::printf("\nWARNING: %s\n", text.c_str());
+  }
+
+  if (g.source == CentroidSource::Geometry) {
+    conf.ambiguity = 0;
+    conf.geometricAmbiguity = 0;
+    conf.decision = AmbiguityDecision::GeometryFallback;
+    c[0] = conf.geometricCentroid / image.prf;
+  } else {
+    // The ambiguity field always holds the value that is applied: an unresolved ambiguity
+    // leaves the geometric fallback in it and is reported.
+    const int st = estambiguity(conf, image, c);
+    if (st == 1) {
+      std::printf("\nWARNING: unresolved ambiguity!\n");
+    } else if (st != 0) {
+      return frame.check(st);
+    }
+    c[0] += conf.ambiguity;
+  }
 
   // Cycles of the PRF over sample and line indices to hertz over seconds.
   const double prf = image.prf, fs = conf.fs;

@@ -165,6 +165,29 @@ int resumefile(const dcestconf& conf, const dcimage& image, const DopplerPoly& p
     base::WriteMyProfileIntArray(dp, "MLBF_votes", mv, path);
     base::WriteMyProfileIntArray(dp, "WDAR_votes", wv, path);
   }
+  // The plausibility checks of the data estimate and what was applied after them.
+  const char* cp = "Centroid_plausibility";
+  const auto& g = conf.gates;
+  static constexpr const char* kSource[3] = {"FIT", "CONSTANT", "GEOMETRY"};
+  WriteMyProfileString(cp, "Applied_centroid", kSource[static_cast<int>(g.source)], path);
+  WriteMyProfileString(cp, "Failed_check", g.failed.empty() ? std::string("NONE") : g.failed, path);
+  if (!g.reason.empty()) WriteMyProfileString(cp, "Failed_check_detail", g.reason, path);
+  dbl(cp, "Noise_floor", g.noiseFloor);
+  num(cp, "Signal_blocks", g.signalBlocks);
+  if (g.slopeHigh > g.slopeLow) {
+    dbl(cp, "Range_slope_Hz/s", g.slopeWorst);
+    dbl(cp, "Range_slope_low_Hz/s", g.slopeLow);
+    dbl(cp, "Range_slope_high_Hz/s", g.slopeHigh);
+  }
+  if (g.scatterBound > 0.0) {
+    dbl(cp, "Blocks_off_the_surface", g.outliers);
+    dbl(cp, "Block_scatter", g.scatter);
+    dbl(cp, "Block_scatter_bound", g.scatterBound);
+  }
+  if (g.source != CentroidSource::Fit) {
+    dbl(cp, "Constant_centroid_cycles", g.constantCycles);
+    dbl(cp, "Constant_centroid_coherence", g.constantCoherence);
+  }
   const int st = base::SyncProfile(path);
   base::FreeProfile(path);
   if (st != 0) {

@@ -114,8 +114,10 @@ using cvector = std::vector<fcomplex, fft_allocator<fcomplex>>;
 void set_fft_threads(int threads);
 int fft_threads();
 
-/// How hard the engine plans a new shape. Measure (the default) times candidate algorithms
-/// once per shape and process; Estimate plans at once and is reproducible between runs.
+/// How hard the engine plans a new shape. Estimate (the default) plans at once from the shape
+/// alone, so a transform gives the same bytes in every run, in any batch, at any position of a
+/// batch and on any thread count. Measure and Patient time candidate algorithms once per shape
+/// and process: sometimes faster, but the choice (and so the rounding) can differ between runs.
 enum class FftPlanning { Estimate, Measure, Patient };
 void set_fft_planning(FftPlanning planning);
 FftPlanning fft_planning();

@@ -423,6 +423,32 @@ int EstDopplerENVI(const std::string& orbit_path, double t, double tau, double t
   return frame.check(EstDopplerENVI(orbit, t, tau, term1, term2, wavelength, p, q, r, s, a, fdc));
 }
 
+int centroid_slope(const OrbitData& orbit, double t, double tau_near, double tau_far, double wavelength,
+                   const PointingLaw& law, double error_deg, CentroidSlope& out) {
+  if (!(tau_far > tau_near) || !(wavelength > 0.0)) return 10;
+  DopplerPrediction mid;
+  if (int status = predict_doppler(orbit, t, 0.5 * (tau_near + tau_far), wavelength, law, mid)) return status;
+  const double t0 = -2.0 * kEnviStep;
+  const double fNear = fdc_point(0.0, tau_near, mid.attitude, wavelength, mid.positions, t0, kEnviStep);
+  const double fFar = fdc_point(0.0, tau_far, mid.attitude, wavelength, mid.positions, t0, kEnviStep);
+  const double span = tau_far - tau_near;
+  out.slope = (fFar - fNear) / span;
+  // Look angles at the satellite of the swath's edges.
+  const Vec3& P = mid.positions[2];
+  const Vec3& V = mid.velocities[2];
+  double look[2] = {0.0, 0.0};
+  const double taus[2] = {tau_near, tau_far};
+  for (int k = 0; k < 2; ++k) {
+    Vec3 X{};
+    if (int status = gr_pt(P, V, {taus[k], 0.0, wavelength, 0.0, 1.0, kWgs84A, kWgs84B}, X)) return status;
+    double squint = 0.0;
+    look[k] = rr2th(P, V, X, 0, squint) * kDegToRad;
+  }
+  const double swing = std::fabs(std::sin(look[1]) - std::sin(look[0])) + std::fabs(std::cos(look[1]) - std::cos(look[0]));
+  out.tolerance = 2.0 * norm(V) / wavelength * std::sin(error_deg * kDegToRad) * swing / span;
+  return 0;
+}
+
 int fdc_poly(double t, double tau_ref, std::span<const Vec3> sv, double t0, double dt, double wavelength,
              const PointingLaw& law, int samples, double sampling_frequency, std::array<double, 3>& coef) {
   return window_poly(false, t, tau_ref, sv, t0, dt, wavelength, law, samples, sampling_frequency, coef);

@@ -144,6 +144,19 @@ int EstDopplerENVI(const std::string& orbit_path, double t, double tau, double t
 int EstDopplerENVI(const OrbitData& orbit, double t, double tau, double term1, double term2, double wavelength,
                    double p, double q, double r, double s, double a, double& fdc);
 
+/// Range slope of the centroid across a swath, in Hz per second of two-way time.
+struct CentroidSlope {
+  double slope = 0.0;      ///< what the orbit and the law predict between the swath's edges
+  double tolerance = 0.0;  ///< the largest change of it that an attitude error can bring
+};
+/// The slope between the two-way times tau_near and tau_far at azimuth time t (sec85), and
+/// its tolerance for errors of up to error_deg in yaw and in pitch: a beam turned by yaw dy and
+/// pitch dp sees the centroid (2 V / wavelength)(dy sin g - dp cos g) at the look angle g, so
+/// across the swath the slope can change by (2 V / wavelength) sin(error) (|d sin g| + |d cos g|)
+/// over the swath's two-way time. Status as predict_doppler, or gr_pt's.
+int centroid_slope(const OrbitData& orbit, double t, double tau_near, double tau_far, double wavelength,
+                   const PointingLaw& law, double error_deg, CentroidSlope& out);
+
 /// Centroid or rate against slant time across a window: three coefficients (highest power
 /// first) in x = slant time - tau_ref, through the near edge, the middle and the far edge of
 /// the boresight window of `samples` at `sampling_frequency`. Status 0, 2 when the boresight

@@ -1,5 +1,6 @@
 #include "geometry/orbit_file.hpp"
 
+#include <algorithm>
 #include <array>
 #include <cctype>
 #include <charconv>
@@ -9,6 +10,7 @@
 #include <optional>
 
 #include "base/convert.hpp"
+#include "base/diagnostics.hpp"
 
 namespace sar::geometry {
 
@@ -310,26 +312,40 @@ OrbitData parse_text_orbit(std::string_view bytes, const std::string& name) {
     raw.push_back(r);
   }
 
-  // Inertial to Earth-fixed: the sidereal angle grows from g0 at the first record.
-  constexpr double kSiderealRatio = 1.00273790934;
-  constexpr double kSolarRate = 7.27220521664304e-05;
-  constexpr double kVelocityRate = 7.2921158553e-05;
   data.vectors.resize(raw.size());
-  for (std::size_t i = 0; i < raw.size(); ++i) {
-    const Raw& r = raw[i];
-    const double theta = (r.time - raw[0].time) * kSiderealRatio * kSolarRate + data.greenwich_angle;
-    const double c = std::cos(theta), s = std::sin(theta);
-    StateVector& sv = data.vectors[i];
-    sv.time = r.time;
-    sv.position = {r.p[0] * c + r.p[1] * s, r.p[1] * c - r.p[0] * s, r.p[2]};
-    const double a = r.v[0] + r.p[1] * kVelocityRate;
-    const double b = r.v[1] - r.p[0] * kVelocityRate;
-    sv.velocity = {a * c + b * s, b * c - a * s, r.v[2]};
-  }
+  for (std::size_t i = 0; i < raw.size(); ++i)
+    data.vectors[i] = inertial_to_earth_fixed(raw[i].time, raw[i].time - raw[0].time, data.greenwich_angle, raw[i].p,
+                                              raw[i].v);
   check_increasing(data, name, -1, 0);
   data.sensing_start = data.vectors.front().time;
   data.sensing_stop = data.vectors.back().time;
+  for (std::size_t i = 1; i < data.vectors.size(); ++i)
+    data.widest_spacing = std::max(data.widest_spacing, data.vectors[i].time - data.vectors[i - 1].time);
+  // Any number of records is taken; the degree 4 fit over five of them stays accurate only for
+  // close records, so a wider spacing is read but reported.
+  if (data.widest_spacing > kTextOrbitMaxSpacing) {
+    char text[160];
+    std::snprintf(text, sizeof text, "%s: orbit records %.1f s apart, wider than %.0f s: positions may be inaccurate",
+                  name.c_str(), data.widest_spacing, kTextOrbitMaxSpacing);
+    base::report(base::kReportWarning, text);
+  }
   return data;
+}
+
+StateVector inertial_to_earth_fixed(double time, double elapsed, double g0, const Vec3& position,
+                                    const Vec3& velocity) {
+  constexpr double kSiderealRatio = 1.00273790934;
+  constexpr double kSolarRate = 7.27220521664304e-05;
+  constexpr double kVelocityRate = 7.2921158553e-05;
+  const double theta = elapsed * kSiderealRatio * kSolarRate + g0;
+  const double c = std::cos(theta), s = std::sin(theta);
+  StateVector sv;
+  sv.time = time;
+  sv.position = {position[0] * c + position[1] * s, position[1] * c - position[0] * s, position[2]};
+  const double a = velocity[0] + position[1] * kVelocityRate;
+  const double b = velocity[1] - position[0] * kVelocityRate;
+  sv.velocity = {a * c + b * s, b * c - a * s, velocity[2]};
+  return sv;
 }
 
 OrbitData read_text_orbit(const std::filesystem::path& path) {

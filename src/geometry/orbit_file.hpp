@@ -69,8 +69,18 @@ struct OrbitData {
   double sensing_start = 0.0;     ///< sec85, first valid time
   double sensing_stop = 0.0;      ///< sec85, last valid time
   double greenwich_angle = 0.0;   ///< rad at the first record (text orbit only)
+  double widest_spacing = 0.0;    ///< s, largest gap between two records
   std::vector<StateVector> vectors;  ///< strictly increasing epochs
 };
+
+/// An inertial state vector turned Earth-fixed: the Greenwich sidereal angle is g0 (rad) at the
+/// reference epoch and grows at the sidereal rate over `elapsed` seconds from it. The velocity
+/// loses the frame's rotation (v - w x p) before the turn. `time` is copied into the result.
+StateVector inertial_to_earth_fixed(double time, double elapsed, double g0, const Vec3& position,
+                                    const Vec3& velocity);
+
+/// Warning of the text orbit reader about record spacings wider than it interpolates well.
+inline constexpr double kTextOrbitMaxSpacing = 60.0;
 
 /// The four ENVISAT-format orbit product types.
 bool is_orbit_product_name(std::string_view name10);

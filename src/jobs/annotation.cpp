@@ -97,7 +97,7 @@ std::array<double, 3> range_coefficients(const stripmap::DopplerPoly& a, double 
 /// first focused line landed against the raw first line and the overlap.
 double azimuth_pixel_shift(const sarpar& par, const procparm& proc, const azimuthconf& az) {
   if (std::fabs(az.azimuthShift) < par.lines) return az.azimuthShift * par.prf;
-  return (proc.firstLineTime - par.azimuthStartTime) * par.prf - az.AzimuthOverlap;
+  return (proc.firstLineTime - par.azimuthStartTime) * par.prf - (proc.focusedLead > 0 ? proc.focusedLead : az.AzimuthOverlap);
 }
 
 /// The five state vectors' Earth-fixed z velocity at `time`, Lagrange through the nodes.
@@ -276,16 +276,18 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
     WriteProfileDoubleArray(s, "SamplingRate", {&par.samplingRate, 1}, f);
     const std::string description(pol);
     WriteMyProfileStringArray(s, "Description", {&description, 1}, f);
-    WriteMyProfileDouble(s, "CalConstProc", kCalConstProc, f);
+    if (product.writeEnvisatCalibration) WriteMyProfileDouble(s, "CalConstProc", kCalConstProc, f);
     WriteMyProfileDouble(s, "RangeLookAngle", proc.centreLook, f);
     WriteMyProfileDouble(s, "IncidenceAngle", proc.centreIncidence, f);
-    WriteMyProfileDouble(s, "EnvisatReferenceElevationAngle", proc.patternCentre, f);
-    std::vector<double> table;
-    table.reserve(proc.pattern.size());
-    for (float v : proc.pattern)
-      table.push_back(v > 0.0f ? 20.0 * std::log10(static_cast<double>(v)) : kPatternFloorDb);
-    WriteMyProfileInt(s, "EnvisatTwoWayAntennaElevationPatternTableNbr", static_cast<int32_t>(table.size()), f);
-    WriteProfileDoubleArray(s, "EnvisatTwoWayAntennaElevationPatternTable", table, f);
+    if (product.writeEnvisatCalibration) {
+      WriteMyProfileDouble(s, "EnvisatReferenceElevationAngle", proc.patternCentre, f);
+      std::vector<double> table;
+      table.reserve(proc.pattern.size());
+      for (float v : proc.pattern)
+        table.push_back(v > 0.0f ? 20.0 * std::log10(static_cast<double>(v)) : kPatternFloorDb);
+      WriteMyProfileInt(s, "EnvisatTwoWayAntennaElevationPatternTableNbr", static_cast<int32_t>(table.size()), f);
+      WriteProfileDoubleArray(s, "EnvisatTwoWayAntennaElevationPatternTable", table, f);
+    }
   }
 
   // RasterInfo
@@ -306,7 +308,8 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
     const auto& nearLate = proc.corners[2];
     const auto& farLate = proc.corners[3];
     std::string sceneData(product.sceneDataPrefix);
-    sceneData += printed("IS%d|", par.swath_number);
+    const std::string swath = product.swath.empty() ? printed("IS%d|", par.swath_number) : std::string(product.swath) + "|";
+    sceneData += swath;
     sceneData += firstLineText.substr(0, 11);
     sceneData += '|';
     sceneData += pol;
@@ -341,10 +344,11 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
     WriteMyProfileStringMatrix(s, "OtherInfo", otherInfo, 2, 16, f);
   }
 
-  WriteMyProfileStringQuote("Sensor", "SensorName", "ENVISAT-1", f);
+  WriteMyProfileStringQuote("Sensor", "SensorName", product.sensorName, f);
   WriteMyProfileDouble("RegistrationCoordinates", "LatNorthing", centre.latitude, f);
   WriteMyProfileDouble("RegistrationCoordinates", "LonEasting", centre.longitude, f);
-  WriteMyProfileString("SwathInfo", "Swath", printed("IS%d|", par.swath_number), f);
+  WriteMyProfileString("SwathInfo", "Swath",
+                       product.swath.empty() ? printed("IS%d|", par.swath_number) : std::string(product.swath) + "|", f);
 
   // The Doppler rate closes the Processing section.
   {
@@ -379,6 +383,10 @@ int convert_annotation(const std::string& headerPath) {
   }
   if (group.write(headerPath, 0, 1) != 0) return 1;
   return 0;
+}
+
+int write_slc_raster_header(const std::string& slcPath, const procparm& proc) {
+  return write_raster_header(slcPath, proc);
 }
 
 int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const dcestconf& /*dc*/,

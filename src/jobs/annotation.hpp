@@ -40,7 +40,16 @@ struct AnnotationProduct {
   std::string_view originData = "ENVISAT_IM0";
   std::string_view sceneDataPrefix = "ENVISAT-1|ENVISAT_IM0|";
   bool writePrfExtracted = true;
+  std::string_view sensorName = "ENVISAT-1";
+  /// Swath text; empty: "IS<n>|" from sarpar's swath number.
+  std::string_view swath = {};
+  /// ENVISAT's calibration constant and elevation pattern table in ChannelInfo.
+  bool writeEnvisatCalibration = true;
 };
+
+/// Writes the raster header of the SLC (slcPath + ".hdr") for the focused grid of `proc`.
+/// 0, or non-zero when it cannot be written.
+int write_slc_raster_header(const std::string& slcPath, const procparm& proc);
 
 /// Writes the profile annotation `headerPath` (an older file there is replaced) and syncs it.
 /// 0, or 1 when the file cannot be written.

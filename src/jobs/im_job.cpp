@@ -103,6 +103,18 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
   dc.Dswst = getInt(dcs, "Dswst", f);
   dc.Amb_flag = getInt(dcs, "Amb_flag", f);
   base::GetCheckMyProfileIntArray(dcs, "Pol_Weights", dc.Pol_Weights, f);
+  {
+    // Optional: the attitude error the centroid's range slope check allows for (degrees).
+    double bound = 0.0;
+    if (base::GetProfileDoubleArray(dcs, "AttitudeErrorBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
+        bound > 0.0)
+      dc.AttitudeErrorBound = bound;
+    // Optional: how far the block centroids may scatter about the fit, in their own standard
+    // deviations.
+    if (base::GetProfileDoubleArray(dcs, "CentroidScatterBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
+        bound > 0.0)
+      dc.CentroidScatterBound = bound;
+  }
   dc.progressFlag = proc.progressFlag;
   dc.Flag_incore = proc.Flag_incore;
 
@@ -192,6 +204,7 @@ int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, ext
                                             kAttitude[3], kAttitude[4], kAttitude[5], kAttitude[6], 0.0,
                                             dc.geometricCentroid)))
       return st;
+    centroid_slope_band(files.orbit, midTime, par, proc, dc);
     dc.inputPath = par.rgfPath;
     dc.outputDir = dir;
     dc.wantedPolyPoints = kWantedPolyPoints;

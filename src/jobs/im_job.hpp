@@ -18,6 +18,10 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
 int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, extconf& extra, enviauxfiles& files,
                 StageFlags& flags);
 
+/// GeoTIFF quick-look of a focused SLC (focused sizes and corners from `proc`). 0, or the
+/// writer's status with the failed stage noted.
+int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
+                    const procparm& proc);
 /// Directory part of a path: up to the last '/' or '\', "." when there is none.
 std::string directory_of(const std::string& path);
 

@@ -31,9 +31,4 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   stop_at("WSprocessor", "WSprocessor()");
 }
 
-int main_focussing_asar_rs(const std::string& listPath) {
-  start_job(listPath, "Focussing ASAR RS", "\nINPUT ASA_RS : [ %s ]\nOUTPUT ROOT NAME : [ %s ]", {0, 2});
-  stop_at("RADARExtract", "RADARExtract()");
-}
-
 }  // namespace sar::jobs

@@ -1,6 +1,7 @@
 #include "jobs/stages.hpp"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <vector>
 
@@ -111,23 +112,16 @@ int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm
   conf.fs = par.samplingRate;
   if (conf.Flag_incore) conf.coreMatrix = std::span<const dsp::fcomplex>(proc.matrix.data(), proc.matrix.size());
   doppler::DopplerPoly poly{};
-  int st = doppler::getnadcpoly(image, conf, poly);
+  const int st = doppler::getnadcpoly(image, conf, poly);
   conf.coreMatrix = {};
-  const auto goodBlocks = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const auto& b) { return b.good; });
-  if (st == -1 || (st == 10 && !conf.blocks.empty() && goodBlocks <= 7)) {
-    // The data hold too little signal for a block estimate, or for too few blocks to fit a
-    // surface (a dark or point-only scene): the orbit's prediction is the best centroid there
-    // is, and the run says so.
-    base::report(base::kReportWarning, "Doppler centroid not measurable from the data: the geometric centroid is used");
-    base::LogPrintf("Doppler centroid from the orbit geometry: %.3f Hz\n", conf.geometricCentroid);
-    poly = doppler::DopplerPoly{};
-    poly[0] = conf.geometricCentroid;
-    poly[7] = par.nearRangeTime;
-    poly[8] = par.azimuthStartTime;
-    st = 0;
-  }
   named("getnadcpoly", st);
   if (st == 0) {
+    static constexpr const char* kSource[3] = {"fitted surface of the blocks", "one constant from all signal blocks",
+                                               "orbit geometry"};
+    const auto& g = conf.gates;
+    base::LogPrintf("Doppler centroid from the %s%s%s%s\n", kSource[static_cast<int>(g.source)],
+                    g.failed.empty() ? "" : " (", g.failed.empty() ? "" : (g.failed + " check: " + g.reason).c_str(),
+                    g.failed.empty() ? "" : ")");
     std::copy(poly.begin(), poly.end(), proc.dopplerCentroid.begin());
     base::LogPrintf("Doppler centroid at the scene centre: %.3f Hz\n",
                     stripmap::DCeval(proc.dopplerCentroid, par.nearRangeTime + 0.5 * proc.rangeSamples / par.samplingRate,
@@ -135,6 +129,31 @@ int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm
   }
   return st;
 }
+void centroid_slope_band(const std::string& orbitPath, double t, const sarpar& par, const procparm& proc,
+                         dcestconf& conf) {
+  conf.geometricSlope = 0.0;
+  conf.slopeTolerance = 0.0;
+  const double nearTau = par.nearRangeTime;
+  const double farTau = par.nearRangeTime + proc.rangeSamples / par.samplingRate;
+  geometry::CentroidSlope band;
+  int st = 10;
+  try {
+    const geometry::OrbitData orbit = geometry::read_orbit(orbitPath);
+    st = geometry::centroid_slope(orbit, t, nearTau, farTau, 299792458.0 / par.carrierFrequency, geometry::PointingLaw{},
+                                  conf.AttitudeErrorBound, band);
+  } catch (const geometry::OrbitError& e) {
+    st = e.status();
+  }
+  if (st != 0 || !std::isfinite(band.slope) || !(band.tolerance > 0.0)) {
+    base::report(base::kReportWarning, "Doppler centroid: no geometric range slope from the orbit; the slope check is off");
+    return;
+  }
+  conf.geometricSlope = band.slope;
+  conf.slopeTolerance = band.tolerance;
+  base::LogPrintf("Doppler centroid range slope allowed by the geometry: %.4g +- %.4g Hz/s (attitude error up to %g deg)\n",
+                  band.slope, band.tolerance, conf.AttitudeErrorBound);
+}
+
 int getgeopoly(sarpar& par, procparm& proc) { return named("getgeopoly", stripmap::getgeopoly(par, proc)); }
 int IMCalibration(sarpar& par, procparm& proc) {
   return named("IMCalibration", stripmap::range_antenna_calibration(par, proc));

@@ -62,6 +62,11 @@ int EstDopplerENVI(const std::string& orbitPath, double t, double tau, double te
 /// Doppler centroid polynomial of the range-compressed image (file `input`, or the matrix in
 /// core mode) into proc.dopplerCentroid, with its ambiguity.
 int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm& proc);
+/// The range slope of the centroid the orbit and the attitude law predict across the range-
+/// compressed swath at azimuth time t, with its tolerance for conf.AttitudeErrorBound, into
+/// conf. An orbit that cannot give it leaves the slope check off, with a warning.
+void centroid_slope_band(const std::string& orbitPath, double t, const sarpar& par, const procparm& proc,
+                         dcestconf& conf);
 int getgeopoly(sarpar& par, procparm& proc);
 int IMCalibration(sarpar& par, procparm& proc);
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az);

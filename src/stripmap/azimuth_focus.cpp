@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "base/diagnostics.hpp"
+#include "base/run_services.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/range_focus.hpp"
 #include "stripmap/raster_files.hpp"
@@ -48,6 +49,49 @@ wkparm scene_wkparm(const sarpar& par, const procparm& proc, const azimuthconf& 
   wk.StoltPadding = az.StoltPadding;
   wk.chirpBandwidth = par.chirp_bandwidth;
   return wk;
+}
+
+/// Lines an azimuth block must hold before and after the lines it outputs, so that each
+/// output line's target has its whole processed aperture (one PRF of Doppler around the
+/// centroid, PRF / |Ka| seconds) inside the block. A target's echoes are centred
+/// -(fd / Ka + shift) seconds from the time of its output line: with no azimuth shift that is
+/// the beam-centre offset of a squinted beam, which puts the aperture off centre, before the
+/// output line for a positive centroid. Taken over the swath's near, middle and far range and
+/// the scene's first, middle and last line. Zero margins when the polynomials give no rate.
+struct ApertureMargins {
+  int32_t lead = 0, trail = 0;
+  double offset = 0.0, aperture = 0.0;  ///< lines, where the lead is largest
+};
+
+ApertureMargins aperture_margins(const sarpar& par, const procparm& proc, double shift) {
+  ApertureMargins m;
+  const double prf = par.prf, fs = par.samplingRate;
+  const int32_t lines = proc.lines, samples = proc.rangeSamples;
+  double lead = 0.0, trail = 0.0;
+  bool any = false;
+  for (const double x : {0.0, 0.5, 1.0})
+    for (const double y : {0.0, 0.5, 1.0}) {
+      const double tau = par.nearRangeTime + x * (samples - 1) / fs;
+      const double t = par.azimuthStartTime + y * (lines - 1) / prf;
+      const double fd = DCeval(proc.dopplerCentroid, tau, t);
+      const double ka = DCeval(proc.dopplerRate, tau, t);
+      if (!std::isfinite(fd) || !std::isfinite(ka) || ka == 0.0) continue;
+      const double offset = -(fd / ka + shift) * prf;
+      const double aperture = prf * prf / std::fabs(ka);
+      if (!any || offset + aperture / 2 > lead) {
+        m.offset = offset;
+        m.aperture = aperture;
+      }
+      lead = any ? std::max(lead, offset + aperture / 2) : offset + aperture / 2;
+      trail = any ? std::max(trail, aperture / 2 - offset) : aperture / 2 - offset;
+      any = true;
+    }
+  if (!any) return m;
+  // A few lines more for the compressed response's own extent at the block's edges.
+  constexpr double kGuard = 16.0;
+  m.lead = static_cast<int32_t>(std::ceil(std::max(0.0, lead) + kGuard));
+  m.trail = static_cast<int32_t>(std::ceil(std::max(0.0, trail) + kGuard));
+  return m;
 }
 
 }  // namespace
@@ -213,11 +257,33 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   wk.rangeShift = shift_from(az.rangeShift, samples, fs, (1.0 / std::cos(squint) - 1.0) * wk.R0 * kTwoOverC);
   const double sceneRangeShift = wk.rangeShift, sceneAzimuthShift = wk.azimuthShift;
 
-  const int32_t Lb = az.LinesInBlock;
-  int32_t Ln = Lb - 2 * ha;
-  const int32_t full = (lines - 2 * ha) / Ln;
-  const bool remainder = (lines - 2 * ha) % Ln != 0;
+  // Lines each block holds before (lead) and after (trail) the lines it outputs: the configured
+  // half overlap, widened where the centroid moves the apertures off centre or the aperture is
+  // longer than the overlap, so that no output line's aperture is cut by its block.
+  const ApertureMargins need = aperture_margins(par, proc, sceneAzimuthShift);
+  int32_t lead = std::max(ha, need.lead), trail = std::max(ha, need.trail);
+  int32_t Lb = az.LinesInBlock;
+  if (lines <= lead + trail) {
+    // Not one line of this scene has its whole aperture: focus what there is with the
+    // configured overlap, and say that apertures are cut.
+    base::report(base::kReportWarning,
+                 "Azimuth focusing: a scene of " + std::to_string(lines) + " lines is too short for whole apertures (" +
+                     std::to_string(need.lead) + " lines before and " + std::to_string(need.trail) +
+                     " after each output line): focused with the configured overlap, apertures cut");
+    lead = trail = ha;
+  } else if (lead != ha || trail != ha) {
+    const int32_t minNet = std::min(512, Lb - 2 * ha);
+    if (Lb - lead - trail < minNet) Lb = lead + trail + minNet;
+    base::LogPrintf("Azimuth blocks: apertures of %.0f lines centred %.0f lines before their output lines need %d "
+                    "lines before and %d after the output of each block (AzimuthOverlap gives %d each): blocks of %d "
+                    "lines hold them\n",
+                    need.aperture, need.offset, need.lead, need.trail, ha, Lb);
+  }
+  int32_t Ln = Lb - lead - trail;
+  const int32_t full = (lines - lead - trail) / Ln;
+  const bool remainder = (lines - lead - trail) % Ln != 0;
   block_counters() = BlockCounters{0, full + (remainder ? 1 : 0)};
+
   const int32_t So = samples - 2 * hr;
 
   std::unique_ptr<InputRaster> in;
@@ -235,10 +301,10 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     int32_t blockLines = Lb;
     if (b == full) {
       blockLines = lines - Ln * full;
-      Ln = blockLines - 2 * ha;
+      Ln = blockLines - lead - trail;
     }
     block_counters().current = b + 1;
-    if (blockLines <= 2 * ha) continue;
+    if (blockLines <= lead + trail) continue;
     const auto count = static_cast<std::size_t>(blockLines) * samples;
     if (core) {
       std::copy_n(proc.matrix.begin() + static_cast<std::ptrdiff_t>(l0) * samples, count, block.begin());
@@ -255,7 +321,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     wk.rangeShift = sceneRangeShift;
     wk.azimuthShift = sceneAzimuthShift;
     if (int st = frame.check(multirg(wk, result, az.SamplesInBlock, 2 * hr, p, dc[7]))) return st;
-    for (int32_t l = ha; l < ha + Ln; ++l) {
+    for (int32_t l = lead; l < lead + Ln; ++l) {
       const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * samples;
       if (core) {
         std::copy(src, src + So, proc.matrix.begin() + static_cast<std::ptrdiff_t>(written) * So);
@@ -271,7 +337,8 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   proc.focusedSamples = So;
   proc.focusedLines = static_cast<int32_t>(written);
   proc.firstSampleTime = par.nearRangeTime - sceneRangeShift + hr / fs;
-  proc.firstLineTime = ha / prf + par.azimuthStartTime + sceneAzimuthShift;
+  proc.firstLineTime = lead / prf + par.azimuthStartTime + sceneAzimuthShift;
+  proc.focusedLead = lead;
   proc.outputCentroid = proc.dopplerCentroid;
   proc.outputRate = proc.dopplerRate;
   progress_update(100.0);

@@ -70,6 +70,7 @@ struct procparm {
   double rangePixelSpacing = 0.0;    // (c/2) / fs, m
   double sceneCentroid = 0.0;        // Hz, scene centre line and first near range
   double firstLineTime = 0.0;        // sec85 of focused line 0
+  int32_t focusedLead = 0;           // range-compressed lines before the first focused line
   double firstSampleTime = 0.0;      // two-way range time of focused sample 0
 };
 

@@ -183,7 +183,10 @@ int range_sizes(const sarpar& par, const procparm& proc, RangeSizes& z) {
     return kRejected;
   }
   z.windowSpan = static_cast<int32_t>(span);
-  z.padded = dsp::genpow(z.rawSamples + z.windowSpan, 1);
+  // A pitch of whole 64-byte units puts every row on the same alignment, so each line's
+  // transform gives the same bytes whether it sits in a file-mode block or the core matrix.
+  constexpr int32_t kUnit = 8;
+  z.padded = dsp::genpow((z.rawSamples + z.windowSpan + kUnit - 1) / kUnit * kUnit, kUnit);
   z.valid = z.rawSamples - z.replicaLength + 1;
   z.output = z.valid + z.windowSpan;
   if (z.padded <= 0) {

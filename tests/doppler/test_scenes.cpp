@@ -201,25 +201,22 @@ TEST(DopplerScenes, PureNoiseCannotBeDecided) {
   dcestconf conf = testing::estimator_config();
   conf.geometricCentroid = 2.7 * shape.prf;
 
-  // White noise has no lag-one correlation: no block passes the acceptance test and there is
-  // nothing to fill the grid from.
-  Outcome o = estimate(shape, scene, conf, dir);
-  EXPECT_EQ(o.status, -1);
-  for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
-
-  // With every block accepted, neither estimator agrees with itself: the orbit geometry is
-  // applied, and the result file says so.
-  conf.Sthr = 1e12;
-  o = estimate(shape, scene, conf, dir);
-  ASSERT_EQ(o.status, 0);
-  for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
-  EXPECT_EQ(o.conf.decision, AmbiguityDecision::GeometryFallback);
-  EXPECT_EQ(o.conf.ambiguity, o.conf.geometricAmbiguity);
-  const std::string path = dir.resume();
-  EXPECT_EQ(testing::resume_text(path, "Ambiguity_decision", "Decided_by"), "GEOMETRY_FALLBACK");
-  EXPECT_EQ(testing::resume_int(path, "Ambiguity_decision", "Applied_ambiguity"), o.conf.geometricAmbiguity);
-  EXPECT_EQ(testing::resume_int(path, "Estimated_polynomial", "Estimated_ambiguity"), o.conf.geometricAmbiguity);
-  EXPECT_LT(std::fabs(o.centre - conf.geometricCentroid), shape.prf / 2.0);
+  // White noise has no lag-one correlation standing clear of its own floor: no block votes,
+  // and the orbit geometry is applied, with the check that sent it there in the result file.
+  // Accepting every block as valid (Sthr) changes nothing: validity is no signal.
+  for (const double sthr : {conf.Sthr, 1e12}) {
+    conf.Sthr = sthr;
+    const Outcome o = estimate(shape, scene, conf, dir);
+    ASSERT_EQ(o.status, 0);
+    for (double a : o.poly) EXPECT_TRUE(std::isfinite(a));
+    EXPECT_EQ(o.conf.gates.source, CentroidSource::Geometry);
+    EXPECT_EQ(o.conf.gates.signalBlocks, 0);
+    EXPECT_DOUBLE_EQ(o.centre, conf.geometricCentroid);
+    const std::string path = dir.resume();
+    EXPECT_EQ(testing::resume_text(path, "Centroid_plausibility", "Applied_centroid"), "GEOMETRY");
+    EXPECT_EQ(testing::resume_text(path, "Centroid_plausibility", "Failed_check"), "signal blocks");
+    EXPECT_EQ(testing::resume_text(path, "Ambiguity_decision", "Decided_by"), "GEOMETRY_FALLBACK");
+  }
 }
 
 TEST(DopplerScenes, FileModeReadsTheSameImageInRowChunks) {
@@ -285,17 +282,28 @@ TEST(DopplerScenes, FilledLinesOfNaNDoNotSpoilTheCentroid) {
   EXPECT_EQ(invalid, o.conf.blocksAcross);  // the blanked block row
 }
 
-TEST(DopplerScenes, ImagesTooSmallForOneBlockAreRejected) {
+// An image narrower or shorter than one block has no grid to estimate on: the geometric
+// centroid is applied, with a warning, never a singular fit. Too little memory for one block
+// row is a configuration error.
+TEST(DopplerScenes, ImagesTooSmallForOneBlockTakeTheGeometry) {
   const TempDir dir("small");
   const SceneSpec& shape = small_spec();
   dcestconf conf = testing::estimator_config();
   conf.Blocks = 2048;  // wider than the scene
   conf.Patchs = 64;
-  EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 10);
+  conf.geometricCentroid = 321.5;
+  Outcome o = estimate(shape, small_scene(), conf, dir);
+  EXPECT_EQ(o.status, 0);
+  EXPECT_EQ(o.conf.gates.source, CentroidSource::Geometry);
+  EXPECT_DOUBLE_EQ(o.centre, 321.5);
   conf = testing::estimator_config();
+  conf.geometricCentroid = -40.0;
   SceneSpec shortSpec = shape;
   shortSpec.lines = 300;  // shorter than a block
-  EXPECT_EQ(estimate(shortSpec, std::span<const fcomplex>(small_scene()).first(300 * 1024), conf, dir).status, 10);
+  o = estimate(shortSpec, std::span<const fcomplex>(small_scene()).first(300 * 1024), conf, dir);
+  EXPECT_EQ(o.status, 0);
+  EXPECT_EQ(o.conf.gates.failed, "block grid");
+  EXPECT_DOUBLE_EQ(o.centre, -40.0);
   conf.Memory = 1000;  // not one block row
   EXPECT_EQ(estimate(shape, small_scene(), conf, dir).status, 1);
   conf = testing::estimator_config();

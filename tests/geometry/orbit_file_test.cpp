@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include "geometry/orbit_file.hpp"
+#include "geometry/orbit_interp.hpp"
 #include "synthetic_orbit.hpp"
 
 namespace sar::geometry {
@@ -173,6 +174,23 @@ TEST(TextOrbit, ReadsRecordsEarthFixed) {
     EXPECT_NEAR(d.vectors[k].position[0], p[0] * std::cos(th) + p[1] * std::sin(th), 1e-3);
     EXPECT_NEAR(d.vectors[k].position[1], p[1] * std::cos(th) - p[0] * std::sin(th), 1e-3);
     EXPECT_NEAR(d.vectors[k].position[2], p[2], 1e-3);
+  }
+}
+
+TEST(TextOrbit, AnySpacingIsReadAndTheWidestIsKnown) {
+  testing::CircularOrbit orbit;
+  for (const double step : {30.0, 60.0, 90.0}) {
+    const OrbitData d = parse_text_orbit(make_text_orbit(orbit, 0.3, 7, step), "text");
+    ASSERT_EQ(d.vectors.size(), 7u);
+    EXPECT_DOUBLE_EQ(d.widest_spacing, step);
+    // Inside the records only: one millisecond past the last is refused.
+    EXPECT_NO_THROW(orbit_state_at(d, d.vectors.back().time));
+    try {
+      orbit_state_at(d, d.vectors.back().time + 1e-3);
+      ADD_FAILURE() << "time past the records accepted";
+    } catch (const OrbitError& e) {
+      EXPECT_EQ(e.status(), orbit_status::kOutsideSpan);
+    }
   }
 }
 

@@ -1,5 +1,7 @@
-// The IM job on a simulated product, through the focussing executable: the extraction stage
-// runs for real and the job stops at the first stage still to come.
+// The IM job on a simulated product narrower than one chirp, through the focussing executable:
+// extraction, orbit, pattern and replica run for real, and range compression refuses a line
+// shorter than the pulse with the stage-failure code and a text saying why, keeping the work
+// files for inspection.
 #include <gtest/gtest.h>
 
 #include "base/convert.hpp"
@@ -9,7 +11,7 @@
 using namespace sar::test;
 namespace sim = sar::simulator;
 
-TEST(ImJobOnSimulatedProduct, ExtractsAndPreparesThenStopsAtRangeBuffers) {
+TEST(ImJobOnSimulatedProduct, ProductNarrowerThanThePulseIsRefusedAfterExtraction) {
   ScratchJob job("im_simulated");
   sim::SimulationConfig c;
   c.out_dir = (job.dir() / "inputs").string();
@@ -30,8 +32,12 @@ TEST(ImJobOnSimulatedProduct, ExtractsAndPreparesThenStopsAtRangeBuffers) {
   const auto record = job.error_lines();
   ASSERT_GE(record.size(), 5u) << job.log();
   EXPECT_EQ(record[3], "IMprocessor()");
-  // Orbit, pattern and replica stand; the in-core range buffer is the first stage to come.
+  // Orbit, pattern and replica stand; the range buffer refuses 400 samples for a pulse of
+  // more than 500.
   EXPECT_EQ(record[4], "init_buffer");
+  EXPECT_NE(job.log().find("is longer than a raw line (400 samples)"), std::string::npos) << job.log();
+  for (const auto& e : fs::recursive_directory_iterator(job.dir()))
+    EXPECT_EQ(e.path().filename().string().find("_slc"), std::string::npos) << e.path();
 
   // The line file of the extraction stays (a failed run leaves its work files). The timeline
   // leaves out the last packet and, at position 700 of a cycle, one line for the boundary.

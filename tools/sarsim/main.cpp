@@ -6,7 +6,7 @@
 //          [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]
 //          [--fault NAME]... [--time "dd-MMM-yyyy hh:mm:ss.uuuuuu"] [--ascending] [--seed S]
 //          [--first-counter C] [--ins-template FILE] [--xca-template FILE] [--no-aux]
-//          [--yaw-steering on|off] [--squint-hz F]
+//          [--yaw-steering on|off] [--squint-hz F] [--yaw-bias-deg D]
 //          [--clutter-db DB] [--clutter-contrast low|high]
 //
 // The beam is steered to zero Doppler unless --yaw-steering on (ENVISAT's yaw steering law)
@@ -43,7 +43,7 @@ void usage() {
       "              [--fault lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated]...\n"
       "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
       "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n"
-      "              [--yaw-steering on|off] [--squint-hz F]\n"
+      "              [--yaw-steering on|off] [--squint-hz F] [--yaw-bias-deg D]\n"
       "              [--clutter-db DB] [--clutter-contrast low|high]\n"
       "       sarsim wss --out DIR [--orbit FILE] [--time T] [--samples N] [--bursts K] [--burst-lines L]\n"
       "              [--cycle-lines C] [--target SWATH,LINE,SAMPLE,AMP]... [--seed S]\n"
@@ -139,6 +139,8 @@ int main(int argc, char** argv) {
         config.attitude.yaw_steering = v == "on";
       } else if (arg == "--squint-hz") {
         config.centroid_hz = number(value(), "Doppler centroid");
+      } else if (arg == "--yaw-bias-deg") {
+        config.attitude.yaw_bias_rad = number(value(), "yaw bias") * 3.14159265358979323846 / 180.0;
       } else if (arg == "--clutter-db") {
         config.clutter.power_db = number(value(), "clutter power");
       } else if (arg == "--clutter-contrast") {

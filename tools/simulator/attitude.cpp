@@ -45,7 +45,8 @@ double latitude_argument(const StateVector& s) {
 AttitudeAngles law(const Attitude& a, double u) {
   if (!a.yaw_steering) return {};
   const double p = a.p_deg * kDeg, cu = std::cos(u);
-  return {p * (1.0 - p * p * cu * cu / 3.0) * cu, a.q_deg * kDeg * std::sin(2.0 * u), a.r_deg * kDeg * std::sin(u)};
+  return {p * (1.0 - p * p * cu * cu / 3.0) * cu + a.yaw_bias_rad, a.q_deg * kDeg * std::sin(2.0 * u),
+          a.r_deg * kDeg * std::sin(u)};
 }
 
 AntennaFrame frame_at_offset(const OrbitModel& orbit, const Attitude& attitude, double offset) {

@@ -33,6 +33,7 @@ struct Attitude {
   double r_deg = 0.050233;  // roll amplitude
   double elevation_deg = 23.0;  // boresight elevation off the antenna's nadir axis
   double squint_rad = 0.0;      // azimuth angle of the beam centre, positive forward
+  double yaw_bias_rad = 0.0;    // a yaw error on top of the law (yaw steering only)
 };
 
 /// Yaw, pitch and roll (rad) at time t (zero without yaw steering).

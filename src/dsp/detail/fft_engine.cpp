@@ -33,7 +33,9 @@ int default_threads() {
 }
 
 std::atomic<int> g_threads{0};
-std::atomic<unsigned> g_flags{FFTW_MEASURE};
+// Estimate by default: a measured plan depends on timings, so two runs of the same job (or the
+// same rows cut into blocks of another size) could get other algorithms and other rounding.
+std::atomic<unsigned> g_flags{FFTW_ESTIMATE};
 
 // The planner lock outlives the cache: it is constructed first (the cache's constructor asks
 // for it), so plans destroyed while the cache is torn down at exit can still take it.
@@ -197,11 +199,11 @@ std::shared_ptr<const Stage> Stage::make(const BatchShape& shape, bool inPlace) 
   return stage;
 }
 
-int Stage::planner_threads_for(int threads) const {
-  // A stage that is one chunk cannot be spread over chunks: let FFTW split it when large.
-  const bool single = chunk_ == shape_.howmany;
-  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
-  return (single && samples >= kParallelSamples) ? threads : 1;
+int Stage::planner_threads_for(int /*threads*/) const {
+  // Never let FFTW split a transform over its own threads: the split depends on the thread
+  // count and changes the rounding, so one and two threads would give other bytes. The kit
+  // runs whole chunks on its threads instead, each chunk through the same single-threaded plan.
+  return 1;
 }
 
 PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int threads) const {

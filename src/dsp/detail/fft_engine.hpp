@@ -74,7 +74,7 @@ int alignment_of(const fcomplex* p);
 /// One stage of a kit plan (all rows or all columns). The batch is cut into chunks of a fixed
 /// number of transforms that depends on the shape only; every chunk runs the same cached
 /// plan, so the result is bitwise the same whatever the thread count. Chunks are spread over
-/// the kit's threads; a stage that is one single large transform uses FFTW's own threads.
+/// the kit's threads; FFTW's own threads are never used, so no transform is split by thread count.
 /// A normalisation factor is applied chunk by chunk while the chunk is still in cache.
 class Stage {
  public:
