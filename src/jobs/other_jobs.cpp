@@ -31,10 +31,4 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   stop_at("WSprocessor", "WSprocessor()");
 }
 
-int main_multilook_wss(const std::string& listPath) {
-  start_job(listPath, "Multilooking ASA WSS",
-            "\nINPUT ASA_RS : [ %s ]\nOUTPUT ROOT NAME : [ %s ]\nINPUT DORIS : [ %s ]", {0, 1, 2});
-  stop_at("images::run", "images::run()");
-}
-
 }  // namespace sar::jobs

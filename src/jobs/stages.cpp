@@ -19,6 +19,7 @@
 #include "stripmap/coords.hpp"
 #include "stripmap/geopoly.hpp"
 #include "stripmap/progress.hpp"
+#include "stripmap/range_calibration.hpp"
 #include "stripmap/range_focus.hpp"
 
 namespace sar::jobs {
@@ -154,7 +155,9 @@ void centroid_slope_band(const std::string& orbitPath, double t, const sarpar& p
 }
 
 int getgeopoly(sarpar& par, procparm& proc) { return named("getgeopoly", stripmap::getgeopoly(par, proc)); }
-int IMCalibration(sarpar&, procparm&) { return stage_not_built("IMCalibration"); }
+int IMCalibration(sarpar& par, procparm& proc) {
+  return named("IMCalibration", stripmap::range_antenna_calibration(par, proc));
+}
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az) {
   const int st = named("azimuthfoc", stripmap::azimuthfoc(par, proc, az));
   if (st == 0)

@@ -22,6 +22,7 @@
 #include "base/run_services.hpp"
 #include "jobs/batch.hpp"
 #include "jobs/discovery.hpp"
+#include "jobs/multilook_step.hpp"
 #include "jobs/setup.hpp"
 
 extern char** environ;
@@ -233,6 +234,7 @@ std::vector<std::string> job_arguments(const ModeRow& mode, const std::string& p
     a[0] = product;
     a[1] = root;
     a[2] = orbit;
+    if (req.groundRange) a[6] = "OK";
   } else {
     a[0] = product;
     a[1] = orbit;
@@ -314,6 +316,10 @@ struct Prepared {
 std::optional<StandaloneOutcome> prepare(const StandaloneRequest& req, Prepared& p) {
   p.mode = find_mode(req.mode);
   if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (im, ap, ws, rs or wss)");
+  if (!req.multilook.empty() && req.mode != "im" && req.mode != "ap")
+    return bad_request("--multilook is for the stripmap modes im and ap");
+  if (req.multilook.empty() && req.mode != "wss" && (req.groundRange || req.groundStep > 0.0))
+    return bad_request("--ground-range and --ground-step go with --multilook (or mode wss)");
   std::error_code ec;
   if (req.product.empty() || !(p.mode->setup == std::string("RS") ? fs::exists(req.product, ec)
                                                                     : fs::is_regular_file(req.product, ec)))
@@ -464,6 +470,13 @@ bool outputs_complete(const StandaloneRequest& req) {
   const std::string stem = product_stem(req.product);
   std::vector<std::string> required = {stem + "_slc", stem + "_slc_hdr"};
   if (req.quickLook) required.push_back(stem + "_slc.tif");
+  if (req.mode == "wss") {
+    // The level 1 job leaves a multilooked image only.
+    const std::string image = looked_product_name(stem, req.groundRange);
+    required = {image, image + "_hdr"};
+    if (req.quickLook) required.push_back(image + ".tif");
+  }
+  if (!req.multilook.empty()) required.push_back(looked_product_name(stem, req.groundRange));
   bool modeOk = false, productOk = false;
   std::size_t found = 0;
   for (const auto& line : read_lines(work / kCompletionMarker)) {
@@ -562,6 +575,22 @@ StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string
     o.summary = "sarfocus: FAILED: " + o.error + "; log: " + log;
     return o;
   }
+  if (!req.multilook.empty()) {
+    StripLooksChoice looks;
+    std::string why = parse_looks(req.multilook, looks);
+    looks.groundRange = req.groundRange;
+    looks.groundStep = req.groundStep;
+    if (why.empty())
+      why = multilook_slc((p.work / (p.stem + "_slc")).string(),
+                          (p.work / looked_product_name(p.stem, req.groundRange)).string(), looks);
+    if (!why.empty()) {
+      o.result = StandaloneResult::kFailed;
+      o.status = 1;
+      o.error = why;
+      o.summary = "sarfocus: FAILED: " + why;
+      return o;
+    }
+  }
   if (std::string why = finish_success(req, p, o); !why.empty()) {
     o.result = StandaloneResult::kFailed;
     o.status = 1;
@@ -622,7 +651,18 @@ std::string parse_standalone_options(const std::vector<std::string>& args, std::
       if (missing.empty() && v.find('=') == std::string::npos) error = "--param takes KEY=VALUE, not '" + v + "'";
       req.params.push_back(v);
     } else if (a == "--params") req.paramsFile = value();
-    else if (a == "--trace") req.tracing = true;
+    else if (a == "--multilook") {
+      const std::string v = value();
+      StripLooksChoice looks;
+      if (missing.empty()) error = parse_looks(v, looks);
+      req.multilook = v;
+    } else if (a == "--ground-range") req.groundRange = true;
+    else if (a == "--ground-step") {
+      int step = 0;
+      const std::string v = value();
+      if (missing.empty()) error = whole_int(v, 1, "--ground-step", step);
+      req.groundStep = step;
+    } else if (a == "--trace") req.tracing = true;
     else if (a == "--skip-complete") req.skipComplete = true;
     else if (a == "--no-quicklook") req.quickLook = false;
     else if (a == "--quicklook") {
@@ -664,6 +704,9 @@ std::vector<std::string> standalone_options(const StandaloneRequest& req) {
   for (const auto& p : req.params) add("--param", p);
   if (!req.paramsFile.empty()) add("--params", req.paramsFile);
   if (req.tracing) a.emplace_back("--trace");
+  if (!req.multilook.empty()) add("--multilook", req.multilook);
+  if (req.groundRange) a.emplace_back("--ground-range");
+  if (req.groundStep > 0.0) add("--ground-step", std::to_string(static_cast<int>(req.groundStep)));
   if (req.skipComplete) a.emplace_back("--skip-complete");
   return a;
 }
@@ -703,11 +746,17 @@ const char* kModeOptions =
     "  --param KEY=VALUE    override a processing parameter (Section.Key=VALUE when ambiguous)\n"
     "  --params FILE        override parameters from a file of [Section] and Key = Value lines\n"
     "  --trace              keep a trace of the run in the work folder\n"
+    "  --multilook AZxRG    also a detected multilooked image, AZ lines by RG samples a look\n"
+    "                       (auto: the looks the annotation suggests); im and ap\n"
+    "  --ground-range       the multilooked image in ground range (<product>_gr, else _pwr);\n"
+    "                       wss: its image in ground range\n"
+    "  --ground-step M      its ground step in metres (default: the looked slant cells' mean)\n"
     "  --skip-complete      do nothing when an earlier run's outputs are complete\n"
     "  --help               this text\n"
     "\n"
     "Outputs: OUT/<product>_slc (the SLC), <product>_slc_hdr (its annotation), .sml, .hdr, .vrt,\n"
-    "and <product>_slc.tif (the quick-look). Work files, the log (Vanterra.log) and the error\n"
+    "and <product>_slc.tif (the quick-look); with --multilook also <product>_pwr or _gr (float\n"
+    "amplitude) with its .hdr, .vrt, _hdr and .sml. Work files, the log (Vanterra.log) and the error\n"
     "record (Vanterra.working_error) stay in OUT/.sarfocus/<product>/; after a successful run the\n"
     "marker sarfocus.complete there lists the outputs. The last line says what was written, or\n"
     "the error with its code and the log's path.\n";

@@ -29,6 +29,9 @@ struct StandaloneRequest {
   std::string paramsFile;   // profile file of sections and keys that override the defaults
   bool tracing = false;
   bool skipComplete = false;  // leave a product alone whose outputs are complete
+  std::string multilook;      // "AZxRG" or "auto": a multilooked image of the SLC too (im, ap)
+  bool groundRange = false;   // the multilooked image in ground range
+  double groundStep = 0.0;    // its ground step, m (0: chosen from the looks)
 };
 
 enum class StandaloneResult {

@@ -55,8 +55,9 @@ const EntryCase kCases[] = {
      130560, 2, "WSprocessor()", "START : Focussing ASAR WS"},
     {"rs_prefix", [](ScratchJob& j) { return "main_focussing_asar_RS#" + list_of(j, with_header(im_args(j))); },
      130560, 2, "RADARExtract()", "START : Focussing ASAR RS"},
+    // The WSS job runs, and refuses the IM level 0 product it is given.
     {"wss_prefix", [](ScratchJob& j) { return "main_multilook_WSS#" + list_of(j, with_header(im_args(j))); },
-     130560, 2, "images::run()", "START : Multilooking ASA WSS"},
+     456962, 7, "ASA_WSS", "START : Multilooking ASA WSS"},
     {"prefix_without_hash",
      [](ScratchJob& j) { return "main_focussing_asar_IM" + list_of(j, with_header(im_args(j))); }, 456963, 7,
      nullptr, nullptr},

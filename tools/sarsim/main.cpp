@@ -44,7 +44,10 @@ void usage() {
       "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
       "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n"
       "              [--yaw-steering on|off] [--squint-hz F] [--yaw-bias-deg D]\n"
-      "              [--clutter-db DB] [--clutter-contrast low|high]\n",
+      "              [--clutter-db DB] [--clutter-contrast low|high]\n"
+      "       sarsim wss --out DIR [--orbit FILE] [--time T] [--samples N] [--bursts K] [--burst-lines L]\n"
+      "              [--cycle-lines C] [--target SWATH,LINE,SAMPLE,AMP]... [--seed S]\n"
+      "              [--fault truncated|drop-swath=D]   (an ASA_WSS_1P level 1 product)\n",
       stderr);
 }
 
@@ -80,7 +83,13 @@ sar::simulator::Target parse_target(const std::string& text) {
 
 }  // namespace
 
+int wss_main(int argc, char** argv, const std::string& defaultOrbit);
+
 int main(int argc, char** argv) {
+  if (argc > 1 && std::string(argv[1]) == "wss")
+    return wss_main(argc - 1, argv + 1,
+                    std::string(SARSIM_REAL_DATA_DIR) +
+                        "/DOR_VOR_AX/DOR_VOR_AXVF-P20080331_075200_20080301_215527_20080303_002327");
   sar::simulator::SimulationConfig config;
   config.ins_template = kInsTemplate;
   config.xca_template = kXcaTemplate;
