@@ -181,4 +181,9 @@ struct dcestconf {
   std::shared_ptr<detail::MlbfState> mlbf;
 };
 
+/// Reads section "DCestConf" of a parameter file into the configuration fields of `dc`; a
+/// missing mandatory key ends the process as every parameter read does. `Memory`,
+/// `Pol_Weights`, `AttitudeErrorBound` and `CentroidScatterBound` are optional.
+void read_dcestconf(const std::string& parameterFile, dcestconf& dc);
+
 }  // namespace sar::doppler

@@ -40,9 +40,6 @@ void remove_work_file(const std::string& path) {
 int getInt(const char* section, const char* key, const std::string& file) {
   return base::GetCheckMyProfileInt(section, key, file);
 }
-double getDouble(const char* section, const char* key, const std::string& file) {
-  return base::GetCheckMyProfileDouble(section, key, file);
-}
 
 }  // namespace
 
@@ -74,65 +71,14 @@ int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dc
       proc.Report_level = level;
   }
 
-  const char* dcs = "DCestConf";
-  dc.Memory = getInt(dcs, "Memory", f);
-  dc.RgBand = getDouble(dcs, "RgBand", f);
-  dc.Blocks = getInt(dcs, "Blocks", f);
-  dc.Blockl = getInt(dcs, "Blockl", f);
-  dc.AnLen = getDouble(dcs, "AnLen", f);
-  dc.Kthr = getDouble(dcs, "Kthr", f);
-  dc.Lookbf = getDouble(dcs, "Lookbf", f);
-  dc.Lookbt = getDouble(dcs, "Lookbt", f);
-  dc.Lookrp = getDouble(dcs, "Lookrp", f);
-  dc.Lookrs = getDouble(dcs, "Lookrs", f);
-  dc.Decfac = getInt(dcs, "Decfac", f);
-  dc.Flength = getInt(dcs, "Flength", f);
-  dc.Dftstep = getDouble(dcs, "Dftstep", f);
-  dc.Fftrgprc = getDouble(dcs, "Fftrgprc", f);
-  dc.Fftazprc = getDouble(dcs, "Fftazprc", f);
-  dc.Peakwid = getDouble(dcs, "Peakwid", f);
-  dc.Minamb = getDouble(dcs, "Minamb", f);
-  dc.Maxamb = getDouble(dcs, "Maxamb", f);
-  dc.Sthr = getDouble(dcs, "Sthr", f);
-  dc.Nbestblocks = getInt(dcs, "Nbestblocks", f);
-  dc.Nummlbf = getInt(dcs, "Nummlbf", f);
-  dc.Nwdarblocks = getInt(dcs, "Nwdarblocks", f);
-  dc.Varthr = getDouble(dcs, "Varthr", f);
-  dc.Patchs = getInt(dcs, "Patchs", f);
-  dc.Patchl = getInt(dcs, "Patchl", f);
-  dc.Dswst = getInt(dcs, "Dswst", f);
-  dc.Amb_flag = getInt(dcs, "Amb_flag", f);
-  base::GetCheckMyProfileIntArray(dcs, "Pol_Weights", dc.Pol_Weights, f);
-  {
-    // Optional: the attitude error the centroid's range slope check allows for (degrees).
-    double bound = 0.0;
-    if (base::GetProfileDoubleArray(dcs, "AttitudeErrorBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
-        bound > 0.0)
-      dc.AttitudeErrorBound = bound;
-    // Optional: how far the block centroids may scatter about the fit, in their own standard
-    // deviations.
-    if (base::GetProfileDoubleArray(dcs, "CentroidScatterBound", std::span<double>(&bound, 1), f) == base::kProfileOk &&
-        bound > 0.0)
-      dc.CentroidScatterBound = bound;
-  }
+  doppler::read_dcestconf(f, dc);
+  // The IM parameter file must say which terms of the centroid surface are fitted.
+  base::GetCheckMyProfileIntArray("DCestConf", "Pol_Weights", dc.Pol_Weights, f);
   dc.progressFlag = proc.progressFlag;
   dc.Flag_incore = proc.Flag_incore;
 
+  stripmap::read_azimuthconf(f, az);
   const char* azs = "AzimuthConf";
-  az.AntennaLength = getDouble(azs, "AntennaLength", f);
-  az.WhiteningFlag = getInt(azs, "WhiteningFlag", f);
-  az.RangeWindowHammingParameter = getDouble(azs, "RangeWindowHammingParameter", f);
-  az.AzimuthWindowHammingParameter = getDouble(azs, "AzimuthWindowHammingParameter", f);
-  az.RangeLookBandwidth = getDouble(azs, "RangeLookBandwidth", f);
-  az.AzimuthLookBandwidth = getDouble(azs, "AzimuthLookBandwidth", f);
-  az.RangeTransitionBandwidth = getDouble(azs, "RangeTransitionBandwidth", f);
-  az.AzimuthTransitionBandwidth = getDouble(azs, "AzimuthTransitionBandwidth", f);
-  az.LinesInBlock = getInt(azs, "LinesInBlock", f);
-  az.SamplesInBlock = getInt(azs, "SamplesInBlock", f);
-  az.RangeOverlap = getInt(azs, "RangeOverlap", f) / 2;
-  az.AzimuthOverlap = getInt(azs, "AzimuthOverlap", f) / 2;
-  az.PerformInterpolation = getInt(azs, "PerformInterpolation", f);
-  az.StoltPadding = getDouble(azs, "StoltPadding", f);
   // The shifts scale with the product's size, which is not known before the extraction.
   az.azimuthShift = getInt(azs, "ApplyAzShift", f) * static_cast<double>(par.lines);
   az.rangeShift = getInt(azs, "ApplyRgShift", f) * static_cast<double>(par.samples);

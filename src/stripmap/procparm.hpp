@@ -2,6 +2,7 @@
 // The record that carries a stripmap job from stage to stage, and the azimuth configuration.
 #include <array>
 #include <complex>
+#include <string>
 #include <cstdint>
 #include <vector>
 
@@ -96,5 +97,10 @@ struct azimuthconf {
   double azimuthShift = 0.0;
   double rangeShift = 0.0;
 };
+
+/// Reads section "AzimuthConf" of a parameter file into `az` (overlaps halved), all but the
+/// shift flags `ApplyAzShift` and `ApplyRgShift`, whose meaning each job sets; a missing key
+/// ends the process as every parameter read does.
+void read_azimuthconf(const std::string& parameterFile, azimuthconf& az);
 
 }  // namespace sar::stripmap
