@@ -155,9 +155,9 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   WKCentre(wk, kr0, ky0, kx0);
   const double kd = kx0 - kr0;
   const int32_t Ns = (n - Ov + Sn - 1) / Sn;
-  // The work matrix is kept from block to block: a fresh quarter of a gigabyte per block cost
-  // its page faults and clearing on every call.
-  static thread_local dsp::cvector work;
+  // The work matrix is kept from block to block in the stage's record: a fresh quarter of a
+  // gigabyte per block cost its page faults and clearing on every call.
+  dsp::cvector& work = wk.subBlock;
   work.resize(static_cast<std::size_t>(Sb) * lines);
   wk.data = work;
   wk.samples = Sb;

@@ -22,6 +22,8 @@
 #include <span>
 #include <vector>
 
+#include "dsp/fft.hpp"
+
 namespace sar::stripmap {
 
 using fcomplex = std::complex<float>;
@@ -59,6 +61,8 @@ struct wkparm {
   int32_t WhiteningFlag = 0;
   int32_t transformSign = 0;  // only 0 is supported
   std::span<fcomplex> data;   // lines x samples
+  // The range sub-block work matrix: made once for the stage, reused by every block.
+  dsp::cvector subBlock;
   double R0 = 0.0;            // reference range, m
   double V = 0.0;             // equivalent velocity, m/s
   int32_t PerformInterpolation = 0;

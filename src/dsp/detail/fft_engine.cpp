@@ -188,13 +188,17 @@ std::shared_ptr<const Stage> Stage::make(const BatchShape& shape, bool inPlace) 
   }
   auto stage = std::make_shared<Stage>(shape, chunk);
   const int threads = engine_threads();
-  auto full = cached_plan(stage->key_for(chunk, inPlace, 0, 0, threads));
+  const PlanKey fullKey = stage->key_for(chunk, inPlace, 0, 0, threads);
+  auto full = cached_plan(fullKey);
   if (!full) return nullptr;
   stage->warm_.push_back(std::move(full));
+  stage->warmKeys_.push_back(fullKey);
   if (const int rest = shape.howmany % chunk; rest != 0) {
-    auto tail = cached_plan(stage->key_for(rest, inPlace, 0, 0, threads));
+    const PlanKey tailKey = stage->key_for(rest, inPlace, 0, 0, threads);
+    auto tail = cached_plan(tailKey);
     if (!tail) return nullptr;
     stage->warm_.push_back(std::move(tail));
+    stage->warmKeys_.push_back(tailKey);
   }
   return stage;
 }
@@ -225,8 +229,13 @@ void Stage::run(const fcomplex* in, fcomplex* out, double scale) const {
   const int threads = engine_threads();
   const int chunks = (shape_.howmany + chunk_ - 1) / chunk_;
   const int rest = shape_.howmany % chunk_;
-  auto full = cached_plan(key_for(chunk_, inPlace, ai, ao, threads));
-  auto tail = rest != 0 ? cached_plan(key_for(rest, inPlace, ai, ao, threads)) : nullptr;
+  auto plan_for = [&](int howmany, std::size_t warm) {
+    const PlanKey key = key_for(howmany, inPlace, ai, ao, threads);
+    if (warm < warmKeys_.size() && warmKeys_[warm] == key) return warm_[warm];
+    return cached_plan(key);
+  };
+  auto full = plan_for(chunk_, 0);
+  auto tail = rest != 0 ? plan_for(rest, 1) : nullptr;
   if (!full || (rest != 0 && !tail)) return;
 
   const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;

@@ -95,9 +95,11 @@ class Stage {
 
   BatchShape shape_;
   int chunk_;
-  // Plans made when the stage was built: they keep the pre-planned shapes alive even if the
-  // cache is cleared.
+  // Plans made when the stage was built, for buffers of the kit's own alignment (full chunk,
+  // then the remainder if any), with their keys: a run on such buffers takes them without
+  // going through the cache's lock, so per-line runs inside parallel loops do not queue.
   std::vector<std::shared_ptr<const FftwPlan>> warm_;
+  std::vector<PlanKey> warmKeys_;
 };
 
 }  // namespace sar::dsp::detail
