@@ -1,10 +1,12 @@
 #!/usr/bin/env bash
-# The IM job end to end on a simulated full-size scene, against the bare transforms the same
-# scene needs, in one run: wall time and peak memory of `focussing` (from /usr/bin/time -v),
-# the time of each stage (from the job's log), and the time of a forward and a backward
-# transform over every range line and every azimuth column (bench_scene_transforms).
+# The IM job end to end on a simulated full-size scene, against what this machine can do, in
+# one run: the bound of ../shared/perfbound (the cheapest correct range-Doppler pipeline for a
+# full scene, 2 and 1 threads; SAR_BENCH_NO_BOUND=1 leaves it out), then for each thread count
+# the wall time and peak memory of `focussing` (from /usr/bin/time -v), the time of each stage
+# (from the job's log) and the ratio job / bound, and the bare transforms of the same scene
+# (bench_scene_transforms).
 #
-#   bench/im_job_full.sh [LINES [SAMPLES [THREADS]]]     default 30000 5616 2
+#   bench/im_job_full.sh [LINES [SAMPLES [THREADS...]]]     default 30000 5616 2 1
 #
 # The simulated product is kept in $SAR_BENCH_DIR (default out/bench_im) and reused by later
 # runs of the same size. The job runs with the shipped parameter file, with Flag_incore set
@@ -14,7 +16,9 @@ here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
 lines="${1:-30000}"
 samples="${2:-5616}"
-threads="${3:-2}"
+shift $(( $# < 2 ? $# : 2 ))
+thread_counts=("$@")
+[ ${#thread_counts[@]} -gt 0 ] || thread_counts=(2 1)
 work="${SAR_BENCH_DIR:-$here/out/bench_im}"
 incore="${SAR_BENCH_INCORE:-1}"
 
@@ -23,6 +27,17 @@ if [ ! -x /usr/bin/time ]; then
   exit 2
 fi
 cmake --build "$build" -j2 --target sarsim focussing bench_scene_transforms >/dev/null
+
+# The bound first, in the same run: this machine's speed varies from hour to hour.
+bound_2T="" bound_1T=""
+bound_sh="$here/../shared/perfbound/bound.sh"
+if [ -z "${SAR_BENCH_NO_BOUND:-}" ] && [ -x "$bound_sh" ]; then
+  echo "== bound of this machine (../shared/perfbound)"
+  bound_out=$("$bound_sh")
+  printf '%s\n' "$bound_out" | grep '^bound [12]T' | sed 's/^/  /'
+  bound_2T=$(printf '%s\n' "$bound_out" | awk '/^bound 2T:/ {print $3}')
+  bound_1T=$(printf '%s\n' "$bound_out" | awk '/^bound 1T:/ {print $3}')
+fi
 
 input="$work/input_${lines}x${samples}"
 if ! ls "$input"/ASA_IM__0*.N1 >/dev/null 2>&1; then
@@ -39,12 +54,15 @@ ins=$(ls "$input"/ASA_INS_AX*)
 xca=$(ls "$input"/ASA_XCA_AX*)
 
 job="$work/job"
-rm -rf "$job"
 exe="$build/src/jobs/focussing"
+
+summary=""
+for threads in "${thread_counts[@]}"; do
+# A fresh working directory for each run: a finished job deletes its working file.
+rm -rf "$job"
 "$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
   --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
 sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
-
 echo "== focussing (${threads} threads)"
 set +e
 OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_IM#$job/job.txt" \
@@ -65,15 +83,25 @@ bare=$(SAR_BENCH_LINES="$lines" SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="
   "$build/bench/bench_scene_transforms" --benchmark_format=csv 2>/dev/null | grep '^"BM_')
 range_ms=$(echo "$bare" | awk -F, '/BM_RangeLines/ {print $3}')
 azimuth_ms=$(echo "$bare" | awk -F, '/BM_AzimuthColumns/ {print $3}')
+bound=""
+[ "$threads" = 2 ] && bound="$bound_2T"
+[ "$threads" = 1 ] && bound="$bound_1T"
 
 echo
 echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
 grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
-awk -v w="$wall" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {
+line=$(awk -v w="$wall" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" -v b="$bound" -v t="$threads" 'BEGIN {
   bare = (r + a) / 1000.0
   printf "  wall time            %9.2f s\n", w
   printf "  peak memory          %9.2f GiB\n", p / 1048576.0
   printf "  bare transforms      %9.2f s (range lines %.2f s, azimuth columns %.2f s)\n", bare, r / 1000.0, a / 1000.0
   printf "  job / bare           %9.2f\n", w / bare
-}'
+  if (b != "") printf "  bound                %9.2f s\n  job / bound          %9.2f\n", b, w / b
+}')
+echo "$line"
+summary+="${threads} threads: $(echo "$line" | awk '/wall time/ {w=$3} /peak memory/ {m=$3} /job \/ bound/ {r=$4} END {printf "wall %s s, peak %s GiB, job / bound %s", w, m, (r == "" ? "-" : r)}')"$'\n'
+done
+echo
+echo "Summary (${lines} x ${samples}, Flag_incore ${incore}):"
+printf '%s' "$summary" | sed 's/^/  /'
