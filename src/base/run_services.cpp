@@ -243,8 +243,9 @@ bool ErrorCatalogue::load(const std::string& path) {
     return s.substr(b, e == std::string::npos ? std::string::npos : e - b);
   };
   if (lines.empty()) return false;
-  long n = std::strtol(lines[0].c_str(), nullptr, 10);
-  if (n <= 0 || static_cast<std::size_t>(2 * n + 3) > lines.size()) return false;
+  // The count comes from the file: compared with the lines there are before any arithmetic on it.
+  const long n = std::strtol(lines[0].c_str(), nullptr, 10);
+  if (n <= 0 || lines.size() < 3 || static_cast<unsigned long>(n) > (lines.size() - 3) / 2) return false;
   const auto count = static_cast<std::size_t>(n);
   std::vector<std::string> tokens;
   for (std::size_t i = 0; i < count; ++i) tokens.push_back(first_word(lines[2 + i]));
