@@ -47,7 +47,7 @@ for t in "${targets[@]}"; do
   [ -f "$here/fuzz/dict/$t.dict" ] && dict=(-dict="$here/fuzz/dict/$t.dict")
   echo "fuzz_$t: ${seconds} s"
   if ! (cd "$findings" && "$fuzz_build/fuzz/fuzz_$t" "$corpus" "$fuzz_build/seeds/$t" "${dict[@]}" \
-        -max_total_time="$seconds" -max_len=1048576 -timeout=1 -rss_limit_mb=2048 -print_final_stats=1 \
+        -max_total_time="$seconds" -max_len=1048576 -len_control=0 -timeout=1 -rss_limit_mb=2048 -print_final_stats=1 \
         -artifact_prefix="$findings/" >"$findings/log.txt" 2>&1); then
     echo "fuzz_$t: FINDING, see $findings"
     grep -E "^(==[0-9]+==ERROR|SUMMARY|.*runtime error)" "$findings/log.txt" | head -5 || true
