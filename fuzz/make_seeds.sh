@@ -9,7 +9,7 @@ out="$1"
 normal_build="${2:-$here/build}"
 real="${SAR_REAL_DATA_DIR:-$here/../shared/data/real}"
 rm -rf "$out"
-mkdir -p "$out"/{level0_header,level0_walk,asa_ins,asa_xca,asa_xch,orbit_envisat,orbit_text,profile,job_list,configuration,xml_header,description}
+mkdir -p "$out"/{level0_header,level0_walk,asa_ins,asa_xca,asa_xch,orbit_envisat,orbit_text,profile,job_list,configuration,xml_header,description,raster_header}
 
 first() { ls "$1" 2>/dev/null | head -n "${2:-1}" | sed "s|^|$1/|"; }
 if [ -d "$real" ]; then
@@ -129,3 +129,17 @@ XML
   >"$out/description/product_hdr"
 { printf '\2'; printf 'A = SCALAR(Integer)\nB = VECTOR(Double)\nC = MATRIX(String)\nD = MULTIPLE(X Integer, Y EFDT)\n'; } \
   >"$out/description/keys.txt"
+
+printf '[RasterInfo]\nNrOfLinesPerImage = 16\nNrOfPixelsPerLine = 32\nHeaderOffset = 0\nRowPrefix = 0\nByteOrder = LSBFirst\nCellType = FLOAT_COMPLEX\n' \
+  >"$out/raster_header/profile.hdr"
+cat >"$out/raster_header/xml.hdr" <<'XML'
+<?xml version="1.0"?>
+<OmbrixXmlDoc>
+  <NumberOfChannels>1</NumberOfChannels>
+  <Description>raster</Description>
+  <Channel Number="1">
+    <RasterInfo><NrOfLinesPerImage>16</NrOfLinesPerImage><NrOfPixelsPerLine>32</NrOfPixelsPerLine>
+      <HeaderOffset>8</HeaderOffset><RowPrefix>4</RowPrefix><ByteOrder>1</ByteOrder><CellType>3</CellType></RasterInfo>
+  </Channel>
+</OmbrixXmlDoc>
+XML

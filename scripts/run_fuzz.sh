@@ -15,7 +15,7 @@ shift || true
 fuzz_build="${SAR_FUZZ_BUILD_DIR:-$here/build-fuzz}"
 normal_build="${SAR_BUILD_DIR:-$here/build}"
 
-targets_all=(level0_header level0_walk asa_ins asa_xca asa_xch orbit_envisat orbit_text profile job_list
+targets_all=(level0_header level0_walk asa_ins asa_xca asa_xch orbit_envisat orbit_text profile job_list raster_header
              configuration xml_header description)
 if (($#)); then targets=("$@"); else targets=("${targets_all[@]}"); fi
 
