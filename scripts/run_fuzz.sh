@@ -37,6 +37,10 @@ cmake --build "$fuzz_build" -j"$(nproc)" --target "${targets[@]/#/fuzz_}"
 
 bash "$here/fuzz/make_seeds.sh" "$fuzz_build/seeds" "$normal_build"
 
+# The targets write each input to a file; a target that dies leaves its folder here, not in /tmp.
+export SAR_FUZZ_SCRATCH="$fuzz_build/scratch"
+mkdir -p "$SAR_FUZZ_SCRATCH"
+
 # A slow input is a finding: no parser may take a second on a megabyte.
 status=0
 for t in "${targets[@]}"; do
