@@ -294,7 +294,7 @@ void omb_add_report(std::string_view text, int level, int line, std::string_view
   ++s.reports;
 }
 
-void report(int level, std::string_view text, std::source_location loc) {
+void report(int level, std::string_view text, source_location loc) {
   omb_add_report(text, level, static_cast<int>(loc.line()), loc.file_name(), loc.file_name());
 }
 
@@ -309,7 +309,7 @@ int write_debug(const std::string& path, const void* data, int type, int dim1, i
   return 0;
 }
 
-Frame::Frame(std::string_view name, std::source_location loc) : file_(loc.file_name()) {
+Frame::Frame(std::string_view name, source_location loc) : file_(loc.file_name()) {
   omb_check(errno, static_cast<int>(loc.line()), file_, file_);
   errno = 0;
   set_ckerr_fun(name);
@@ -319,7 +319,7 @@ Frame::~Frame() {
   if (ckflg_ckerr()) deccurdep();
 }
 
-int Frame::check(int status, std::source_location loc) {
+int Frame::check(int status, source_location loc) {
   const int line = static_cast<int>(loc.line());
   if (status != 0) omb_add_report(kCalledFunctionError, kReportErrorCallTree, line, file_, file_);
   omb_check(errno, line, file_, file_);
@@ -328,7 +328,7 @@ int Frame::check(int status, std::source_location loc) {
   return status;
 }
 
-void Frame::check_errno(std::source_location loc) const {
+void Frame::check_errno(source_location loc) const {
   omb_check(errno, static_cast<int>(loc.line()), file_, file_);
   errno = 0;
 }

@@ -11,7 +11,7 @@
 #include <cerrno>
 #include <cstddef>
 #include <cstdint>
-#include <source_location>
+#include "base/source_location.hpp"
 #include <string>
 #include <string_view>
 #include <type_traits>
@@ -78,7 +78,7 @@ void omb_check(int errorNumber, int line, std::string_view file, std::string_vie
 void omb_add_report(std::string_view text, int level, int line, std::string_view file, std::string_view function);
 
 /// Report with the caller's source location as line and file.
-void report(int level, std::string_view text, std::source_location loc = std::source_location::current());
+void report(int level, std::string_view text, source_location loc = source_location::current());
 
 /// Dump a buffer: three int32 (type, dim1, dim2) in machine order, then the data.
 /// Type sizes: 0: 4 bytes, 1: 8, 2: 8, 3: 16, 4: 2.
@@ -107,14 +107,14 @@ class ErrnoGuard {
 /// non-zero status, frees what this invocation allocated through the tracked allocator.
 class Frame {
  public:
-  explicit Frame(std::string_view name, std::source_location loc = std::source_location::current());
+  explicit Frame(std::string_view name, source_location loc = source_location::current());
   ~Frame();
   Frame(const Frame&) = delete;
   Frame& operator=(const Frame&) = delete;
 
-  int check(int status, std::source_location loc = std::source_location::current());
+  int check(int status, source_location loc = source_location::current());
   /// errno test at a system call boundary: a non-zero errno is reported at level 0 and cleared.
-  void check_errno(std::source_location loc = std::source_location::current()) const;
+  void check_errno(source_location loc = source_location::current()) const;
 
  private:
   std::string file_;

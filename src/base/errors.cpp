@@ -28,7 +28,7 @@ const std::string& CErrorExceptionManager::detail() const {
   return details_.empty() ? empty : details_.front();
 }
 
-void fatal(int32_t code, std::vector<std::string> details, std::source_location loc) {
+void fatal(int32_t code, std::vector<std::string> details, source_location loc) {
   throw CErrorExceptionManager(code, std::move(details), loc.file_name(), static_cast<int>(loc.line()));
 }
 

@@ -8,7 +8,7 @@
 //    reads and the byte-order selector, which end the run without any report;
 //  - anything else thrown, which the entry's catch-all reports as an uncaught failure.
 #include <cstdint>
-#include <source_location>
+#include "base/source_location.hpp"
 #include <string>
 #include <vector>
 
@@ -85,7 +85,7 @@ struct ProcessExit {
 /// Raise the fatal exit for `ec` with up to three detail strings. The source location names
 /// the unit in the trace; pass a unit name explicitly where the host expects a fixed one.
 [[noreturn]] void fatal(int32_t ec, std::vector<std::string> details = {},
-                        std::source_location loc = std::source_location::current());
+                        source_location loc = source_location::current());
 [[noreturn]] void fatal_at(int32_t ec, std::vector<std::string> details, std::string sourceFile, int line);
 
 }  // namespace sar::base

@@ -1,8 +1,11 @@
 #include "base/run_services.hpp"
 
 #include <sys/stat.h>
+#include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <chrono>
 #include <cmath>
 #include <cstdarg>
@@ -168,7 +171,56 @@ bool write_lines(const std::string& path, const std::vector<std::string>& lines)
   fatal(ec::kInterrupted);
 }
 
+volatile std::sig_atomic_t noted_signal = 0;
+bool stop_reported = false;
+
+const char* signal_name(int s) {
+  switch (s) {
+    case SIGTERM: return "SIGTERM";
+    case SIGINT: return "SIGINT";
+    case SIGHUP: return "SIGHUP";
+    default: return "a signal";
+  }
+}
+
+extern "C" void on_stop_signal(int s) {
+  if (noted_signal != 0) {
+    // Asked twice: the default action, now.
+    std::signal(s, SIG_DFL);
+    std::raise(s);
+    return;
+  }
+  noted_signal = s;
+  ::alarm(kStopGraceSeconds);
+}
+
 }  // namespace
+
+// ---------------------------------------------------------------- stop by signal
+
+void install_stop_handlers() {
+  struct sigaction action {};
+  action.sa_handler = on_stop_signal;
+  sigemptyset(&action.sa_mask);
+  action.sa_flags = SA_RESTART;
+  for (int s : {SIGTERM, SIGINT, SIGHUP}) ::sigaction(s, &action, nullptr);
+}
+
+void note_stop_signal(int signal) noexcept { noted_signal = signal; }
+
+int stop_signal() noexcept { return noted_signal; }
+
+void check_stop_signal() {
+  const int s = noted_signal;
+  if (s == 0 || stop_reported) return;
+  stop_reported = true;
+  const std::string& label = rs().label;
+  const std::string what = std::string(signal_name(s)) + " received during " +
+                           label.substr(std::min(label.find_first_not_of(' '), label.size()));
+  TracePrintf("\n EXECUTION STOPPED: %s\n", what.c_str());
+  LogPrintf("Job stopped: %s\n", what.c_str());
+  fatal(ec::kInterrupted, {what});
+}
 
 // ---------------------------------------------------------------- dictionary
 
@@ -243,8 +295,9 @@ bool ErrorCatalogue::load(const std::string& path) {
     return s.substr(b, e == std::string::npos ? std::string::npos : e - b);
   };
   if (lines.empty()) return false;
-  long n = std::strtol(lines[0].c_str(), nullptr, 10);
-  if (n <= 0 || static_cast<std::size_t>(2 * n + 3) > lines.size()) return false;
+  // The count comes from the file: compared with the lines there are before any arithmetic on it.
+  const long n = std::strtol(lines[0].c_str(), nullptr, 10);
+  if (n <= 0 || lines.size() < 3 || static_cast<unsigned long>(n) > (lines.size() - 3) / 2) return false;
   const auto count = static_cast<std::size_t>(n);
   std::vector<std::string> tokens;
   for (std::size_t i = 0; i < count; ++i) tokens.push_back(first_word(lines[2 + i]));
@@ -438,6 +491,8 @@ void flush_trace() {
 }
 
 void SetActivityLabel(std::string_view text) {
+  // A stage boundary is a place to stop too: the record then names the stage that was cut short.
+  check_stop_signal();
   std::string label = " " + std::string(text);
   for (char& c : label)
     if (c == '\n') c = ' ';
@@ -520,6 +575,7 @@ void WriteErrorRecord(int32_t ec, std::span<const std::string> details) {
 }
 
 bool getAndSetPerc(int oldValue, int newValue, const std::string* label) {
+  check_stop_signal();
   if (oldValue == newValue) return true;
   // Without run services there is no host to tell, and no working file to stop the run by:
   // the stages are being used as a library.

@@ -83,6 +83,20 @@ void PrintEndBanner();
 /// Error file, then the working file (or its "_tmp" companion) get the record of `ec`.
 void WriteErrorRecord(int32_t ec, std::span<const std::string> details);
 
+/// A stop asked for by a signal (SIGTERM, SIGINT, SIGHUP). The handler only notes the signal;
+/// the job stops at its next progress report or activity change with the interruption code,
+/// the signal and the activity named in the error record, and its partial files go with the
+/// unwinding. A second signal, or a job that reaches no such point within the grace time, ends
+/// the process at once.
+inline constexpr unsigned kStopGraceSeconds = 20;
+void install_stop_handlers();
+/// What the handler calls: async-signal-safe.
+void note_stop_signal(int signal) noexcept;
+/// The signal noted, 0 when none.
+int stop_signal() noexcept;
+/// Raises the interruption when a signal has been noted and not yet reported; else returns.
+void check_stop_signal();
+
 /// Progress to the working file. Returns true when the job may go on; raises 326400 when the
 /// host has stopped the run. `label` null keeps the stored label.
 bool getAndSetPerc(int oldValue, int newValue, const std::string* label);

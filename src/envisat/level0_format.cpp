@@ -94,31 +94,29 @@ int check_packet_header(HeadBytes head, int mode, std::string* message) {
   p.fieldHeaderLength = u16(head, l0::kFieldHeaderLength);
   p.modeId = head[l0::kModeId];
   p.beamCode = head[l0::kBeamCode] >> 2;
+  // The search calls this at every byte offset: the text of the last failed test is only
+  // formatted when asked for.
   int score = 0;
-  std::string last;
+  const char* lastFormat = nullptr;
+  int lastA = 0, lastB = 0;
+  auto failed = [&](int weight, const char* format, int a, int b) {
+    score += weight;
+    lastFormat = format;
+    lastA = a;
+    lastB = b;
+  };
   const int counterLow = ((head[l0::kModeCounter + 1] & 63) << 8) + head[l0::kModeCounter + 2];
-  if (counterLow != p.sequenceCount) {
-    score += l0::kScoreCounter;
-    last = fmt("Counter ERROR: MODE COUNTER=%d, SEQ_COUNT=%d.\n", counterLow, p.sequenceCount);
-  }
-  if (p.processId != m.processId) {
-    score += l0::kScoreProcessId;
-    last = fmt("ApplicationID ERROR: read=%d, expected=%d\n", p.processId, m.processId);
-  }
-  if (p.modeId != m.modeId) {
-    score += l0::kScoreModeId;
-    last = fmt("ModeID ERROR: read=%d, expected=%d\n", p.modeId, m.modeId);
-  }
-  if (p.fieldHeaderLength != l0::kFieldHeaderBytes) {
-    score += l0::kScoreFieldHeader;
-    last = fmt("Header length ERROR: read=%d, expected=%d\n", p.fieldHeaderLength, l0::kFieldHeaderBytes);
-  }
+  if (counterLow != p.sequenceCount)
+    failed(l0::kScoreCounter, "Counter ERROR: MODE COUNTER=%d, SEQ_COUNT=%d.\n", counterLow, p.sequenceCount);
+  if (p.processId != m.processId)
+    failed(l0::kScoreProcessId, "ApplicationID ERROR: read=%d, expected=%d\n", p.processId, m.processId);
+  if (p.modeId != m.modeId) failed(l0::kScoreModeId, "ModeID ERROR: read=%d, expected=%d\n", p.modeId, m.modeId);
+  if (p.fieldHeaderLength != l0::kFieldHeaderBytes)
+    failed(l0::kScoreFieldHeader, "Header length ERROR: read=%d, expected=%d\n", p.fieldHeaderLength,
+           l0::kFieldHeaderBytes);
   const int swath = p.beamCode - m.beamOffset;
-  if (swath < 0 || swath > m.maxSwath) {
-    score += l0::kScoreSwath;
-    last = fmt("Swath %d out of range.\n", swath, 0);
-  }
-  if (message) *message = last;
+  if (swath < 0 || swath > m.maxSwath) failed(l0::kScoreSwath, "Swath %d out of range.\n", swath, 0);
+  if (message) *message = lastFormat ? fmt(lastFormat, lastA, lastB) : std::string();
   return score;
 }
 

@@ -18,6 +18,11 @@
 #include <utility>
 #include <vector>
 
+#include <cpl_error.h>
+#include <gdal.h>
+#include <ogr_api.h>
+#include <ogr_srs_api.h>
+
 #include "base/diagnostics.hpp"
 #include "io/description.hpp"
 
@@ -329,122 +334,10 @@ std::string xml_document(const Footprint& fp) {
   return x;
 }
 
-/// WGS84 geographic coordinates, in the WKT flavour that the shapefile tools expect.
-constexpr std::string_view kWgs84Prj =
-    "GEOGCS[\"GCS_WGS_1984\",DATUM[\"D_WGS_1984\",SPHEROID[\"WGS_1984\",6378137.0,298.257223563]],"
-    "PRIMEM[\"Greenwich\",0.0],UNIT[\"Degree\",0.0174532925199433]]";
-
 // ---- shapefile -------------------------------------------------------------------------------
-// The main file and the index share a 100-byte header: file code and length (in 16-bit words)
-// big-endian, version, shape type and bounding box little-endian. Record headers are big-endian,
-// record contents little-endian.
-
-class Bytes {
- public:
-  void be32(int32_t v) {
-    const auto u = static_cast<uint32_t>(v);
-    for (int s = 24; s >= 0; s -= 8) data_ += static_cast<char>((u >> s) & 0xffu);
-  }
-  void le32(int32_t v) {
-    const auto u = static_cast<uint32_t>(v);
-    for (int s = 0; s <= 24; s += 8) data_ += static_cast<char>((u >> s) & 0xffu);
-  }
-  void le16(uint16_t v) {
-    data_ += static_cast<char>(v & 0xffu);
-    data_ += static_cast<char>(v >> 8);
-  }
-  void le_double(double v) {
-    const auto u = std::bit_cast<uint64_t>(v);
-    for (int s = 0; s <= 56; s += 8) data_ += static_cast<char>((u >> s) & 0xffu);
-  }
-  void byte(uint8_t v) { data_ += static_cast<char>(v); }
-  void text(std::string_view t) { data_.append(t); }
-  void zeros(std::size_t n) { data_.append(n, '\0'); }
-  std::size_t size() const { return data_.size(); }
-  std::string take() { return std::move(data_); }
-
- private:
-  std::string data_;
-};
-
-constexpr int32_t kShapeFileCode = 9994;
-constexpr int32_t kShapeVersion = 1000;
-constexpr int32_t kShapePolygon = 5;
-constexpr int32_t kShapeHeaderBytes = 100;
-
-struct Box {
-  double xmin, ymin, xmax, ymax;
-};
-
-Box bounding_box(const std::vector<LonLat>& ring) {
-  Box b{ring.front().lon, ring.front().lat, ring.front().lon, ring.front().lat};
-  for (const auto& p : ring) {
-    b.xmin = std::min(b.xmin, p.lon);
-    b.xmax = std::max(b.xmax, p.lon);
-    b.ymin = std::min(b.ymin, p.lat);
-    b.ymax = std::max(b.ymax, p.lat);
-  }
-  return b;
-}
-
-void shape_header(Bytes& out, int32_t fileBytes, const Box& box) {
-  out.be32(kShapeFileCode);
-  for (int k = 0; k < 5; ++k) out.be32(0);
-  out.be32(fileBytes / 2);
-  out.le32(kShapeVersion);
-  out.le32(kShapePolygon);
-  out.le_double(box.xmin);
-  out.le_double(box.ymin);
-  out.le_double(box.xmax);
-  out.le_double(box.ymax);
-  for (int k = 0; k < 4; ++k) out.le_double(0.0);  // no Z, no M
-}
-
-struct ShapeFiles {
-  std::string shp;
-  std::string shx;
-};
-
-ShapeFiles shape_files(const Footprint& fp) {
-  const std::vector<LonLat> ring = corner_ring(fp, true, true);
-  const Box box = bounding_box(ring);
-  const auto points = static_cast<int32_t>(ring.size());
-  // Shape type, box, part and point counts, one part index, the points.
-  const int32_t contentBytes = 4 + 32 + 4 + 4 + 4 + 16 * points;
-
-  Bytes shp;
-  shape_header(shp, kShapeHeaderBytes + 8 + contentBytes, box);
-  shp.be32(1);  // record numbers start at 1
-  shp.be32(contentBytes / 2);
-  shp.le32(kShapePolygon);
-  shp.le_double(box.xmin);
-  shp.le_double(box.ymin);
-  shp.le_double(box.xmax);
-  shp.le_double(box.ymax);
-  shp.le32(1);
-  shp.le32(points);
-  shp.le32(0);
-  for (const auto& p : ring) {
-    shp.le_double(p.lon);
-    shp.le_double(p.lat);
-  }
-
-  Bytes shx;
-  shape_header(shx, kShapeHeaderBytes + 8, box);
-  shx.be32(kShapeHeaderBytes / 2);
-  shx.be32(contentBytes / 2);
-  return {shp.take(), shx.take()};
-}
-
-// ---- dBase III table -------------------------------------------------------------------------
-
-struct DbfField {
-  const char* name;  // at most 10 characters
-  char type;         // 'C' text, 'N' number
-  uint8_t length;
-  uint8_t decimals;
-  std::string value;
-};
+// Written by GDAL's shapefile driver into a private folder beside the product, then staged with
+// the other companions. No code page is declared: the text attributes are kept to printable
+// ASCII, as dBase III readers without one expect.
 
 /// dBase carries no code page here: printable ASCII only.
 std::string dbf_text(std::string_view text, std::size_t length) {
@@ -454,58 +347,124 @@ std::string dbf_text(std::string_view text, std::size_t length) {
     const auto u = static_cast<unsigned char>(c);
     out += u >= 0x20 && u < 0x7f ? c : '?';
   }
-  out.resize(length, ' ');
   return out;
 }
 
-std::string dbf_number(const std::string& formatted, std::size_t length) {
-  if (formatted.size() > length) return std::string(length, '*');  // dBase's overflow mark
-  return std::string(length - formatted.size(), ' ') + formatted;
+struct DatasetClose {
+  void operator()(void* d) const { GDALClose(d); }
+};
+struct SrsRelease {
+  void operator()(void* s) const { OSRRelease(s); }
+};
+struct FeatureDestroy {
+  void operator()(void* f) const { OGR_F_Destroy(f); }
+};
+struct FieldDestroy {
+  void operator()(void* f) const { OGR_Fld_Destroy(f); }
+};
+
+std::string gdal_error(const std::string& what) {
+  const char* message = CPLGetLastErrorMsg();
+  return what + (message && *message ? std::string(": ") + message : std::string());
 }
 
-std::string dbf_table(const Footprint& fp) {
-  const std::vector<DbfField> fields{
-      {"NAME", 'C', 80, 0, fp.productName},
-      {"SENSOR", 'C', 32, 0, fp.sensorName},
-      {"ACQ_TIME", 'C', 27, 0, fp.acquisitionTime},
-      {"LINES", 'N', 10, 0, printed("%lld", static_cast<long long>(fp.lines))},
-      {"PIXELS", 'N', 10, 0, printed("%lld", static_cast<long long>(fp.pixels))},
-      {"CENTER_LAT", 'N', 13, 6, printed("%.6f", fp.centre.latitude)},
-      {"CENTER_LON", 'N', 13, 6, printed("%.6f", fp.centre.longitude)},
-  };
-  std::size_t recordBytes = 1;  // the deletion flag
-  for (const auto& f : fields) recordBytes += f.length;
-  const std::size_t headerBytes = 32 + 32 * fields.size() + 1;
-
-  const std::time_t now = std::time(nullptr);
-  std::tm utc{};
-  gmtime_r(&now, &utc);
-
-  Bytes out;
-  out.byte(0x03);  // dBase III without memo
-  out.byte(static_cast<uint8_t>(std::clamp(utc.tm_year, 0, 255)));
-  out.byte(static_cast<uint8_t>(utc.tm_mon + 1));
-  out.byte(static_cast<uint8_t>(utc.tm_mday));
-  out.le32(1);
-  out.le16(static_cast<uint16_t>(headerBytes));
-  out.le16(static_cast<uint16_t>(recordBytes));
-  out.zeros(20);
-  for (const auto& f : fields) {
-    const std::string_view name(f.name);
-    out.text(name);
-    out.zeros(11 - name.size());
-    out.byte(static_cast<uint8_t>(f.type));
-    out.zeros(4);
-    out.byte(f.length);
-    out.byte(f.decimals);
-    out.zeros(14);
+/// One Polygon record (outer ring clockwise, longitudes continuous) and its attributes as
+/// `<folder>/<stem>.shp`, `.shx`, `.dbf`, `.prj`. 0, or 1 with `error` set.
+int write_shapefile(const Footprint& fp, const std::string& folder, const std::string& stem, std::string& error) {
+  static const bool registered = [] {
+    GDALAllRegister();
+    return true;
+  }();
+  (void)registered;
+  GDALDriverH driver = GDALGetDriverByName("ESRI Shapefile");
+  if (!driver) {
+    error = "GDAL has no shapefile driver";
+    return 1;
   }
-  out.byte(0x0d);
-  out.byte(' ');
-  for (const auto& f : fields) out.text(f.type == 'C' ? dbf_text(f.value, f.length) : dbf_number(f.value, f.length));
-  out.byte(0x1a);
-  return out.take();
+  const std::string shp = folder + "/" + stem + ".shp";
+  std::unique_ptr<void, DatasetClose> ds(GDALCreate(driver, shp.c_str(), 0, 0, 0, GDT_Unknown, nullptr));
+  if (!ds) {
+    error = gdal_error("cannot create " + shp);
+    return 1;
+  }
+  std::unique_ptr<void, SrsRelease> srs(OSRNewSpatialReference(nullptr));
+  OSRSetWellKnownGeogCS(srs.get(), "WGS84");
+  OSRSetAxisMappingStrategy(srs.get(), OAMS_TRADITIONAL_GIS_ORDER);
+  const char* const layerOptions[] = {"ENCODING=", "SHPT=POLYGON", nullptr};
+  OGRLayerH layer = GDALDatasetCreateLayer(ds.get(), stem.c_str(), srs.get(), wkbPolygon,
+                                           const_cast<char**>(layerOptions));
+  if (!layer) {
+    error = gdal_error("cannot create the layer of " + shp);
+    return 1;
+  }
+  struct Field {
+    const char* name;
+    OGRFieldType type;
+    int width, precision;
+  };
+  constexpr Field kFields[] = {{"NAME", OFTString, 80, 0},      {"SENSOR", OFTString, 32, 0},
+                               {"ACQ_TIME", OFTString, 27, 0},  {"LINES", OFTInteger, 10, 0},
+                               {"PIXELS", OFTInteger, 10, 0},   {"CENTER_LAT", OFTReal, 13, 6},
+                               {"CENTER_LON", OFTReal, 13, 6}};
+  for (const Field& f : kFields) {
+    std::unique_ptr<void, FieldDestroy> field(OGR_Fld_Create(f.name, f.type));
+    OGR_Fld_SetWidth(field.get(), f.width);
+    OGR_Fld_SetPrecision(field.get(), f.precision);
+    if (OGR_L_CreateField(layer, field.get(), TRUE) != OGRERR_NONE) {
+      error = gdal_error(std::string("cannot add the field ") + f.name + " to " + shp);
+      return 1;
+    }
+  }
+  std::unique_ptr<void, FeatureDestroy> feature(OGR_F_Create(OGR_L_GetLayerDefn(layer)));
+  OGR_F_SetFieldString(feature.get(), 0, dbf_text(fp.productName, 80).c_str());
+  OGR_F_SetFieldString(feature.get(), 1, dbf_text(fp.sensorName, 32).c_str());
+  OGR_F_SetFieldString(feature.get(), 2, dbf_text(fp.acquisitionTime, 27).c_str());
+  OGR_F_SetFieldInteger64(feature.get(), 3, fp.lines);
+  OGR_F_SetFieldInteger64(feature.get(), 4, fp.pixels);
+  OGR_F_SetFieldDouble(feature.get(), 5, fp.centre.latitude);
+  OGR_F_SetFieldDouble(feature.get(), 6, fp.centre.longitude);
+  OGRGeometryH polygon = OGR_G_CreateGeometry(wkbPolygon);
+  OGRGeometryH ring = OGR_G_CreateGeometry(wkbLinearRing);
+  for (const auto& p : corner_ring(fp, true, true)) OGR_G_AddPoint_2D(ring, p.lon, p.lat);
+  OGR_G_AddGeometryDirectly(polygon, ring);
+  OGR_F_SetGeometryDirectly(feature.get(), polygon);
+  if (OGR_L_CreateFeature(layer, feature.get()) != OGRERR_NONE) {
+    error = gdal_error("cannot write the footprint record of " + shp);
+    return 1;
+  }
+  feature.reset();
+  CPLErrorReset();
+  ds.reset();  // the files are complete only once the dataset is closed
+  if (CPLGetLastErrorType() >= CE_Failure) {
+    error = gdal_error("cannot finish " + shp);
+    return 1;
+  }
+  return 0;
 }
+
+/// A private folder beside the product for the shapefile driver, removed with everything in it.
+class ScratchFolder {
+ public:
+  explicit ScratchFolder(std::string path) : path_(std::move(path)) {}
+  ScratchFolder(const ScratchFolder&) = delete;
+  ScratchFolder& operator=(const ScratchFolder&) = delete;
+  ~ScratchFolder() {
+    std::error_code ec;
+    fs::remove_all(path_, ec);
+  }
+  bool create(std::string& error) {
+    std::error_code ec;
+    if (!fs::create_directory(path_, ec) || ec) {
+      error = "cannot create " + path_;
+      return false;
+    }
+    return true;
+  }
+  const std::string& path() const { return path_; }
+
+ private:
+  std::string path_;
+};
 
 // ---- staging ---------------------------------------------------------------------------------
 
@@ -544,6 +503,9 @@ class StagedFiles {
     }
     return 0;
   }
+
+  /// A file already written under a temporary name, renamed with the others.
+  void adopt(const std::string& temporary, const std::string& target) { entries_.push_back({temporary, target}); }
 
   /// Renames every file into place in the order added; on a failure the files already renamed
   /// are removed again. 0, or 1 with `error` set.
@@ -657,20 +619,26 @@ int write_footprint(const std::string& slcPath, int flag) {
       warn("Footprint of " + slcPath + " not written: " + error);
       return st;
     }
-    ShapeFiles shape = shape_files(fp);
     const std::string base = io::description_base(slcPath);
-    // The shapefile's main file goes last, so that whoever sees it finds its companions there.
-    const std::pair<const char*, std::string> files[] = {
-        {".xml", xml_document(fp)}, {".kml", kml_document(fp)},   {".prj", std::string(kWgs84Prj)},
-        {".dbf", dbf_table(fp)},    {".shx", std::move(shape.shx)}, {".shp", std::move(shape.shp)},
-    };
+    const fs::path basePath(base);
+    const std::string stem = basePath.filename().string();
+    ScratchFolder scratch((basePath.parent_path() / ("." + stem + printed(".shp.tmp%ld", static_cast<long>(::getpid()))))
+                              .string());
     StagedFiles staged;
+    const std::pair<const char*, std::string> files[] = {{".xml", xml_document(fp)}, {".kml", kml_document(fp)}};
     for (const auto& [suffix, content] : files) {
       if (staged.add(base + suffix, content, error) != 0) {
         warn("Footprint of " + slcPath + " not written: " + error);
         return kFootprintWriteFailed;
       }
     }
+    if (!scratch.create(error) || write_shapefile(fp, scratch.path(), stem, error) != 0) {
+      warn("Footprint of " + slcPath + " not written: " + error);
+      return kFootprintWriteFailed;
+    }
+    // The shapefile's main file goes last, so that whoever sees it finds its companions there.
+    for (const char* suffix : {".prj", ".dbf", ".shx", ".shp"})
+      staged.adopt(scratch.path() + "/" + stem + suffix, base + suffix);
     if (staged.commit(error) != 0) {
       warn("Footprint of " + slcPath + " not written: " + error);
       return kFootprintWriteFailed;

@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <cstring>
 #include <filesystem>
-#include <source_location>
+#include "base/source_location.hpp"
 #include <system_error>
 
 #include "base/diagnostics.hpp"
@@ -19,7 +19,7 @@ namespace sar::io {
 namespace {
 
 
-int failed(std::source_location loc = std::source_location::current()) {
+int failed(base::source_location loc = base::source_location::current()) {
   sar::base::report(sar::base::kReportErrorCallTree, sar::base::kCalledFunctionError, loc);
   return 1;
 }

@@ -7,7 +7,7 @@
 #include <cstring>
 #include <filesystem>
 #include <limits>
-#include <source_location>
+#include "base/source_location.hpp"
 #include <system_error>
 
 #include "base/diagnostics.hpp"
@@ -20,7 +20,7 @@ namespace {
 
 
 // A failing stream step leaves the call-tree report and gives 1.
-int failed(std::source_location loc = std::source_location::current()) {
+int failed(base::source_location loc = base::source_location::current()) {
   sar::base::report(sar::base::kReportErrorCallTree, sar::base::kCalledFunctionError, loc);
   return 1;
 }

@@ -7,9 +7,14 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <limits>
+#include <memory>
 #include <optional>
 #include <sstream>
 #include <system_error>
+
+#include <libxml/parser.h>
+#include <libxml/tree.h>
 
 #include "base/diagnostics.hpp"
 #include "base/profile.hpp"
@@ -384,227 +389,76 @@ struct XmlNode {
   }
 };
 
-/// A strict, bounded reader of the XML that descriptions use: elements, attributes, character
-/// data, CDATA, comments, processing instructions and a DOCTYPE without internal subset.
-class XmlReader {
- public:
-  explicit XmlReader(std::string_view text) : s_(text) {}
+/// The XML of a description through libxml2: no network, no DTD subset, no entities of the
+/// document's own, nesting bounded. libxml2's diagnostics stay off the error stream; the first
+/// error is kept as "<message> at line <n>".
+constexpr int kMaxXmlDepth = 64;
 
-  bool parse(XmlNode& root) {
-    if (s_.substr(0, 3) == "\xEF\xBB\xBF") p_ = 3;
-    if (!skip_misc()) return false;
-    if (p_ >= s_.size() || s_[p_] != '<') return fail("no root element");
-    if (!parse_element(root, 0)) return false;
-    if (!skip_misc()) return false;
-    if (p_ != s_.size()) return fail("content after the root element");
-    return true;
-  }
+struct DocFree {
+  void operator()(xmlDoc* d) const { xmlFreeDoc(d); }
+};
+struct ContextFree {
+  void operator()(xmlParserCtxt* c) const { xmlFreeParserCtxt(c); }
+};
 
-  /// "%s at line %d\n%s\n": message, line and the text of that line.
-  std::string error() const {
-    const std::size_t at = std::min(errorAt_, s_.size());
-    int line = 1;
-    std::size_t lineStart = 0;
-    for (std::size_t i = 0; i < at; ++i) {
-      if (s_[i] == '\n') {
-        ++line;
-        lineStart = i + 1;
-      }
-    }
-    std::size_t lineEnd = s_.find('\n', lineStart);
-    if (lineEnd == std::string_view::npos) lineEnd = s_.size();
-    const std::string lineText(s_.substr(lineStart, std::min<std::size_t>(lineEnd - lineStart, 200)));
-    char text[512];
-    std::snprintf(text, sizeof text, "%s at line %d\n%s\n", message_.c_str(), line, lineText.c_str());
-    return text;
-  }
+std::string qualified(const xmlNs* ns, const xmlChar* name) {
+  std::string out;
+  if (ns && ns->prefix) out = std::string(reinterpret_cast<const char*>(ns->prefix)) + ":";
+  return out + reinterpret_cast<const char*>(name);
+}
 
- private:
-  static constexpr int kMaxDepth = 64;
-
-  bool fail(const char* message) {
-    if (message_.empty()) {
-      message_ = message;
-      errorAt_ = p_;
-    }
+bool convert_element(const xmlNode* from, XmlNode& to, int depth, std::string& error) {
+  if (depth > kMaxXmlDepth) {
+    error = "elements nested too deep at line " + std::to_string(xmlGetLineNo(from)) + "\n";
     return false;
   }
-  bool starts(std::string_view w) const { return s_.substr(p_, w.size()) == w; }
-  void skip_blanks() {
-    while (p_ < s_.size() && (s_[p_] == ' ' || s_[p_] == '\t' || s_[p_] == '\r' || s_[p_] == '\n')) ++p_;
+  to.name = qualified(from->ns, from->name);
+  for (const xmlNs* ns = from->nsDef; ns; ns = ns->next)
+    to.attributes.emplace_back(ns->prefix ? "xmlns:" + std::string(reinterpret_cast<const char*>(ns->prefix)) : "xmlns",
+                               ns->href ? reinterpret_cast<const char*>(ns->href) : "");
+  for (const xmlAttr* a = from->properties; a; a = a->next) {
+    xmlChar* value = xmlNodeListGetString(from->doc, a->children, 1);
+    to.attributes.emplace_back(qualified(a->ns, a->name), value ? reinterpret_cast<const char*>(value) : "");
+    xmlFree(value);
   }
-  bool skip_past(std::string_view end, const char* what) {
-    const std::size_t k = s_.find(end, p_);
-    if (k == std::string_view::npos) return fail(what);
-    p_ = k + end.size();
-    return true;
-  }
-  /// Blanks, comments, processing instructions and a DOCTYPE outside the root.
-  bool skip_misc() {
-    for (;;) {
-      skip_blanks();
-      if (starts("<?")) {
-        if (!skip_past("?>", "unterminated processing instruction")) return false;
-      } else if (starts("<!--")) {
-        if (!skip_past("-->", "unterminated comment")) return false;
-      } else if (starts("<!DOCTYPE")) {
-        const std::size_t close = s_.find('>', p_);
-        const std::size_t bracket = s_.find('[', p_);
-        if (bracket != std::string_view::npos && bracket < close) return fail("internal DTD subset not supported");
-        if (!skip_past(">", "unterminated DOCTYPE")) return false;
-      } else {
-        return true;
-      }
+  for (const xmlNode* c = from->children; c; c = c->next) {
+    if (c->type == XML_TEXT_NODE || c->type == XML_CDATA_SECTION_NODE) {
+      if (c->content) to.text += reinterpret_cast<const char*>(c->content);
+    } else if (c->type == XML_ELEMENT_NODE) {
+      to.children.emplace_back();
+      if (!convert_element(c, to.children.back(), depth + 1, error)) return false;
     }
   }
-  static bool name_start(unsigned char c) { return std::isalpha(c) || c == '_' || c == ':' || c >= 0x80; }
-  static bool name_char(unsigned char c) { return name_start(c) || std::isdigit(c) || c == '-' || c == '.'; }
-  bool parse_name(std::string& out) {
-    const std::size_t start = p_;
-    if (p_ >= s_.size() || !name_start(static_cast<unsigned char>(s_[p_]))) return fail("name expected");
-    while (p_ < s_.size() && name_char(static_cast<unsigned char>(s_[p_]))) ++p_;
-    out.assign(s_.substr(start, p_ - start));
-    return true;
-  }
-  static void put_utf8(std::string& out, unsigned long cp) {
-    if (cp < 0x80) {
-      out += static_cast<char>(cp);
-    } else if (cp < 0x800) {
-      out += static_cast<char>(0xC0 | (cp >> 6));
-      out += static_cast<char>(0x80 | (cp & 0x3F));
-    } else if (cp < 0x10000) {
-      out += static_cast<char>(0xE0 | (cp >> 12));
-      out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
-      out += static_cast<char>(0x80 | (cp & 0x3F));
-    } else {
-      out += static_cast<char>(0xF0 | (cp >> 18));
-      out += static_cast<char>(0x80 | ((cp >> 12) & 0x3F));
-      out += static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
-      out += static_cast<char>(0x80 | (cp & 0x3F));
-    }
-  }
-  /// Decodes the reference at p_ ('&').
-  bool parse_reference(std::string& out) {
-    const std::size_t semi = s_.find(';', p_);
-    if (semi == std::string_view::npos || semi - p_ > 12) return fail("bad entity reference");
-    const std::string_view ref = s_.substr(p_ + 1, semi - p_ - 1);
-    if (ref == "amp")
-      out += '&';
-    else if (ref == "lt")
-      out += '<';
-    else if (ref == "gt")
-      out += '>';
-    else if (ref == "quot")
-      out += '"';
-    else if (ref == "apos")
-      out += '\'';
-    else if (ref.size() >= 2 && ref[0] == '#') {
-      const bool hex = ref[1] == 'x' || ref[1] == 'X';
-      const std::string_view digits = ref.substr(hex ? 2 : 1);
-      if (digits.empty()) return fail("bad character reference");
-      unsigned long cp = 0;
-      for (char c : digits) {
-        const auto u = static_cast<unsigned char>(c);
-        int v = -1;
-        if (std::isdigit(u))
-          v = c - '0';
-        else if (hex && std::isxdigit(u))
-          v = std::tolower(u) - 'a' + 10;
-        if (v < 0) return fail("bad character reference");
-        cp = cp * (hex ? 16 : 10) + static_cast<unsigned long>(v);
-        if (cp > 0x10FFFF) return fail("bad character reference");
-      }
-      if (cp == 0) return fail("bad character reference");
-      put_utf8(out, cp);
-    } else {
-      return fail("unknown entity");
-    }
-    p_ = semi + 1;
-    return true;
-  }
-  bool parse_attribute_value(std::string& out) {
-    if (p_ >= s_.size() || (s_[p_] != '"' && s_[p_] != '\'')) return fail("quoted attribute value expected");
-    const char quote = s_[p_++];
-    while (p_ < s_.size() && s_[p_] != quote) {
-      if (s_[p_] == '<') return fail("'<' in attribute value");
-      if (s_[p_] == '&') {
-        if (!parse_reference(out)) return false;
-      } else {
-        out += s_[p_++];
-      }
-    }
-    if (p_ >= s_.size()) return fail("unterminated attribute value");
-    ++p_;
-    return true;
-  }
-  bool parse_element(XmlNode& node, int depth) {
-    if (depth > kMaxDepth) return fail("elements nested too deep");
-    ++p_;  // '<'
-    if (!parse_name(node.name)) return false;
-    for (;;) {
-      const std::size_t before = p_;
-      skip_blanks();
-      if (p_ >= s_.size()) return fail("unterminated start tag");
-      if (starts("/>")) {
-        p_ += 2;
-        return true;
-      }
-      if (s_[p_] == '>') {
-        ++p_;
-        break;
-      }
-      if (p_ == before) return fail("blank expected before attribute");
-      std::string name;
-      std::string value;
-      if (!parse_name(name)) return false;
-      skip_blanks();
-      if (p_ >= s_.size() || s_[p_] != '=') return fail("'=' expected");
-      ++p_;
-      skip_blanks();
-      if (!parse_attribute_value(value)) return false;
-      for (const auto& a : node.attributes)
-        if (a.first == name) return fail("duplicate attribute");
-      node.attributes.emplace_back(std::move(name), std::move(value));
-    }
-    // Content.
-    for (;;) {
-      if (p_ >= s_.size()) return fail("unterminated element");
-      if (starts("</")) {
-        p_ += 2;
-        std::string name;
-        if (!parse_name(name)) return false;
-        if (name != node.name) return fail("mismatched end tag");
-        skip_blanks();
-        if (p_ >= s_.size() || s_[p_] != '>') return fail("'>' expected");
-        ++p_;
-        return true;
-      }
-      if (starts("<!--")) {
-        if (!skip_past("-->", "unterminated comment")) return false;
-      } else if (starts("<![CDATA[")) {
-        p_ += 9;
-        const std::size_t end = s_.find("]]>", p_);
-        if (end == std::string_view::npos) return fail("unterminated CDATA section");
-        node.text.append(s_.substr(p_, end - p_));
-        p_ = end + 3;
-      } else if (starts("<?")) {
-        if (!skip_past("?>", "unterminated processing instruction")) return false;
-      } else if (s_[p_] == '<') {
-        node.children.emplace_back();
-        if (!parse_element(node.children.back(), depth + 1)) return false;
-      } else if (s_[p_] == '&') {
-        if (!parse_reference(node.text)) return false;
-      } else {
-        node.text += s_[p_++];
-      }
-    }
-  }
+  return true;
+}
 
-  std::string_view s_;
-  std::size_t p_ = 0;
-  std::string message_;
-  std::size_t errorAt_ = 0;
-};
+bool parse_xml_text(const std::string& text, XmlNode& root, std::string& error) {
+  constexpr int kOptions = XML_PARSE_NONET | XML_PARSE_NOERROR | XML_PARSE_NOWARNING;
+  std::unique_ptr<xmlParserCtxt, ContextFree> context(xmlNewParserCtxt());
+  if (!context) {
+    error = "no XML parser\n";
+    return false;
+  }
+  std::unique_ptr<xmlDoc, DocFree> doc(xmlCtxtReadMemory(context.get(), text.data(), static_cast<int>(text.size()),
+                                                         nullptr, nullptr, kOptions));
+  if (!doc || !context->wellFormed) {
+    const xmlError* e = xmlCtxtGetLastError(context.get());
+    std::string message = e && e->message ? e->message : "not well-formed";
+    while (!message.empty() && (message.back() == '\n' || message.back() == ' ')) message.pop_back();
+    error = message + " at line " + std::to_string(e ? e->line : 0) + "\n";
+    return false;
+  }
+  if (doc->intSubset && doc->intSubset->children) {
+    error = "document type with an internal subset at line 1\n";
+    return false;
+  }
+  const xmlNode* top = xmlDocGetRootElement(doc.get());
+  if (!top) {
+    error = "no root element at line 1\n";
+    return false;
+  }
+  return convert_element(top, root, 0, error);
+}
 
 /// The parser placeholders of the host's older documents.
 std::string replace_placeholders(std::string text) {
@@ -824,11 +678,11 @@ bool parse_xml_file(const std::string& path, XmlNode& root, std::string& error) 
     error = "cannot open " + path;
     return false;
   }
-  XmlReader reader(text);
-  if (!reader.parse(root)) {
-    error = reader.error();
+  if (text.size() > static_cast<std::size_t>(std::numeric_limits<int>::max())) {
+    error = "description too large: " + path;
     return false;
   }
+  if (!parse_xml_text(text, root, error)) return false;
   if (root.local_name() != "HEADER_INFO") {
     error = "not a description document: " + path;
     return false;

@@ -5,6 +5,7 @@
 #include <cstring>
 #include <string>
 
+#include "base/run_services.hpp"
 #include "jobs/entry.hpp"
 #include "jobs/setup.hpp"
 
@@ -27,6 +28,8 @@ int main(int argc, char** argv) {
   // A file size limit must show up as a failed write that the job reports, not as a signal that
   // ends the process before it can say why.
   std::signal(SIGXFSZ, SIG_IGN);
+  // A host or a batch that stops the job with SIGTERM gets an error record saying so.
+  sar::base::install_stop_handlers();
   std::string command = argv[1];
   for (int i = 2; i < argc; ++i) {
     command += ' ';

@@ -120,7 +120,8 @@ class ProgressView {
 // Runs focussing in `workDir`. Everything the child needs is built before the fork: between
 // fork and exec a threaded parent's child may only make async-signal-safe calls.
 int run_child(const std::string& exe, const std::string& command, const fs::path& workDir, int threads,
-              ProgressView& view) {
+              ProgressView& view, int& killedBy, std::string& activity) {
+  killedBy = 0;
   std::vector<std::string> env;
   for (char** e = environ; e && *e; ++e) {
     const std::string_view v(*e);
@@ -155,15 +156,17 @@ int run_child(const std::string& exe, const std::string& command, const fs::path
   for (;;) {
     const pid_t r = ::waitpid(pid, &raw, WNOHANG);
     if (r == pid || (r < 0 && errno != EINTR)) break;
-    if (view.active()) {
-      const auto lines = read_lines(workingFile);
-      // "0" and "-" stand in the working file until the job has said what it does.
-      if (lines.size() >= 2 && !lines[0].empty() && lines[0][0] != '-' && trim(lines[1]) != "-")
-        view.show(std::atoi(lines[0].c_str()), trim(lines[1]));
+    // The activity is followed even without a view: a job killed outright is reported with it.
+    const auto lines = read_lines(workingFile);
+    // "0" and "-" stand in the working file until the job has said what it does.
+    if (lines.size() >= 2 && !lines[0].empty() && lines[0][0] != '-' && trim(lines[1]) != "-") {
+      activity = trim(lines[1]);
+      if (view.active()) view.show(std::atoi(lines[0].c_str()), activity);
     }
     std::this_thread::sleep_for(std::chrono::milliseconds(100));
   }
   view.done();
+  if (WIFSIGNALED(raw)) killedBy = WTERMSIG(raw);
   return WIFEXITED(raw) ? WEXITSTATUS(raw) : 128 + WTERMSIG(raw);
 }
 
@@ -542,7 +545,9 @@ StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string
 
   ProgressView view(progress);
   const auto started = std::chrono::steady_clock::now();
-  const int status = run_child(focussingExe, p.command, p.work, req.threads, view);
+  int killedBy = 0;
+  std::string activity = "-";
+  const int status = run_child(focussingExe, p.command, p.work, req.threads, view, killedBy, activity);
   StandaloneOutcome o;
   o.seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - started).count();
   o.workDir = p.work.string();
@@ -555,6 +560,18 @@ StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string
     o.error = "cannot run " + focussingExe;
     o.summary = "sarfocus: " + o.error;
     if (o.status <= 0) o.status = 1;
+    return o;
+  }
+  if (killedBy != 0) {
+    // Killed outright: whatever error record stands is not about this end.
+    const char* name = sigabbrev_np(killedBy);
+    // The working file may have been cut short by the kill; then the last activity seen stands.
+    const auto working = read_lines(p.work / base::kDefaultWorkingFile);
+    if (working.size() >= 2 && !trim(working[1]).empty() && trim(working[1]) != "-") activity = trim(working[1]);
+    o.result = StandaloneResult::kFailed;
+    o.error = "focussing was killed by " + (name ? "SIG" + std::string(name) : "signal " + std::to_string(killedBy)) +
+              " during '" + activity + "'";
+    o.summary = "sarfocus: FAILED: " + o.error + "; log: " + log;
     return o;
   }
   if (status != 0 || (!record.empty() && record[0] == "-1")) {
