@@ -15,6 +15,7 @@
 #endif
 
 #include "base/diagnostics.hpp"
+#include "base/parallel.hpp"
 #include "doppler/dcest.hpp"
 
 namespace sar::doppler {
@@ -248,16 +249,18 @@ int run_blocks(int n, const char* title, bool fromFile, Read read, Estimate esti
         break;
       }
     }
+    base::ParallelFailure failure;
 #pragma omp parallel if (ready > 1)
     {
       std::vector<fcomplex> own;
 #pragma omp for schedule(dynamic, 1)
-      for (int k = 0; k < ready; ++k) {
+      for (int k = 0; k < ready; ++k) failure.run([&] {
         const std::size_t i = static_cast<std::size_t>(k);
         logs[i].clear();
         status[i] = estimate(first + k, slot(k), own, logs[i]);
-      }
+      });
     }
+    failure.rethrow();
     for (int k = 0; k < ready; ++k) {
       std::printf(title, first + k + 1, n);
       std::fputs(logs[static_cast<std::size_t>(k)].c_str(), stdout);

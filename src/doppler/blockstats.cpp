@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <fstream>
 #include <numbers>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -15,6 +16,7 @@
 #endif
 
 #include "base/diagnostics.hpp"
+#include "base/parallel.hpp"
 #include "base/run_services.hpp"
 #include "doppler/dcest.hpp"
 
@@ -382,22 +384,25 @@ int getnadcbins(dcestconf& conf, const dcimage& image) {
     maps.patchl = conf.Patchl;
     maps.area = static_cast<float>(conf.Patchs) * static_cast<float>(conf.Patchl);
     // Each patch lies in exactly one block, so blocks may be added concurrently to the maps.
+    base::ParallelFailure failure;
 #pragma omp parallel
     {
-      BlockPass pass(conf.Blocks, conf.Blockl);
+      std::optional<BlockPass> pass;
+      failure.run([&] { pass.emplace(conf.Blocks, conf.Blockl); });
 #pragma omp for schedule(static)
-      for (int k = 0; k < count; ++k) {
+      for (int k = 0; k < count; ++k) failure.run([&] {
         const int r = k / nc;
         const int c = k - r * nc;
         const int left = c * conf.Blocks;
         const int top = (firstRow + r) * conf.Blockl;
         dcblock& b = conf.blocks[static_cast<std::size_t>(firstRow + r) * static_cast<std::size_t>(nc) +
                                  static_cast<std::size_t>(c)];
-        pass.run(conf, chunk + static_cast<int64_t>(r) * conf.Blockl * samples + left, samples, b, &maps, left, top);
+        pass->run(conf, chunk + static_cast<int64_t>(r) * conf.Blockl * samples + left, samples, b, &maps, left, top);
         b.sample = left + conf.Blocks / 2;
         b.line = top + conf.Blockl / 2;
-      }
+      });
     }
+    failure.rethrow();
     if (conf.progressFlag) base::waitbar_update(100.0 * (firstRow + rows) / nr);
   }
   print_progress(conf, "done.\n");

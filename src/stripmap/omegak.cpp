@@ -6,6 +6,7 @@
 #include <cstdio>
 
 #include "base/diagnostics.hpp"
+#include "base/parallel.hpp"
 #include "dsp/czt.hpp"
 #include "dsp/fft.hpp"
 #include "dsp/filters.hpp"
@@ -356,11 +357,16 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
   if (dsp::fft_makep_c(back, M, M, 1, 1, -1, 0, 1) != 0) return 1;
   std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
 
+  base::ParallelFailure failure;
 #pragma omp parallel
   {
-    dsp::cvector z(static_cast<std::size_t>(M2) + 1), out(static_cast<std::size_t>(M));
+    dsp::cvector z, out;
+    failure.run([&] {
+      z.resize(static_cast<std::size_t>(M2) + 1);
+      out.resize(static_cast<std::size_t>(M));
+    });
 #pragma omp for schedule(dynamic, 16)
-    for (int j = 0; j < L; ++j) {
+    for (int j = 0; j < L; ++j) failure.run([&] {
       fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
       const double y = ky[static_cast<std::size_t>(j)], r = rs[static_cast<std::size_t>(j)];
       const double e = r - std::trunc(r / dk) * dk;
@@ -369,7 +375,7 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
       int i1 = 0, i2 = 0;
       if (!kx.span(lowArg, highArg, M, i1, i2)) {
         std::fill(row, row + n, fcomplex{});
-        continue;
+        return;
       }
       dsp::pczt_c(plan, std::span<const fcomplex>(row, static_cast<std::size_t>(n)),
                   std::span<fcomplex>(z.data(), static_cast<std::size_t>(M2)), -2.0 * kPi / Ni, s * (2.0 * kPi / B), 1);
@@ -401,8 +407,9 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
       }
       finish_row(back, out, row, Nout, n);
-    }
+    });
   }
+  failure.rethrow();
   finish_block(wk, w, sums);
   return 0;
 }
@@ -442,18 +449,23 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
   if (dsp::fft_makep_c(fwd, N, N, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(back, M, M, 1, 1, -1, 0, 1) != 0) return 1;
   std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
 
+  base::ParallelFailure failure;
 #pragma omp parallel
   {
-    dsp::cvector buf(static_cast<std::size_t>(N + 2 * order + 2)), out(static_cast<std::size_t>(M));
+    dsp::cvector buf, out;
+    failure.run([&] {
+      buf.resize(static_cast<std::size_t>(N + 2 * order + 2));
+      out.resize(static_cast<std::size_t>(M));
+    });
 #pragma omp for schedule(dynamic, 16)
-    for (int j = 0; j < L; ++j) {
+    for (int j = 0; j < L; ++j) failure.run([&] {
       fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
       const double y = ky[static_cast<std::size_t>(j)];
       const double lowArg = krs * krs - y * y, highArg = kre * kre - y * y;
       int i1 = 0, i2 = 0;
       if (!kx.span(lowArg, highArg, M, i1, i2)) {
         std::fill(row, row + n, fcomplex{});
-        continue;
+        return;
       }
       std::fill(buf.begin(), buf.end(), fcomplex{});
       fcomplex* line = buf.data() + order;
@@ -482,8 +494,9 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(acc.real()), static_cast<float>(acc.imag()));
       }
       finish_row(back, out, row, Nout, n);
-    }
+    });
   }
+  failure.rethrow();
   finish_block(wk, w, sums);
   return 0;
 }

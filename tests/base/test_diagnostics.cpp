@@ -1,8 +1,12 @@
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <cerrno>
+#include <stdexcept>
+#include <string>
 
 #include "base/diagnostics.hpp"
+#include "base/parallel.hpp"
 #include "base/errors.hpp"
 
 using namespace sar::base;
@@ -163,5 +167,33 @@ TEST(ErrorCodes, ArithmeticAndExitStatus) {
       EXPECT_EQ(make_ec(c.pec, c.sec), c.ec);
     }
     EXPECT_EQ(process_status_for(c.ec), c.status) << c.ec;
+  }
+}
+
+// An exception thrown inside a parallel region comes out after it, the first one thrown, and
+// once a body has failed the remaining bodies are skipped; with no failure nothing is thrown.
+TEST(ParallelFailure, CarriesTheFirstExceptionOutOfTheRegion) {
+  for (const int failing : {-1, 0, 37, 999}) {
+    sar::base::ParallelFailure failure;
+    std::atomic<int> ran{0};
+#pragma omp parallel for schedule(static, 1)
+    for (int i = 0; i < 1000; ++i)
+      failure.run([&] {
+        ++ran;
+        if (i == failing) throw std::runtime_error("body " + std::to_string(i));
+      });
+    if (failing < 0) {
+      EXPECT_NO_THROW(failure.rethrow());
+      EXPECT_EQ(ran.load(), 1000);
+      continue;
+    }
+    EXPECT_TRUE(failure.failed());
+    try {
+      failure.rethrow();
+      ADD_FAILURE() << "nothing rethrown";
+    } catch (const std::runtime_error& e) {
+      EXPECT_EQ(std::string(e.what()), "body " + std::to_string(failing));
+    }
+    EXPECT_LE(ran.load(), 1000);
   }
 }
