@@ -1,6 +1,7 @@
 #include "base/diagnostics.hpp"
 
 #include <algorithm>
+#include <cstdarg>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -332,5 +333,23 @@ void Frame::check_errno(source_location loc) const {
   omb_check(errno, static_cast<int>(loc.line()), file_, file_);
   errno = 0;
 }
+
+std::string format_text(const char* format, ...) {
+  va_list args;
+  va_start(args, format);
+  va_list copy;
+  va_copy(copy, args);
+  const int n = std::vsnprintf(nullptr, 0, format, copy);
+  va_end(copy);
+  std::string text;
+  if (n > 0) {
+    text.resize(static_cast<std::size_t>(n) + 1);
+    std::vsnprintf(text.data(), text.size(), format, args);
+    text.resize(static_cast<std::size_t>(n));
+  }
+  va_end(args);
+  return text;
+}
+
 
 }  // namespace sar::base

@@ -19,6 +19,9 @@
 
 namespace sar::base {
 
+/// printf-style text of any length, for report messages.
+std::string format_text(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
 /// Report levels.
 enum ReportLevel : int {
   kReportError = 0,

@@ -233,25 +233,6 @@ int write_file(const FileNode& file) {
 
 // ----------------------------------------------------------------------------- texts
 
-std::string format_text(const char* format, ...) __attribute__((format(printf, 1, 2)));
-
-std::string format_text(const char* format, ...) {
-  va_list args;
-  va_start(args, format);
-  va_list copy;
-  va_copy(copy, args);
-  const int n = std::vsnprintf(nullptr, 0, format, copy);
-  va_end(copy);
-  std::string text;
-  if (n > 0) {
-    text.resize(static_cast<std::size_t>(n) + 1);
-    std::vsnprintf(text.data(), text.size(), format, args);
-    text.resize(static_cast<std::size_t>(n));
-  }
-  va_end(args);
-  return text;
-}
-
 std::string str(std::string_view view) { return std::string(view); }
 
 int as_int(std::size_t n) {

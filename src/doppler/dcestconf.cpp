@@ -6,6 +6,15 @@
 
 namespace sar::doppler {
 
+const char* centroid_source_text(CentroidSource source) {
+  switch (source) {
+    case CentroidSource::Fit: return "fitted surface of the blocks";
+    case CentroidSource::Constant: return "one constant from all signal blocks";
+    case CentroidSource::Geometry: return "orbit geometry";
+  }
+  return "?";
+}
+
 void read_dcestconf(const std::string& f, dcestconf& dc) {
   using base::GetCheckMyProfileDouble;
   using base::GetCheckMyProfileInt;

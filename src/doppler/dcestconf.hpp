@@ -80,6 +80,10 @@ enum class CentroidSource : int32_t {
   Geometry = 2,  ///< the orbit and attitude law alone
 };
 
+/// What a source is called in the log: "fitted surface of the blocks", "one constant from all
+/// signal blocks", "orbit geometry".
+const char* centroid_source_text(CentroidSource source);
+
 /// The plausibility checks of a data estimate and what they found. A bound of 0 means the
 /// check was not made.
 struct CentroidGates {
@@ -90,7 +94,7 @@ struct CentroidGates {
   int32_t signalBlocks = 0;     ///< blocks whose lag-one correlation shows a signal
   double slopeLow = 0.0, slopeHigh = 0.0;  ///< allowed range slopes, Hz/s
   double slopeWorst = 0.0;      ///< fitted slope farthest from the geometric one, Hz/s
-  double outliers = 0.0;        ///< blocks set aside as lying off the surface of the others
+  int32_t outliers = 0;         ///< blocks set aside as lying off the surface of the others
   double scatter = 0.0;         ///< weighted scatter of the block centroids about the fit over its prediction
   double scatterBound = 0.0;
   double constantCycles = 0.0;  ///< the fractional centroid of all signal blocks, cycles

@@ -267,10 +267,14 @@ constexpr double kSignalFactor = 3.0;
 
 double wrap_cycles(double v) { return v - std::round(v); }
 
-std::string format(const char* fmt, double a, double b = 0.0, double c = 0.0) {
-  char t[256];
-  std::snprintf(t, sizeof t, fmt, a, b, c);
-  return t;
+using base::format_text;
+
+/// A block whose centroid entered the fit and whose phase variance is known.
+bool on_surface(const dcblock& b) { return b.good && !b.filled && b.phaseVariance > 0.0; }
+
+/// The block's distance from the surface in its own predicted standard deviations.
+double normalised_residual(const dcblock& b, std::span<const double> c) {
+  return std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance);
 }
 
 /// The noise floor (median power per sample over the blocks: most blocks of a dark scene hold
@@ -303,10 +307,10 @@ double slope_hz(std::span<const double> c, double x, double y, double prf, doubl
 }
 
 /// The fitted surface's range slope must lie where the geometry can put it, across the whole
-/// swath and at the top, middle and bottom of the scene.
-bool slope_gate(dcestconf& conf, const dcimage& image, std::span<const double> c) {
+/// swath and at the top, middle and bottom of the scene. Returns why not ("" when it does).
+std::string slope_gate(dcestconf& conf, const dcimage& image, std::span<const double> c) {
   auto& g = conf.gates;
-  if (!(conf.slopeTolerance > 0.0)) return true;
+  if (!(conf.slopeTolerance > 0.0)) return "";
   g.slopeLow = conf.geometricSlope - conf.slopeTolerance;
   g.slopeHigh = conf.geometricSlope + conf.slopeTolerance;
   const double rows[3] = {static_cast<double>(conf.blocks.front().line), image.lines / 2.0,
@@ -318,35 +322,32 @@ bool slope_gate(dcestconf& conf, const dcimage& image, std::span<const double> c
       const double v = slope_hz(c, x, y, image.prf, conf.fs);
       if (std::fabs(v - conf.geometricSlope) > std::fabs(g.slopeWorst - conf.geometricSlope)) g.slopeWorst = v;
     }
-  if (g.slopeWorst >= g.slopeLow && g.slopeWorst <= g.slopeHigh) return true;
-  g.failed = "range slope";
-  g.reason = format("fitted range slope %.4g Hz/s outside the geometric band %.4g .. %.4g Hz/s", g.slopeWorst,
-                    g.slopeLow, g.slopeHigh);
-  return false;
+  if (g.slopeWorst >= g.slopeLow && g.slopeWorst <= g.slopeHigh) return "";
+  return format_text("fitted range slope %.4g Hz/s outside the geometric band %.4g .. %.4g Hz/s", g.slopeWorst,
+                     g.slopeLow, g.slopeHigh);
 }
 
 /// The blocks that measured their centroid must lie about the surface as their phase variances
-/// predict: sqrt(chi^2 / degrees of freedom) at most dcestconf::CentroidScatterBound.
-bool scatter_gate(dcestconf& conf, std::span<const double> c) {
+/// predict: sqrt(chi^2 / degrees of freedom) at most dcestconf::CentroidScatterBound. Returns
+/// why not ("" when they do).
+std::string scatter_gate(dcestconf& conf, std::span<const double> c) {
   auto& g = conf.gates;
   double chi2 = 0.0;
   int n = 0;
-  for (const auto& b : conf.blocks) {
-    if (!b.good || b.filled || !(b.phaseVariance > 0.0)) continue;
-    const double r = wrap_cycles(b.centroid - dccycles(c, b.sample, b.line));
-    chi2 += r * r / b.phaseVariance;
-    ++n;
-  }
+  for (const auto& b : conf.blocks)
+    if (on_surface(b)) {
+      const double z = normalised_residual(b, c);
+      chi2 += z * z;
+      ++n;
+    }
   int terms = 0;
   for (std::size_t j = 0; j < 7; ++j) terms += c[j] != 0.0 ? 1 : 0;
   const int dof = std::max(1, n - terms);
   g.scatter = std::sqrt(chi2 / dof);
   g.scatterBound = conf.CentroidScatterBound;
-  if (g.scatter <= g.scatterBound) return true;
-  g.failed = "block scatter";
-  g.reason = format("weighted scatter of %.0f blocks about the fit %.3g times their predicted spread (bound %.3g)",
-                    static_cast<double>(n), g.scatter, g.scatterBound);
-  return false;
+  if (g.scatter <= g.scatterBound) return "";
+  return format_text("weighted scatter of %d blocks about the fit %.3g times their predicted spread (bound %.3g)", n,
+                     g.scatter, g.scatterBound);
 }
 
 /// One fractional centroid from the lag-one correlations of every signal block summed as
@@ -377,7 +378,7 @@ bool fitted_surface(const dcimage& image, dcestconf& conf, std::array<double, 7>
   const auto good = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const dcblock& b) { return b.good; });
   if (good <= 7) {
     g.failed = "signal blocks";
-    g.reason = format("%.0f blocks with a signal, at least 8 needed for a surface", static_cast<double>(good));
+    g.reason = format_text("%d blocks with a signal, at least 8 needed for a surface", static_cast<int>(good));
     return false;
   }
   if (fillblocks(conf, image) != 0 || getkrstd(image, conf) != 0) {
@@ -395,21 +396,18 @@ bool fitted_surface(const dcimage& image, dcestconf& conf, std::array<double, 7>
   // give centroids far off the surface of the rest: they are set aside and the surface fitted
   // again without them, twice at most. Off means beyond three robust standard deviations of the
   // normalised residuals, and never within three of the blocks' own predicted spread.
-  const auto fitted = std::count_if(conf.blocks.begin(), conf.blocks.end(), [](const dcblock& b) { return b.good && !b.filled; });
+  const auto fitted = std::count_if(conf.blocks.begin(), conf.blocks.end(), on_surface);
   for (int pass = 0; pass < 2; ++pass) {
     std::vector<double> z;
     for (const auto& b : conf.blocks)
-      if (b.good && !b.filled && b.phaseVariance > 0.0)
-        z.push_back(std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance));
+      if (on_surface(b)) z.push_back(normalised_residual(b, c));
     if (z.size() < 8) break;
-    std::vector<double> sorted(z);
-    const auto mid = sorted.begin() + static_cast<std::ptrdiff_t>(sorted.size() / 2);
-    std::nth_element(sorted.begin(), mid, sorted.end());
+    const auto mid = z.begin() + static_cast<std::ptrdiff_t>(z.size() / 2);
+    std::nth_element(z.begin(), mid, z.end());
     const double limit = std::max(3.0, 3.0 * 1.4826 * *mid);
     int dropped = 0;
     for (auto& b : conf.blocks)
-      if (b.good && !b.filled && b.phaseVariance > 0.0 &&
-          std::fabs(wrap_cycles(b.centroid - dccycles(c, b.sample, b.line))) / std::sqrt(b.phaseVariance) > limit) {
+      if (on_surface(b) && normalised_residual(b, c) > limit) {
         b.good = 0;
         ++dropped;
       }
@@ -423,8 +421,8 @@ bool fitted_surface(const dcimage& image, dcestconf& conf, std::array<double, 7>
   }
   if (3 * g.outliers > fitted) {
     g.failed = "block scatter";
-    g.reason = format("%.0f of %.0f blocks lie off the fitted surface (at most a third may)", g.outliers,
-                      static_cast<double>(fitted));
+    g.reason = format_text("%d of %d blocks lie off the fitted surface (at most a third may)", g.outliers,
+                           static_cast<int>(fitted));
     return false;
   }
   return true;
@@ -448,14 +446,12 @@ int dcnapoly(const dcimage& image, dcestconf& conf, DopplerPoly& poly) {
   bool surface = fitted_surface(image, conf, c, status);
   if (surface) {
     // Both checks are made, so that the result file shows both values; the first to fail is named.
-    const bool slopeOk = slope_gate(conf, image, c);
-    const std::string slopeFailed = g.failed, slopeReason = g.reason;
-    const bool scatterOk = scatter_gate(conf, c);
-    if (!slopeOk) {
-      g.failed = slopeFailed;
-      g.reason = slopeReason;
+    const std::string slope = slope_gate(conf, image, c), scatter = scatter_gate(conf, c);
+    if (!slope.empty() || !scatter.empty()) {
+      surface = false;
+      g.failed = slope.empty() ? "block scatter" : "range slope";
+      g.reason = slope.empty() ? scatter : slope;
     }
-    surface = slopeOk && scatterOk;
   }
   if (status != 0) return frame.check(status);
   if (!surface) {
@@ -467,14 +463,12 @@ int dcnapoly(const dcimage& image, dcestconf& conf, DopplerPoly& poly) {
       g.source = CentroidSource::Geometry;
       if (g.failed.empty() || g.signalBlocks == 0) {
         g.failed = "signal blocks";
-        g.reason = format("%.0f blocks with a signal above the noise floor %.4g", static_cast<double>(g.signalBlocks),
+        g.reason = format_text("%d blocks with a signal above the noise floor %.4g", g.signalBlocks,
                           g.noiseFloor);
       }
     }
-    static constexpr const char* kApplied[3] = {"the fitted surface", "one constant fractional centroid of all signal blocks",
-                                                "the geometric centroid"};
-    const std::string text = "Doppler centroid: " + g.failed + " check failed (" + g.reason + "): " +
-                             kApplied[static_cast<int>(g.source)] + " applied";
+    const std::string text = "Doppler centroid: " + g.failed + " check failed (" + g.reason + "): the " +
+                             centroid_source_text(g.source) + " applied";
     base::report(base::kReportWarning, text);
     std::printf("\nWARNING: %s\n", text.c_str());
   }

@@ -180,7 +180,7 @@ int resumefile(const dcestconf& conf, const dcimage& image, const DopplerPoly& p
     dbl(cp, "Range_slope_high_Hz/s", g.slopeHigh);
   }
   if (g.scatterBound > 0.0) {
-    dbl(cp, "Blocks_off_the_surface", g.outliers);
+    num(cp, "Blocks_off_the_surface", g.outliers);
     dbl(cp, "Block_scatter", g.scatter);
     dbl(cp, "Block_scatter_bound", g.scatterBound);
   }

@@ -116,10 +116,8 @@ int getnadcpoly(const std::string& input, dcestconf& conf, sarpar& par, procparm
   conf.coreMatrix = {};
   named("getnadcpoly", st);
   if (st == 0) {
-    static constexpr const char* kSource[3] = {"fitted surface of the blocks", "one constant from all signal blocks",
-                                               "orbit geometry"};
     const auto& g = conf.gates;
-    base::LogPrintf("Doppler centroid from the %s%s%s%s\n", kSource[static_cast<int>(g.source)],
+    base::LogPrintf("Doppler centroid from the %s%s%s%s\n", doppler::centroid_source_text(g.source),
                     g.failed.empty() ? "" : " (", g.failed.empty() ? "" : (g.failed + " check: " + g.reason).c_str(),
                     g.failed.empty() ? "" : ")");
     std::copy(poly.begin(), poly.end(), proc.dopplerCentroid.begin());

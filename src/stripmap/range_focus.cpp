@@ -25,11 +25,6 @@ constexpr int kProgressLines = 100;
 
 void reject(const std::string& text) { base::report(base::kReportError, text); }
 
-std::string format(const char* fmt, double a, double b = 0.0, double c = 0.0) {
-  char t[256];
-  std::snprintf(t, sizeof t, fmt, a, b, c);
-  return t;
-}
 
 const std::string& raw_path(const sarpar& par) { return par.raw_file.empty() ? par.extrPath : par.raw_file; }
 
@@ -62,9 +57,9 @@ int line_shift(const sarpar& par, const procparm& proc, const RangeSizes& z, flo
   if (!proc.Flag_swstal) return 0;
   const double s = static_cast<double>(base::round_half_away((time - par.nearRangeTime) * par.samplingRate));
   if (!(s >= 0.0 && s <= z.windowSpan)) {
-    reject("Range line " + std::to_string(line) + format(": window start %.9g s lies outside the product's window"
-                                                          " span (%.9g s + %g samples)",
-                                                          time, par.nearRangeTime, z.windowSpan));
+    reject("Range line " + std::to_string(line) +
+           base::format_text(": window start %.9g s lies outside the product's window span (%.9g s + %d samples)",
+                             static_cast<double>(time), par.nearRangeTime, z.windowSpan));
     return kRejected;
   }
   shift = static_cast<int32_t>(s);
@@ -178,8 +173,8 @@ int range_sizes(const sarpar& par, const procparm& proc, RangeSizes& z) {
   }
   const double span = static_cast<double>(base::round_half_away((par.far_range_time - par.nearRangeTime) * par.samplingRate));
   if (!(span >= 0.0 && span < 1e6)) {
-    reject(format("Range focusing: window span of %g samples between %.9g s and %.9g s", span, par.nearRangeTime,
-                  par.far_range_time));
+    reject(base::format_text("Range focusing: window span of %g samples between %.9g s and %.9g s", span,
+                             par.nearRangeTime, par.far_range_time));
     return kRejected;
   }
   z.windowSpan = static_cast<int32_t>(span);
