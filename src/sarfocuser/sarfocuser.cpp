@@ -10,7 +10,6 @@
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
 #include "doppler/dcest.hpp"
-#include "envisat/replica_pattern.hpp"
 #include "geometry/orbit_interp.hpp"
 #include "stripmap/azimuth_focus.hpp"
 #include "stripmap/coords.hpp"
@@ -156,7 +155,7 @@ int SARFocuser::process() {
   if (a.lines < 1 || a.samples < 1 || !(a.prf > 0.0) || !(a.sampling_rate > 0.0)) return fail("SARFocuser::process", 10);
 
   // The acquisition in the terms of the stripmap stages.
-  par_ = envisat::sarpar{};
+  par_ = metadata::sarpar{};
   par_.slcPath = output_.OutputFilename;
   const auto cut = output_.OutputFilename.find_last_of("/\\");
   par_.outputDir = cut == std::string::npos ? "." : output_.OutputFilename.substr(0, cut);
@@ -206,7 +205,7 @@ int SARFocuser::process() {
   proc_.orbitNumber = std::atoi(a.leader.dss.orbit_number.c_str());
 
   // Range reference: the nominal chirp of the pulse, as the stripmap chain expects it.
-  if (int st = frame.check(envisat::envi_syntchirp(par_, proc_))) return fail("chirp", st);
+  if (int st = frame.check(metadata::synthetic_chirp(par_, proc_))) return fail("chirp", st);
 
   if (conf_.Flag_rangefoc) {
     const StageClock clock("range");

@@ -11,7 +11,7 @@
 #include <string>
 
 #include "doppler/dcestconf.hpp"
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "radarsat/extract.hpp"
 #include "stripmap/procparm.hpp"
 
@@ -62,7 +62,7 @@ class SARFocuser {
   /// (its name in failed_stage()).
   int run();
 
-  const envisat::sarpar& par() const { return par_; }
+  const metadata::sarpar& par() const { return par_; }
   const stripmap::procparm& proc() const { return proc_; }
   const stripmap::azimuthconf& az() const { return conf_.az; }
   const SARFocuser_conf& conf() const { return conf_; }
@@ -79,7 +79,7 @@ class SARFocuser {
   SARFocuser_input input_;
   SARFocuser_output output_;
   const radarsat::Acquisition& acq_;
-  envisat::sarpar par_;
+  metadata::sarpar par_;
   stripmap::procparm proc_;
   double centroid_ = 0.0;
   bool centroidFromData_ = false;

@@ -11,13 +11,13 @@
 //   first sample time = near range time + h_r / fs
 #include <cstdint>
 
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "stripmap/omegak.hpp"
 #include "stripmap/procparm.hpp"
 
 namespace sar::stripmap {
 
-using envisat::sarpar;
+using metadata::sarpar;
 
 /// What focazwk did to one sub-block.
 struct focazwk_result {

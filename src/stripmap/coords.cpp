@@ -7,7 +7,7 @@
 
 namespace sar::stripmap {
 
-int get_coords(procparm& proc, const envisat::sarpar& par) {
+int get_coords(procparm& proc, const metadata::sarpar& par) {
   base::Frame frame("get_coords");
   geometry::grpt_rec rec;
   for (int i = 0; i < 5; ++i)

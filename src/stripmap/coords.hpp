@@ -1,6 +1,6 @@
 #pragma once
 // Corner and centre coordinates of a focused stripmap image.
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "stripmap/procparm.hpp"
 
 namespace sar::stripmap {
@@ -10,6 +10,6 @@ namespace sar::stripmap {
 /// `proc`, and stores range time, azimuth time, latitude and longitude of each in
 /// proc.corners (near-early, far-early, near-late, far-late, centre), with the incidence and
 /// look angles of the centre. Returns 0, or the failing geolocation's status.
-int get_coords(procparm& proc, const envisat::sarpar& par);
+int get_coords(procparm& proc, const metadata::sarpar& par);
 
 }  // namespace sar::stripmap

@@ -99,7 +99,7 @@ int get_poly(double /*azStart*/, double rgStart, int nAz, int nRg, double /*azSt
   return 0;
 }
 
-int getgeopoly(const envisat::sarpar& par, procparm& proc) {
+int getgeopoly(const metadata::sarpar& par, procparm& proc) {
   base::Frame frame("getgeopoly");
   if (!(par.prf > 0.0) || !(par.samplingRate > 0.0) || par.lines < 1 || par.samples < 1 ||
       !(par.carrierFrequency > 0.0) || !(proc.orbitSpacing > 0.0)) {

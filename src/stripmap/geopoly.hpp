@@ -9,7 +9,7 @@
 #include <array>
 #include <span>
 
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "geometry/vec3.hpp"
 #include "stripmap/procparm.hpp"
 
@@ -23,7 +23,7 @@ inline constexpr double kGeoPolyRangeShare = 0.1111111111111111;
 /// polynomials from the scene's orbit block, its Doppler centroid polynomial and the raw extent
 /// of `par` (centre line, near range, swath width). Runs before azimuth focusing, which needs
 /// the rate. 0, 10 for unusable acquisition parameters, or the failing geolocation or fit status.
-int getgeopoly(const envisat::sarpar& par, procparm& proc);
+int getgeopoly(const metadata::sarpar& par, procparm& proc);
 
 /// Geolocates an nAz x nRg grid (azimuth time azStart + i azStep, slant time rgStart + j rgStep,
 /// Doppler from the centroid polynomial) on WGS84 with the five Earth-fixed state vectors

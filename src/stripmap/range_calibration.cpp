@@ -62,7 +62,7 @@ int IncidCompCoeff(std::span<const double> coeff, double fs, std::span<double> o
   return 0;
 }
 
-std::vector<double> range_calibration_gain(const envisat::sarpar& par, const procparm& proc, int samples) {
+std::vector<double> range_calibration_gain(const metadata::sarpar& par, const procparm& proc, int samples) {
   std::vector<double> g(static_cast<std::size_t>(std::max(samples, 0))), h(g.size());
   const auto look = used_coefficients(proc.lookAngle);
   const auto incidence = used_coefficients(proc.incidenceAngle);
@@ -80,7 +80,7 @@ void apply_range_gain(std::span<std::complex<float>> rows, int lines, int pitch,
   }
 }
 
-int range_antenna_calibration(const envisat::sarpar& par, procparm& proc) {
+int range_antenna_calibration(const metadata::sarpar& par, procparm& proc) {
   base::Frame frame("IMCalibration");
   if (proc.progressFlag) std::printf("\nRANGE ANTENNA CALIBRATION started... \n");
   const int samples = proc.rangeSamples, lines = proc.lines;

@@ -15,7 +15,7 @@
 #include <span>
 #include <vector>
 
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "stripmap/procparm.hpp"
 
 namespace sar::stripmap {
@@ -28,13 +28,13 @@ int InterpRgAnt(const procparm& proc, std::span<const double> coeff, double fs, 
 int IncidCompCoeff(std::span<const double> coeff, double fs, std::span<double> out, double tNear);
 
 /// The gain vector of `samples` range samples. Empty when the pattern or the geometry is missing.
-std::vector<double> range_calibration_gain(const envisat::sarpar& par, const procparm& proc, int samples);
+std::vector<double> range_calibration_gain(const metadata::sarpar& par, const procparm& proc, int samples);
 
 /// Multiplies each of `lines` rows (`pitch` apart) of `samples` samples by the gain.
 void apply_range_gain(std::span<std::complex<float>> rows, int lines, int pitch, std::span<const double> gain);
 
 /// The stage: the gain over the core matrix (Flag_incore) or, block by block of Azblk lines,
 /// over the range file par.rgfPath. 0, 10 for missing inputs, 1 for a file failure.
-int range_antenna_calibration(const envisat::sarpar& par, procparm& proc);
+int range_antenna_calibration(const metadata::sarpar& par, procparm& proc);
 
 }  // namespace sar::stripmap

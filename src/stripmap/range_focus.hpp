@@ -23,12 +23,12 @@
 #include <cstdint>
 #include <span>
 
-#include "envisat/records.hpp"
+#include "metadata/acquisition.hpp"
 #include "stripmap/procparm.hpp"
 
 namespace sar::stripmap {
 
-using envisat::sarpar;
+using metadata::sarpar;
 
 /// Sizes of the range correlation of a product.
 struct RangeSizes {

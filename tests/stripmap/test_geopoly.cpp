@@ -12,7 +12,7 @@
 
 namespace {
 
-using sar::envisat::sarpar;
+using sar::metadata::sarpar;
 using sar::geometry::OrbitData;
 using sar::geometry::Vec3;
 using sar::stripmap::DCeval;

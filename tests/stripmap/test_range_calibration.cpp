@@ -55,7 +55,7 @@ TEST(RangeCalibration, PatternOnGridBetweenAndBeyond) {
 // P_r ~ P(look)^2 sigma0 / (R^3 sin(incidence)), is flat after the gain, in power.
 TEST(RangeCalibration, UniformSceneComesOutFlat) {
   procparm p = with_pattern();
-  envisat::sarpar par;
+  metadata::sarpar par;
   par.samplingRate = 19.2e6;
   par.nearRangeTime = 5.6e-3;
   const int samples = 6000, lines = 10;
@@ -112,7 +112,7 @@ TEST(RangeCalibration, UniformSceneComesOutFlat) {
 
 TEST(RangeCalibration, MissingPatternIsRefused) {
   procparm p;
-  envisat::sarpar par;
+  metadata::sarpar par;
   par.samplingRate = 19.2e6;
   par.nearRangeTime = 5.6e-3;
   p.rangeSamples = 10;
