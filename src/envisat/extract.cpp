@@ -33,6 +33,11 @@ constexpr int kSwstLeapLimit = 100;
 constexpr int kSwstMinStart = 5000;
 constexpr int kMaxSamples = 65536;                 // a 16-bit window length bounds a line
 constexpr double kAntennaLength = 10.0;
+// Polarisation contradictions reported one by one; beyond one echo in kMismatchShare the
+// extraction ends.
+constexpr std::int64_t kReportedMismatches = 10;
+constexpr std::int64_t kMismatchShare = 100;
+constexpr std::array<const char*, 4> kPolarisationText = {"H/H", "V/V", "H/V", "V/H"};
 
 std::string at_text(std::int64_t pos, std::int64_t size) {
   char t[96];
@@ -88,6 +93,8 @@ class Walker {
   void calibration(int channel);
   void noise(int channel);
   void fill_gap(std::int64_t i);
+  // Alternating polarisation: the echo's polarisation bits against the channel of the table.
+  void check_polarisation(int channel, int expected);
 
   // Lines.
   float range_time(int channel, int swst) const {
@@ -128,6 +135,9 @@ class Walker {
   double fillTime_ = 0.0;
   int burstCounter_ = 0;
   int outLines_ = 0;
+  std::int64_t apEchoes_ = 0;
+  std::int64_t polarisationMismatches_ = 0;
+  std::string firstMismatch_;
   friend int sar::envisat::extract_level0(const std::string&, const Level0Header&, LineTable&,
                                           const FbaqTables&, std::span<const float>, std::span<sarpar>, extconf&,
                                           const ProgressSink&);
@@ -218,8 +228,11 @@ void Walker::fill_buffers() {
   for (std::size_t ch = 0; ch < state_.size(); ++ch) {
     for (;;) {
       read_head();
-      const bool wanted = head_.echo && (!is_burst_mode(mode_) ||
-                                         head_.beamCode - mode_info(mode_).beamOffset == static_cast<int>(ch));
+      // Each channel is primed with an echo of its own: its beam in wide swath, its
+      // polarisation pair in alternating polarisation.
+      bool wanted = head_.echo;
+      if (is_burst_mode(mode_)) wanted = wanted && head_.beamCode - mode_info(mode_).beamOffset == static_cast<int>(ch);
+      if (is_alternating(mode_)) wanted = wanted && ap_channel(mode_, head_.txV, head_.rxV) == static_cast<int>(ch);
       if (!wanted) {
         skip_payload();
         continue;
@@ -245,6 +258,7 @@ void Walker::echo(std::int64_t i, int channel, int expected) {
     report(kReportWarning, t);
     channel = tableChannel;
   }
+  if (is_alternating(mode_)) check_polarisation(channel, expected);
   decode_echo(channel, read_payload());
   if ((e.kind_word & kLineBurstStart) && channel == 0) ++burstCounter_;
 
@@ -277,12 +291,29 @@ void Walker::echo(std::int64_t i, int channel, int expected) {
     if (is_alternating(mode_)) {
       const int o = other(channel);
       ChannelState& so = state_[static_cast<std::size_t>(o)];
+      // The other polarisation was not received on this line: a stand-in, not an echo.
       write_line(o, so.zeros);
-      side(o, so.currentSwst, 0, expected);
+      side(o, so.currentSwst, 1, 0);
     }
     if (!is_burst_mode(mode_)) side(channel, s.currentSwst, 0, expected);
     ++outLines_;
   }
+}
+
+void Walker::check_polarisation(int channel, int expected) {
+  ++apEchoes_;
+  const int byBits = ap_channel(mode_, head_.txV, head_.rxV);
+  if (byBits == channel) return;
+  static constexpr std::array<const char*, 2> kLetter = {"H", "V"};
+  char t[200];
+  std::snprintf(t, sizeof t, "packet counter %d at byte %lld carries %s/%s, the timeline expects channel %d (%s)",
+                expected, static_cast<long long>(in_.pos() - static_cast<std::int64_t>(l0::kHeadSize)),
+                kLetter[head_.txV], kLetter[head_.rxV], channel,
+                kPolarisationText[static_cast<std::size_t>(ap_polarisations(mode_)[static_cast<std::size_t>(channel)])]);
+  if (polarisationMismatches_ == 0) firstMismatch_ = t;
+  if (polarisationMismatches_ < kReportedMismatches)
+    report(kReportWarning, std::string("Polarisation of the packet does not match the timeline: ") + t);
+  ++polarisationMismatches_;
 }
 
 void Walker::calibration(int channel) {
@@ -427,6 +458,15 @@ void Walker::run(const WalkRange& range, const ProgressSink& progress) {
 }
 
 void Walker::finish() {
+  if (polarisationMismatches_ * kMismatchShare > apEchoes_) {
+    // The channels cannot be told apart by the timeline if the packets disagree with it this
+    // often: the product is not the sub-mode it was taken for.
+    char count[96];
+    std::snprintf(count, sizeof count, "%lld of %lld echoes", static_cast<long long>(polarisationMismatches_),
+                  static_cast<long long>(apEchoes_));
+    fatal(ec::kBadArguments, {in_.path(), "packet polarisation contradicts the timeline (" + std::string(count) + ")",
+                              firstMismatch_});
+  }
   const std::size_t n = state_.size();
   int minSwst = kSwstMinStart, maxSwst = 0;
   for (const ChannelState& s : state_) {

@@ -32,6 +32,10 @@ std::uint32_t u32(HeadBytes h, std::size_t at) {
          std::uint32_t{h[at + 3]};
 }
 
+// Bytes after the headers searched for the first clean packet head of a product whose sub-mode
+// only its packets tell.
+constexpr std::size_t kModeSearchBytes = 1 << 20;
+
 std::string fmt(const char* format, int a, int b) {
   char text[128];
   std::snprintf(text, sizeof text, format, a, b);
@@ -52,6 +56,32 @@ double parse_latitude(std::string_view text) {
 const ModeInfo& mode_info(int mode) { return kModes.at(static_cast<std::size_t>(mode)); }
 bool is_alternating(int mode) { return mode == kModeAPC || mode == kModeAPH || mode == kModeAPV; }
 bool is_burst_mode(int mode) { return mode == kModeWS || mode == kModeGM; }
+
+std::array<int, 2> ap_polarisations(int mode) {
+  switch (mode) {
+    case kModeAPC: return {1, 0};  // V/V, H/H
+    case kModeAPH: return {2, 0};  // H/V, H/H
+    default: return {1, 3};        // APV: V/V, V/H
+  }
+}
+
+int ap_channel(int mode, bool txV, bool rxV) {
+  switch (mode) {
+    case kModeAPC:
+      if (txV && rxV) return 0;
+      if (!txV && !rxV) return 1;
+      return -1;
+    case kModeAPH:
+      if (!txV && rxV) return 0;
+      if (!txV && !rxV) return 1;
+      return -1;
+    default:
+      if (txV && rxV) return 0;
+      if (txV && !rxV) return 1;
+      return -1;
+  }
+}
+
 
 PacketHead decode_packet_head(HeadBytes h) {
   PacketHead p;
@@ -120,6 +150,23 @@ int check_packet_header(HeadBytes head, int mode, std::string* message) {
   return score;
 }
 
+int alternating_mode_of_packets(const std::string& path) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) return -1;
+  in.seekg(l0::kFirstMdsr);
+  std::vector<std::uint8_t> block(kModeSearchBytes);
+  in.read(reinterpret_cast<char*>(block.data()), static_cast<std::streamsize>(block.size()));
+  const auto got = static_cast<std::size_t>(in.gcount());
+  // The first head that is clean for one of the three sub-modes names it; a head that passes
+  // every test but the mode identifier does not.
+  for (std::size_t at = 0; at + l0::kHeadSize <= got; ++at) {
+    const HeadBytes head(block.data() + at, l0::kHeadSize);
+    for (const int mode : {kModeAPC, kModeAPH, kModeAPV})
+      if (check_packet_header(head, mode) == 0) return mode;
+  }
+  return -1;
+}
+
 Level0Header read_level0_header(const std::string& path) {
   namespace fs = std::filesystem;
   using sar::base::fatal;
@@ -151,7 +198,10 @@ Level0Header read_level0_header(const std::string& path) {
   const std::array<int, 5> level0Types = {kAsaIm0, kAsaWs0, kAsaApc, kAsaAph, kAsaApv};
   for (int t : level0Types)
     if (h.product.starts_with(product_type_prefix(t))) h.productType = t;
-  if (h.productType == 0) fatal(ec::kBadArguments, {path, "not an ASAR level 0 product", h.product});
+  // The archive names every alternating polarisation product "ASA_AP__0P" and its SPH says
+  // "AP_": the sub-mode is then told by the packets alone.
+  const bool genericAp = h.productType == 0 && h.product.starts_with(kGenericApPrefix);
+  if (h.productType == 0 && !genericAp) fatal(ec::kBadArguments, {path, "not an ASAR level 0 product", h.product});
 
   h.mode = -1;
   for (int m = 0; m < static_cast<int>(kModes.size()); ++m) {
@@ -160,6 +210,15 @@ Level0Header read_level0_header(const std::string& path) {
       h.mode = m;
       break;
     }
+  }
+  const bool sphSaysAp = h.mode < 0 && sph.substr(l0::kSphModeLetters, 3) == "AP_";
+  if (genericAp || sphSaysAp) {
+    const int packetMode = alternating_mode_of_packets(path);
+    // A name or SPH that states the sub-mode must agree with the packets.
+    if (h.mode >= 0 && h.mode != packetMode) h.mode = -1;
+    else h.mode = packetMode;
+    h.modeFromPackets = true;
+    if (genericAp && h.mode >= 0) h.productType = kAsaApc + (h.mode - kModeAPC);
   }
   const bool modeMatchesType = (h.mode == kModeIM && h.productType == kAsaIm0) ||
                                (h.mode == kModeWS && h.productType == kAsaWs0) ||

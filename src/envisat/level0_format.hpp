@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <span>
 #include <string>
+#include <string_view>
 
 namespace sar::envisat {
 
@@ -77,6 +78,13 @@ const ModeInfo& mode_info(int mode);
 bool is_alternating(int mode);
 bool is_burst_mode(int mode);  // WS and GM
 
+/// Polarisation codes (0 H/H, 1 V/V, 2 H/V, 3 V/H) of the two channels of an alternating
+/// polarisation mode.
+std::array<int, 2> ap_polarisations(int mode);
+/// Channel of an alternating polarisation echo by its transmit and receive bits (V = true);
+/// -1 for a pair the mode does not hold.
+int ap_channel(int mode, bool txV, bool rxV);
+
 /// Kind of a packet by its flags.
 enum class PacketFlagKind { kEcho, kNoise, kCalibration, kOther };
 
@@ -126,7 +134,15 @@ struct Level0Header {
   int swathDigit = -1;               // IM swath digit, -1 when not a digit
   std::int64_t fileSize = 0;
   std::int64_t statedSize = -1;  // MPH TOT_SIZE, -1 when the field does not read as a number
+  bool modeFromPackets = false;  // an alternating polarisation sub-mode told by the packets
 };
+
+/// Name prefix of the archive's alternating polarisation level 0 products, whatever sub-mode.
+inline constexpr std::string_view kGenericApPrefix = "ASA_AP__0";
+
+/// The alternating polarisation sub-mode (kModeAPC, kModeAPH, kModeAPV) of the first packet head
+/// that is clean for one of them, searched in the first megabyte of packets; -1 when none is.
+int alternating_mode_of_packets(const std::string& path);
 
 /// Reads and checks the headers of a level 0 product. Raises the image-missing code for an
 /// absent file, the bad-argument code for a file of another type or an unknown mode, and the

@@ -90,33 +90,6 @@ Timeline timeline_of(int mode) {
   return is_alternating(mode) ? Timeline::kAp : Timeline::kIm;
 }
 
-// Polarisation of the two alternating polarisation channels, by mode.
-std::array<int, 2> ap_polarisations(int mode) {
-  switch (mode) {
-    case kModeAPC: return {1, 0};  // V/V, H/H
-    case kModeAPH: return {2, 0};  // H/V, H/H
-    default: return {1, 3};        // APV: V/V, V/H
-  }
-}
-
-// Channel of an alternating polarisation echo by its polarisation bits; -1 for another pair.
-int ap_channel(int mode, bool txV, bool rxV) {
-  switch (mode) {
-    case kModeAPC:
-      if (txV && rxV) return 0;
-      if (!txV && !rxV) return 1;
-      return -1;
-    case kModeAPH:
-      if (!txV && rxV) return 0;
-      if (!txV && !rxV) return 1;
-      return -1;
-    default:
-      if (txV && rxV) return 0;
-      if (txV && !rxV) return 1;
-      return -1;
-  }
-}
-
 // The seven statistics of one channel, one slot per head looked at; 0 is an empty slot.
 struct ChannelStatistic {
   enum Field { kSwl, kPulse, kBandwidth, kPri, kBeam, kSwst, kNoiseSwl, kFields };

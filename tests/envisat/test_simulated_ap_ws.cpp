@@ -186,11 +186,12 @@ TEST_P(SimulatedAp, GivesTwoChannelsOnTheTruthsLineGrid) {
     if (pk.kind == sim::PacketKind::kEcho) {
       ++echoes;
       snr[own].add(t, gain, i, mine);
-      for (std::size_t ch = 0; ch < 2; ++ch) {
-        EXPECT_EQ(x.conf.line_replaced[ch][l], 0) << "line " << l;
-        EXPECT_EQ(x.conf.line_counter[ch][l], pk.counter) << "line " << l;
-        EXPECT_EQ(x.conf.line_swst[ch][l], truth.swst_code) << "line " << l;
-      }
+      // The echo's own channel holds a genuine line; the other a zero stand-in.
+      EXPECT_EQ(x.conf.line_replaced[own][l], 0) << "line " << l;
+      EXPECT_EQ(x.conf.line_counter[own][l], pk.counter) << "line " << l;
+      EXPECT_EQ(x.conf.line_replaced[other][l], 1) << "line " << l;
+      EXPECT_EQ(x.conf.line_counter[other][l], 0) << "line " << l;
+      for (std::size_t ch = 0; ch < 2; ++ch) EXPECT_EQ(x.conf.line_swst[ch][l], truth.swst_code) << "line " << l;
     } else {
       ASSERT_EQ(pk.kind, sim::PacketKind::kPeriodicCalibration) << "line " << l;
       ++calibrations;

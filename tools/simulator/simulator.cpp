@@ -125,8 +125,8 @@ Geometry local_axes(const Geodetic& g) {
 }
 
 // Product type letters of a mode, padded as product names carry them: "IM__", "APC_", "WS__".
-std::string type_letters(AcquisitionMode mode) {
-  std::string letters = mode_codes(mode).letters;
+std::string type_letters(const SimulationConfig& c) {
+  std::string letters = is_alternating(c.mode) && c.ap.generic_name ? "AP" : mode_codes(c.mode).letters;
   while (letters.size() < 4) letters += '_';
   return letters;
 }
@@ -135,7 +135,7 @@ std::string build_sph(const SimulationConfig& c, const Geodetic& start, const Ge
                       int missing, long long ds_size, long long num_dsr, const std::string& orbit_name,
                       const std::string& polarization) {
   HeaderText h;
-  h.quoted("SPH_DESCRIPTOR", "ASA_" + type_letters(c.mode) + "0P SPECIFIC HEADER", 28);
+  h.quoted("SPH_DESCRIPTOR", "ASA_" + type_letters(c) + "0P SPECIFIC HEADER", 28);
   h.plain("START_LAT", signed_int(std::llround(start.lat_deg * 1e6), 10) + "<10-6degN>");
   h.plain("START_LONG", signed_int(std::llround(start.lon_deg * 1e6), 10) + "<10-6degE>");
   h.plain("STOP_LAT", signed_int(std::llround(stop.lat_deg * 1e6), 10) + "<10-6degN>");
@@ -532,7 +532,7 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
   const int cycle = (abs_orbit - 1) / 501 + 4;
   {
     char buffer[96];
-    std::snprintf(buffer, sizeof buffer, "ASA_%s0CNPDE%s_%08d2%03d_%05d_%05d_0000.N1", type_letters(c.mode).c_str(),
+    std::snprintf(buffer, sizeof buffer, "ASA_%s0CNPDE%s_%08d2%03d_%05d_%05d_0000.N1", type_letters(c).c_str(),
                   compact_time(truth.first_packet_time).c_str(),
                   static_cast<int>(std::ceil(last_time - truth.first_packet_time)), cycle % 1000, rel_orbit,
                   abs_orbit % 100000);
@@ -653,7 +653,8 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
         const double r = d.norm();
         const double x = im.antenna_length * std::sin(azimuth_off_boresight(beam, tt.ecef)) / lambda;
         if (std::abs(x) > 3.0) continue;
-        const double amplitude = tt.target.amplitude * sinc(x) * sinc(x) * cht.target_gain;
+        const double polar = is_alternating(c.mode) ? tt.target.channel_gain[static_cast<std::size_t>(slot.channel & 1)] : 1.0;
+        const double amplitude = tt.target.amplitude * sinc(x) * sinc(x) * cht.target_gain * polar;
         const double delay = 2.0 * r / kSpeedOfLight;
         const double carrier = -4.0 * kPi * r / lambda;
         const long long k0 = std::max(0LL, static_cast<long long>(std::ceil((delay - near) * fs)));

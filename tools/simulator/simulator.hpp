@@ -45,6 +45,9 @@ namespace sar::simulator {
 struct Target {
   Geodetic position;
   double amplitude = 30.0;  // echo amplitude at beam centre, ADC counts
+  // AP: the target's reflectivity in channel 0 and channel 1 of the mode, on top of the
+  // channel's own gain (0 makes a target that one polarisation does not see).
+  std::array<double, 2> channel_gain = {1.0, 1.0};
 };
 
 enum class Fault {
@@ -83,6 +86,9 @@ struct ImParameters {
 struct ApParameters {
   int block_echoes = 0;           // L; 0: the value of the ASA_INS template for the beam
   double cross_polar_gain = 0.5;  // target amplitude in a cross-polarised channel (H/V, V/H)
+  // Name and SPH as real archive products carry them: "ASA_AP__0P" and mode letters "AP_",
+  // the sub-mode told only by the packets' mode identifier and polarisation bits.
+  bool generic_name = false;
 };
 
 /// One wide swath sub-swath.
