@@ -184,7 +184,13 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
                               const azimuthconf& az, const AnnotationProduct& product) {
   using namespace sar::base;
   const std::string& f = headerPath;
-  remove_quietly(f);
+  if (product.reportOldHeaderRemoval) {
+    std::error_code ec;
+    if (std::filesystem::exists(f, ec) && !std::filesystem::remove(f, ec))
+      base::report(base::kReportWarning, "Cannot remove file");
+  } else {
+    remove_quietly(f);
+  }
   FreeProfile(f);
 
   const double prf = par.prf;
@@ -234,6 +240,11 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
   double azimuthGroundSpace = 0.0;
   ComputeSuggestedLooks(proc.rangePixelSpacing, proc.azimuthPixelSpacing, proc.centreIncidence, kFixedLookAngle,
                         rangeLooks, azimuthLooks, rangeGroundSpace, azimuthGroundSpace);
+  if (azimuthLooks < product.minimumAzimuthLooks) {
+    // The product's azimuth spectrum asks for more looks than square pixels would.
+    azimuthGroundSpace *= static_cast<double>(product.minimumAzimuthLooks) / azimuthLooks;
+    azimuthLooks = product.minimumAzimuthLooks;
+  }
   const stripmap::DopplerPoly& centroid = product_poly(proc.outputCentroid, proc.dopplerCentroid);
   const stripmap::DopplerPoly& rate = product_poly(proc.outputRate, proc.dopplerRate);
   const int32_t nCoeff = 3;
@@ -389,14 +400,14 @@ int write_slc_raster_header(const std::string& slcPath, const procparm& proc) {
   return write_raster_header(slcPath, proc);
 }
 
-int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const dcestconf& /*dc*/,
-                const azimuthconf& az, const extconf& /*extra*/, const enviauxfiles& /*files*/) {
-  base::Frame frame("IMwritepars");
+int write_stripmap_product(const std::string& headerPath, const sarpar& par, const procparm& proc,
+                           const azimuthconf& az, const AnnotationProduct& product, const std::string& stage) {
+  base::Frame frame(stage.c_str());
   if (headerPath.empty() || !(par.prf > 0.0) || !(par.samplingRate > 0.0)) {
-    note_failed_stage("IMwritepars");
+    note_failed_stage(stage);
     return kStageRejected;
   }
-  int status = write_stripmap_annotation(headerPath, par, proc, az);
+  int status = write_stripmap_annotation(headerPath, par, proc, az, product);
   if (status == 0) {
     const std::string slcPath = io::description_base(headerPath);
     if (write_raster_header(slcPath, proc) != 0) {
@@ -405,8 +416,13 @@ int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm
     }
   }
   if (status == 0) status = convert_annotation(headerPath);
-  if (status != 0) note_failed_stage("IMwritepars");
+  if (status != 0) note_failed_stage(stage);
   return frame.check(status);
+}
+
+int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const dcestconf& /*dc*/,
+                const azimuthconf& az, const extconf& /*extra*/, const enviauxfiles& /*files*/) {
+  return write_stripmap_product(headerPath, par, proc, az, AnnotationProduct{}, "IMwritepars");
 }
 
 }  // namespace sar::jobs

@@ -45,6 +45,11 @@ struct AnnotationProduct {
   std::string_view swath = {};
   /// ENVISAT's calibration constant and elevation pattern table in ChannelInfo.
   bool writeEnvisatCalibration = true;
+  /// Fewest azimuth looks to suggest: alternating polarisation images carry grating lobes a
+  /// few lines off every response, which only enough looks average away.
+  int minimumAzimuthLooks = 1;
+  /// Report an older annotation that cannot be removed ("Cannot remove file", level 1).
+  bool reportOldHeaderRemoval = false;
 };
 
 /// Writes the raster header of the SLC (slcPath + ".hdr") for the focused grid of `proc`.
@@ -60,6 +65,12 @@ int write_stripmap_annotation(const std::string& headerPath, const sarpar& par, 
 /// replacing an older description. 0, or 1 (missing key table, unreadable annotation, failed
 /// write).
 int convert_annotation(const std::string& headerPath);
+
+/// The annotation of one focused stripmap image: the profile annotation `headerPath`, the
+/// raster header of the SLC (headerPath without "_hdr", + ".hdr") and the description. 0, or
+/// non-zero with a report and `stage` noted as the failed stage.
+int write_stripmap_product(const std::string& headerPath, const sarpar& par, const procparm& proc,
+                           const azimuthconf& az, const AnnotationProduct& product, const std::string& stage);
 
 /// The product annotation of the IM job: the profile annotation, the raster header of the SLC
 /// (headerPath without "_hdr", + ".hdr") and the description. 0, or 1 with a report.

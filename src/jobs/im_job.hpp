@@ -1,28 +1,22 @@
 #pragma once
-// The stripmap IM job: parameter reading and the stage sequence.
+// The ENVISAT stripmap jobs: IM (one image) and AP (one image per polarisation).
 #include <string>
+#include <string_view>
+#include <vector>
 
-#include "jobs/stages.hpp"
+#include "jobs/stripmap_job.hpp"
 
 namespace sar::jobs {
 
 inline constexpr std::string_view kImTitle = "Focussing ASAR IM";
 inline constexpr std::string_view kImParameterFile = "parameters_IM.hdr";
 
-/// Read sections "GeneralProcessingConf", "DCestConf" and "AzimuthConf". Every key but
-/// `Report_level` is mandatory: a missing one ends the run with status 1.
-int IMreadpars(const std::string& parameterFile, sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az,
-               enviauxfiles& files, StageFlags& flags);
-
-/// Run the stages that the flags ask for, in order. `extra` is the extraction request.
-int IMprocessor(sarpar& par, procparm& proc, dcestconf& dc, azimuthconf& az, extconf& extra, enviauxfiles& files,
-                StageFlags& flags);
-
-/// GeoTIFF quick-look of a focused SLC (focused sizes and corners from `proc`). 0, or the
-/// writer's status with the failed stage noted.
-int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
-                    const procparm& proc);
-/// Directory part of a path: up to the last '/' or '\', "." when there is none.
-std::string directory_of(const std::string& path);
+/// What the IM job is on the stripmap skeleton.
+StripmapJobKind im_job_kind();
+/// What the AP job is on the stripmap skeleton.
+StripmapJobKind ap_job_kind();
+/// Output words of the two images of an alternating polarisation level 0 product, in image
+/// order ("hv", "hh" for APH); the bad-argument code with "ASA_AP0" for another product.
+std::vector<std::string> ap_images(const std::string& level0Path);
 
 }  // namespace sar::jobs

@@ -54,9 +54,9 @@ void refuse_truncated_product(const std::string& path) {
 }
 }  // namespace
 
-int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
+int envi_extract(const enviauxfiles& files, std::vector<sarpar>& channels, extconf& extra) {
   base::Frame frame("envi_extract");
-  std::vector<sarpar> channels{par};
+  const std::size_t wanted = channels.size();
   const int st = envisat::envi_extract(files.level0, files.ins, files.extracted, channels, extra,
                                        envisat::timeline_table_builder());
   if (st != 0) {
@@ -64,11 +64,17 @@ int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra) {
     return frame.check(st);
   }
   refuse_truncated_product(files.level0);
-  // Stripmap jobs hold one channel; the record keeps the job's paths and takes the rest.
-  par = channels.front();
-  std::string first;
-  if (base::sec852myascii(par.azimuthStartTime, first) != 0) first = "(no time)";
-  base::LogPrintf("EXTR: %d lines of %d samples from %s\n", par.lines, par.samples, first.substr(0, 27).c_str());
+  if (channels.size() != wanted) {
+    // The job and the product disagree on the number of images.
+    note_failed_stage("envi_extract");
+    base::fatal(base::ec::kBadArguments, {files.level0, "the product holds " + std::to_string(channels.size()) +
+                                                            " channels, the job expects " + std::to_string(wanted)});
+  }
+  for (const sarpar& par : channels) {
+    std::string first;
+    if (base::sec852myascii(par.azimuthStartTime, first) != 0) first = "(no time)";
+    base::LogPrintf("EXTR: %d lines of %d samples from %s\n", par.lines, par.samples, first.substr(0, 27).c_str());
+  }
   return 0;
 }
 

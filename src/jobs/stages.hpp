@@ -6,6 +6,7 @@
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "doppler/dcestconf.hpp"
 #include "envisat/records.hpp"
@@ -47,9 +48,11 @@ using doppler::dcestconf;
 void connect_stage_progress();
 
 // Stages of the stripmap chain, in the order the IM job calls them.
-/// Level 0 extraction of the single channel of a stripmap product into `par.extrPath`, with the
-/// timeline table of the product's mode; `extra` is the request and receives the side tables.
-int envi_extract(const enviauxfiles& files, sarpar& par, extconf& extra);
+/// Level 0 extraction of every channel of a product, each into its own line file (`extrPath`,
+/// or `raw_file` when there are several), with the timeline table of the product's mode;
+/// `extra` is the request and receives the side tables. A product with another number of
+/// channels than `channels` holds ends the job with the bad-argument code.
+int envi_extract(const enviauxfiles& files, std::vector<sarpar>& channels, extconf& extra);
 int envi_orbit(const std::string& orbitPath, sarpar& par, procparm& proc);
 int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpar& par, procparm& proc);
 int envi_syntchirp(sarpar& par, procparm& proc);

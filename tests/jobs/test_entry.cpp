@@ -48,9 +48,10 @@ const EntryCase kCases[] = {
     {"im_stops_in_extraction_of_truncated_product",
      [](ScratchJob& j) { return kIm + list_of(j, with_header(im_args(j))); }, kFileIo, kFileIoStatus, kProductHead,
      "START : Focussing ASAR IM"},
+    // The AP driver runs and refuses an image mode product as no AP product.
     {"ap_prefix_runs_ap_driver",
-     [](ScratchJob& j) { return "main_focussing_asar_AP#" + list_of(j, with_header(im_args(j))); }, 130560, 2,
-     "APprocessor()", "START : Focussing ASAR AP"},
+     [](ScratchJob& j) { return "main_focussing_asar_AP#" + list_of(j, with_header(im_args(j))); }, 456962, 7,
+     "ASA_AP0", "START : Focussing ASAR AP"},
     {"ws_prefix", [](ScratchJob& j) { return "main_focussing_asar_WS#" + list_of(j, with_header(im_args(j))); },
      130560, 2, "WSprocessor()", "START : Focussing ASAR WS"},
     {"rs_prefix", [](ScratchJob& j) { return "main_focussing_asar_RS#" + list_of(j, with_header(im_args(j))); },

@@ -39,7 +39,9 @@ Compressed compress(const sim::SimulationTruth& t, const fs::path& dir, bool cor
   files.xca = t.xca_path;
   files.orbit = t.orbit_path;
   sar::jobs::extconf extra;
-  EXPECT_EQ(sar::jobs::envi_extract(files, c.par, extra), 0);
+  std::vector<sar::metadata::sarpar> channels{c.par};
+  EXPECT_EQ(sar::jobs::envi_extract(files, channels, extra), 0);
+  c.par = channels.front();
   EXPECT_EQ(sar::jobs::envi_orbit(files.orbit, c.par, c.proc), 0);
   EXPECT_EQ(sar::jobs::envi_syntchirp(c.par, c.proc), 0);
   c.proc.Flag_swstal = 1;
