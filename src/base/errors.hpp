@@ -9,6 +9,8 @@
 //  - anything else thrown, which the entry's catch-all reports as an uncaught failure.
 #include <cstdint>
 #include "base/source_location.hpp"
+#include <limits>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -76,6 +78,50 @@ class CErrorExceptionManager {
 };
 
 using FatalError = CErrorExceptionManager;
+
+/// What is wrong with an input file, as a reader sees it.
+enum class InputFault {
+  kMissing,      // absent or unreadable
+  kWrongType,    // another product than the one asked for
+  kTruncated,    // shorter than its headers say
+  kMalformed,    // a field that does not read as what it must be
+  kNotCovering,  // valid, but it does not reach over the scene
+  kContradicts,  // two parts of the file disagree
+};
+
+/// The one failure type of the readers of untrusted files: what is wrong, the file, the byte
+/// offset and the field where it was seen, and the host code the reader would give it. Readers
+/// throw it; the job driver, which knows what the file was for, is the only place that turns
+/// it into the host's error record (and may pick another code, a stage failure say).
+class InputError : public std::runtime_error {
+ public:
+  InputError(InputFault fault, int32_t hostCode, std::string file, int64_t offset, std::string field,
+             const std::string& what)
+      : std::runtime_error(what), fault_(fault), hostCode_(hostCode), file_(std::move(file)), offset_(offset),
+        field_(std::move(field)) {}
+  InputFault fault() const { return fault_; }
+  int32_t host_code() const { return hostCode_; }
+  const std::string& file() const { return file_; }
+  /// Byte offset of the faulty field in the file, -1 when not tied to a place.
+  int64_t offset() const { return offset_; }
+  const std::string& field() const { return field_; }
+  /// For kNotCovering: the span (sec85) the file does cover; NaN otherwise.
+  double span_start() const { return spanStart_; }
+  double span_stop() const { return spanStop_; }
+  void set_span(double start, double stop) {
+    spanStart_ = start;
+    spanStop_ = stop;
+  }
+
+ private:
+  InputFault fault_;
+  int32_t hostCode_;
+  std::string file_;
+  int64_t offset_;
+  std::string field_;
+  double spanStart_ = std::numeric_limits<double>::quiet_NaN();
+  double spanStop_ = std::numeric_limits<double>::quiet_NaN();
+};
 
 /// End the process with `status`, writing nothing more.
 struct ProcessExit {

@@ -16,13 +16,17 @@ int envi_orbit(const std::string& orbitPath, sarpar& par, metadata::SceneReferen
   proc.orbitSpacing = duration / 3.0;
   proc.orbitStartTime = par.azimuthStartTime - proc.orbitSpacing / 2.0;
   const double centre = par.azimuthStartTime + duration / 2.0;
-  int orbitNumber = 0;
-  double node = 0.0;
-  const int st = geometry::interp_orb_l(orbitPath, centre, 5, proc.orbitSpacing, proc.orbitPositions,
-                                        proc.orbitVelocities, &orbitNumber, 1, &node);
-  if (st != 0) return frame.check(st);
-  proc.orbitNumber = orbitNumber;
-  par.ascending_node_time = node;
+  // An orbit that does not reach over the scene, or no orbit at all, is the input's fault:
+  // the error carries the file and its span up to the job.
+  const geometry::OrbitData orbit = geometry::read_orbit(orbitPath);
+  const geometry::OrbitSamples s = geometry::interpolate_orbit(orbit, centre, {5, proc.orbitSpacing, true, false});
+  for (std::size_t i = 0; i < 5; ++i)
+    for (std::size_t a = 0; a < 3; ++a) {
+      proc.orbitPositions[3 * i + a] = s.positions[i][a];
+      proc.orbitVelocities[3 * i + a] = s.velocities[i][a];
+    }
+  proc.orbitNumber = s.orbit_number;
+  par.ascending_node_time = geometry::interpolate_orbit(orbit, centre, {1, 0.0, false, true}).node_time;
   return 0;
 }
 

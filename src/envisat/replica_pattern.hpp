@@ -13,7 +13,8 @@ inline constexpr int kPatternLength = 201;
 inline constexpr double kPatternStep = 0.05;
 
 /// Five state vectors T/3 apart centred on the scene (T = lines / PRF), the orbit number and
-/// the ascending node time. Returns 0 or the orbit reader's status.
+/// the ascending node time. Returns 0, or 10 for a channel without lines; throws
+/// geometry::OrbitError for an orbit file that cannot be read or does not cover the scene.
 int envi_orbit(const std::string& orbitPath, sarpar& par, metadata::SceneReferences& proc);
 /// Pattern of the channel's beam and polarisation from ASA_XCA (dB to linear amplitude), its
 /// centre look angle from ASA_INS. Returns 0, or kFileIo-class failures as raised by the readers.

@@ -14,8 +14,27 @@
 
 namespace sar::geometry {
 
+namespace {
+base::InputFault fault_of(int status) {
+  switch (status) {
+    case orbit_status::kNotOrbitProduct: return base::InputFault::kWrongType;
+    case orbit_status::kOutsideSpan: return base::InputFault::kNotCovering;
+    case orbit_status::kFileIo: return base::InputFault::kMissing;
+    default: return base::InputFault::kMalformed;
+  }
+}
+int32_t host_code_of(int status) {
+  switch (status) {
+    case orbit_status::kNotOrbitProduct: return base::ec::kBadArguments;
+    case orbit_status::kOutsideSpan: return base::ec::kStageFailed;
+    default: return base::ec::kFileIo;
+  }
+}
+}  // namespace
+
 OrbitError::OrbitError(int status, std::string file, int64_t offset, std::string field, const std::string& what)
-    : std::runtime_error(what), status_(status), file_(std::move(file)), offset_(offset), field_(std::move(field)) {}
+    : base::InputError(fault_of(status), host_code_of(status), std::move(file), offset, std::move(field), what),
+      status_(status) {}
 
 namespace {
 

@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "base/errors.hpp"
 #include "geometry/vec3.hpp"
 
 namespace sar::geometry {
@@ -31,21 +32,14 @@ constexpr int kFileIo = 20;
 constexpr int kMalformed = 21;
 }  // namespace orbit_status
 
-/// Failure of an orbit read or query: the status code plus where it happened.
-class OrbitError : public std::runtime_error {
+/// Failure of an orbit read or query: the input error with the orbit layer's status code.
+class OrbitError : public base::InputError {
  public:
   OrbitError(int status, std::string file, int64_t offset, std::string field, const std::string& what);
   int status() const { return status_; }
-  const std::string& file() const { return file_; }
-  /// Byte offset of the faulty field in the file, -1 when not tied to a place.
-  int64_t offset() const { return offset_; }
-  const std::string& field() const { return field_; }
 
  private:
   int status_;
-  std::string file_;
-  int64_t offset_;
-  std::string field_;
 };
 
 enum class OrbitFamily {

@@ -5,6 +5,9 @@
 #include <cstdint>
 #include <cstdio>
 #include <optional>
+#include <string>
+
+#include "base/convert.hpp"
 
 namespace sar::geometry {
 
@@ -16,11 +19,23 @@ constexpr std::size_t kTextWindow = 5;
 constexpr double kNodeSearchSpan = 180.0;
 constexpr double kNodeTolerance = 1e-5;
 
+std::string utc_text(double t) {
+  std::string text;
+  if (base::sec852myascii(t, text) != 0) {
+    char number[48];
+    std::snprintf(number, sizeof number, "%.6f (sec85)", t);
+    return number;
+  }
+  return text;
+}
+
 [[noreturn]] void outside(const OrbitData& orbit, double t, const char* what) {
-  char text[160];
-  std::snprintf(text, sizeof text, "%s %.6f outside the orbit interval %.6f .. %.6f (sec85)", what, t,
-                orbit.sensing_start, orbit.sensing_stop);
-  throw OrbitError(orbit_status::kOutsideSpan, orbit.path, -1, "time", orbit.path + ": " + text);
+  char text[200];
+  std::snprintf(text, sizeof text, "%s %s outside the orbit interval %s to %s", what, utc_text(t).c_str(),
+                utc_text(orbit.sensing_start).c_str(), utc_text(orbit.sensing_stop).c_str());
+  OrbitError e(orbit_status::kOutsideSpan, orbit.path, -1, "time", orbit.path + ": " + text);
+  e.set_span(orbit.sensing_start, orbit.sensing_stop);
+  throw e;
 }
 
 void check_inside(const OrbitData& orbit, double t, const char* what) {

@@ -78,7 +78,14 @@ class StageChain {
       std::optional<StageClock> clock;
       if (!phase.empty()) clock.emplace(phase, stages_[i].writing);
       for (; i < end; ++i) {
-        const int st = stages_[i].run(channel);
+        int st = 0;
+        try {
+          st = stages_[i].run(channel);
+        } catch (...) {
+          // The driver reports what was thrown; the record names the stage it came from.
+          if (failed_stage().empty()) note_failed_stage(stages_[i].name);
+          throw;
+        }
         if (st != 0) {
           if (failed_stage().empty()) note_failed_stage(stages_[i].name);
           return st;

@@ -89,6 +89,26 @@ void check_aux_type(const std::string& path, bool ok, std::string_view detail) {
   if (!ok) base::fatal(base::ec::kBadArguments, {std::string(detail), path, "not of that product type"});
 }
 
+// An input that fails inside the chain: an orbit that does not reach over the image is a stage
+// that cannot run (the record tells the image's times beside the file's span); any other fault
+// keeps the code its reader gave it.
+[[noreturn]] void fail_on_input(const base::InputError& e, const std::string& processorDetail, const sarpar& par) {
+  base::report(base::kReportError, e.what());
+  int32_t code = e.host_code();
+  std::string text = e.what();
+  if (e.fault() == base::InputFault::kNotCovering) {
+    code = base::ec::kStageFailed;
+    // The record has room for little: the times without their fractions, the file in the log.
+    const auto utc = [](double t) {
+      std::string s;
+      return base::sec852myascii(t, s) == 0 ? s.substr(0, 20) : std::string("?");
+    };
+    text = "scene " + utc(par.azimuthStartTime) + " to " + utc(par.azimuthStartTime + par.lines / par.prf).substr(12) +
+           " outside orbit " + utc(e.span_start()) + " to " + utc(e.span_stop());
+  }
+  base::fatal(code, {processorDetail, failed_stage(), text});
+}
+
 }  // namespace
 
 std::string directory_of(const std::string& path) {
@@ -291,7 +311,11 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
   for (std::size_t i = 0; i < channels.size(); ++i) {
     StripmapChannel& c = channels[i];
     if (images > 1) base::LogPrintf("Image %zu of %d: %s\n", i + 1, images, c.word.c_str());
-    if (chain.run(c) != 0) base::fatal(base::ec::kStageFailed, {processorDetail, failed_stage()});
+    try {
+      if (chain.run(c) != 0) base::fatal(base::ec::kStageFailed, {processorDetail, failed_stage()});
+    } catch (const base::InputError& e) {
+      fail_on_input(e, processorDetail, c.par);
+    }
 
     // Products of this image, before the next starts: a failure on a later image leaves this
     // one finished.

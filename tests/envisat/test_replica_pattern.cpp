@@ -9,6 +9,7 @@
 #include <cstring>
 #include <numbers>
 
+#include "base/errors.hpp"
 #include "base/convert.hpp"
 #include "envisat/replica_pattern.hpp"
 
@@ -141,7 +142,15 @@ TEST(SceneOrbit, FiveStateVectorsCentredOnTheScene) {
   EXPECT_GT(proc.orbitNumber, 31000);  // absolute orbits of March 2008
   EXPECT_LT(proc.orbitNumber, 31500);
 
-  // A scene outside the orbit file is refused, not extrapolated.
+  // A scene outside the orbit file is refused, not extrapolated, with the file's span.
   par.azimuthStartTime = sar::base::ascii2sec85("05-MAR-2008 10:00:00.000000");
-  EXPECT_NE(envi_orbit(kVor, par, proc), 0);
+  try {
+    envi_orbit(kVor, par, proc);
+    ADD_FAILURE() << "no error for a scene two days after the orbit";
+  } catch (const sar::base::InputError& e) {
+    EXPECT_EQ(e.fault(), sar::base::InputFault::kNotCovering);
+    EXPECT_EQ(e.file(), kVor);
+    EXPECT_NEAR(e.span_start(), sar::base::ascii2sec85("01-MAR-2008 21:55:27.000000"), 1e-6);
+    EXPECT_NEAR(e.span_stop(), sar::base::ascii2sec85("03-MAR-2008 00:23:27.000000"), 1e-6);
+  }
 }

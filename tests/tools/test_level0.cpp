@@ -282,6 +282,8 @@ TEST(Level0Product, FaultsLeaveTheirMarks) {
         ASSERT_FALSE(records.empty());
         EXPECT_EQ(records.back().counter - static_cast<unsigned>(t.first_counter), static_cast<unsigned>(t.last_whole_line));
         break;
+      case sim::Fault::kSwappedPolarisation:
+        break;  // alternating polarisation only: the AP extraction's tests read its marks
     }
   }
 }

@@ -200,13 +200,14 @@ const char* fault_name(Fault fault) {
     case Fault::kSequenceWrap: return "seq-wrap";
     case Fault::kSwstChange: return "swst-change";
     case Fault::kTruncated: return "truncated";
+    case Fault::kSwappedPolarisation: return "swapped-polarisation";
   }
   return "";
 }
 
 Fault fault_from_name(const std::string& name) {
   for (Fault f : {Fault::kLostPackets, Fault::kCorruptHeader, Fault::kWrongModeId, Fault::kSequenceWrap,
-                  Fault::kSwstChange, Fault::kTruncated})
+                  Fault::kSwstChange, Fault::kTruncated, Fault::kSwappedPolarisation})
     if (name == fault_name(f)) return f;
   throw std::invalid_argument("unknown fault: " + name);
 }
@@ -483,6 +484,13 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
       truth.packets[static_cast<std::size_t>(l)].lost = true;
     }
   }
+  for (const int l : c.lost_packets) {
+    if (l < 0 || l >= c.lines || lost[static_cast<std::size_t>(l)]) continue;
+    lost[static_cast<std::size_t>(l)] = 1;
+    truth.lost_lines.push_back(l);
+    truth.packets[static_cast<std::size_t>(l)].lost = true;
+  }
+  std::sort(truth.lost_lines.begin(), truth.lost_lines.end());
   if (has_fault(c, Fault::kCorruptHeader)) truth.corrupt_header_line = c.lines / 2;
   if (has_fault(c, Fault::kWrongModeId)) truth.wrong_mode_line = std::min(c.lines - 2, c.lines / 2 + 7);
   if (has_fault(c, Fault::kSwstChange)) {
@@ -704,6 +712,11 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
     h.bandwidth_code = cht.bandwidth_code;
     h.tx_vertical = ch.tx_v;
     h.rx_vertical = ch.rx_v;
+    if (is_alternating(c.mode) && slot.kind == PacketKind::kEcho && has_fault(c, Fault::kSwappedPolarisation)) {
+      const ChannelSetup& o = channels[static_cast<std::size_t>(1 - (slot.channel & 1))];
+      h.tx_vertical = o.tx_v;
+      h.rx_vertical = o.rx_v;
+    }
     h.calibration_row = slot.calibration_row;
     if (l == truth.corrupt_header_line) {
       // A burst of bit errors: counter, identifiers and header length no longer agree.

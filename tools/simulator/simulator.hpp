@@ -57,10 +57,11 @@ enum class Fault {
   kSequenceWrap,   // the 14-bit source sequence count wraps at the middle of the product
   kSwstChange,     // the sampling window start moves by 24 samples two thirds of the way in
   kTruncated,      // the file ends inside a packet at about 85 % of the stream
+  kSwappedPolarisation,  // AP: every echo carries the polarisation bits of the other channel
 };
 
 /// Fault name as the command line spells it: "lost", "corrupt-header", "mode-id", "seq-wrap",
-/// "swst-change", "truncated". `fault_from_name` throws std::invalid_argument for other names.
+/// "swst-change", "truncated", "swapped-polarisation". `fault_from_name` throws std::invalid_argument for other names.
 const char* fault_name(Fault fault);
 Fault fault_from_name(const std::string& name);
 
@@ -120,6 +121,8 @@ struct SimulationConfig {
   std::vector<Target> targets;
   double noise_db = 20.0;  // noise power of a complex sample, dB relative to 1 count^2; below -100: none
   std::vector<Fault> faults;
+  // Packets (indices of the stream, from 0) left out of the product on top of the faults.
+  std::vector<int> lost_packets;
   std::string scene_time = "02-MAR-2008 10:00:00.000000";  // zero-Doppler time of the first target
   bool ascending = false;
   int orbit_number = 31400;  // absolute orbit at the scene time
