@@ -19,9 +19,11 @@
 #include <stdexcept>
 #include <thread>
 
+#include "base/errors.hpp"
 #include "base/run_services.hpp"
 #include "jobs/batch.hpp"
 #include "jobs/discovery.hpp"
+#include "jobs/im_job.hpp"
 #include "jobs/multilook_step.hpp"
 #include "jobs/setup.hpp"
 
@@ -48,6 +50,19 @@ const ModeRow* find_mode(std::string_view m) {
   for (const auto& r : kModes)
     if (m == r.name) return &r;
   return nullptr;
+}
+
+// The stems of the SLCs a focusing job of `mode` writes for `product`: "<stem>" for one image,
+// "<stem>_hv" and "<stem>_hh" (the pair of the sub-mode) for alternating polarisation.
+std::vector<std::string> image_stems(std::string_view mode, const std::string& product, const std::string& stem) {
+  if (mode != "ap") return {stem};
+  std::vector<std::string> stems;
+  try {
+    for (const std::string& word : ap_images(product)) stems.push_back(stem + "_" + word);
+  } catch (const base::CErrorExceptionManager&) {
+    // Not an AP product: the job itself will say so.
+  }
+  return stems;
 }
 
 // Log text of a stage that this build does not hold.
@@ -424,7 +439,8 @@ std::string finish_success(const StandaloneRequest& req, const Prepared& p, Stan
     if (!move_into(from, to, error)) return error;
     o.products.push_back(to.string());
     marker << "output = " << to.filename().string() << " " << fs::file_size(to, ec) << "\n";
-    if (to.filename().string() == p.stem + "_slc") o.slc = to.string();
+    const std::string name = to.filename().string();
+    if (o.slc.empty() && name.size() > 4 && name.compare(name.size() - 4, 4, "_slc") == 0) o.slc = to.string();
   }
   // The job's rasters of intermediate steps are of no use once the products stand.
   for (const auto& e : fs::directory_iterator(p.work, ec)) {
@@ -471,15 +487,20 @@ bool outputs_complete(const StandaloneRequest& req) {
   const fs::path out = fs::absolute(req.outDir).lexically_normal();
   const fs::path work = working_dir_for(out.string(), req.product);
   const std::string stem = product_stem(req.product);
-  std::vector<std::string> required = {stem + "_slc", stem + "_slc_hdr"};
-  if (req.quickLook) required.push_back(stem + "_slc.tif");
+  std::vector<std::string> required;
+  for (const std::string& image : image_stems(req.mode, req.product, stem)) {
+    required.push_back(image + "_slc");
+    required.push_back(image + "_slc_hdr");
+    if (req.quickLook) required.push_back(image + "_slc.tif");
+    if (!req.multilook.empty() && req.mode == "ap") required.push_back(looked_product_name(image, req.groundRange));
+  }
   if (req.mode == "wss") {
     // The level 1 job leaves a multilooked image only.
     const std::string image = looked_product_name(stem, req.groundRange);
     required = {image, image + "_hdr"};
     if (req.quickLook) required.push_back(image + ".tif");
   }
-  if (!req.multilook.empty()) required.push_back(looked_product_name(stem, req.groundRange));
+  if (!req.multilook.empty() && req.mode != "ap") required.push_back(looked_product_name(stem, req.groundRange));
   bool modeOk = false, productOk = false;
   std::size_t found = 0;
   for (const auto& line : read_lines(work / kCompletionMarker)) {
@@ -597,9 +618,10 @@ StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string
     std::string why = parse_looks(req.multilook, looks);
     looks.groundRange = req.groundRange;
     looks.groundStep = req.groundStep;
-    if (why.empty())
-      why = multilook_slc((p.work / (p.stem + "_slc")).string(),
-                          (p.work / looked_product_name(p.stem, req.groundRange)).string(), looks);
+    for (const std::string& image : image_stems(req.mode, req.product, p.stem))
+      if (why.empty())
+        why = multilook_slc((p.work / (image + "_slc")).string(),
+                            (p.work / looked_product_name(image, req.groundRange)).string(), looks);
     if (!why.empty()) {
       o.result = StandaloneResult::kFailed;
       o.status = 1;

@@ -311,6 +311,11 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
   for (std::size_t i = 0; i < channels.size(); ++i) {
     StripmapChannel& c = channels[i];
     if (images > 1) base::LogPrintf("Image %zu of %d: %s\n", i + 1, images, c.word.c_str());
+    if (i > 0) {
+      // The images of one product share one line grid: the first image's.
+      c.proc.requiredLead = channels.front().proc.focusedLead;
+      c.proc.requiredTrail = channels.front().proc.focusedTrail;
+    }
     try {
       if (chain.run(c) != 0) base::fatal(base::ec::kStageFailed, {processorDetail, failed_stage()});
     } catch (const base::InputError& e) {

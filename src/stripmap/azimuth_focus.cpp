@@ -58,6 +58,10 @@ wkparm scene_wkparm(const sarpar& par, const procparm& proc, const azimuthconf& 
 /// the beam-centre offset of a squinted beam, which puts the aperture off centre, before the
 /// output line for a positive centroid. Taken over the swath's near, middle and far range and
 /// the scene's first, middle and last line. Zero margins when the polynomials give no rate.
+// A few lines more than the apertures for the compressed response's own extent at the block's
+// edges.
+constexpr int32_t kApertureGuard = 16;
+
 struct ApertureMargins {
   int32_t lead = 0, trail = 0;
   double offset = 0.0, aperture = 0.0;  ///< lines, where the lead is largest
@@ -87,10 +91,8 @@ ApertureMargins aperture_margins(const sarpar& par, const procparm& proc, double
       any = true;
     }
   if (!any) return m;
-  // A few lines more for the compressed response's own extent at the block's edges.
-  constexpr double kGuard = 16.0;
-  m.lead = static_cast<int32_t>(std::ceil(std::max(0.0, lead) + kGuard));
-  m.trail = static_cast<int32_t>(std::ceil(std::max(0.0, trail) + kGuard));
+  m.lead = static_cast<int32_t>(std::ceil(std::max(0.0, lead) + kApertureGuard));
+  m.trail = static_cast<int32_t>(std::ceil(std::max(0.0, trail) + kApertureGuard));
   return m;
 }
 
@@ -267,6 +269,19 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   const ApertureMargins need = aperture_margins(par, proc, sceneAzimuthShift, band);
   int32_t lead = std::max(ha, need.lead), trail = std::max(ha, need.trail);
   int32_t Lb = az.LinesInBlock;
+  const bool shared = proc.requiredLead >= 0 && proc.requiredTrail >= 0;
+  if (shared) {
+    // The grid is another image's: its margins, however this image's apertures fall. They
+    // differ by the two images' centroid estimates only; the guard lines absorb that.
+    if (need.lead > proc.requiredLead + kApertureGuard / 2 || need.trail > proc.requiredTrail + kApertureGuard / 2)
+      base::report(base::kReportWarning,
+                   "Azimuth focusing: the image shares the line grid of the first image, whose blocks hold " +
+                       std::to_string(proc.requiredLead) + " and " + std::to_string(proc.requiredTrail) +
+                       " lines around their output where this image's apertures ask for " + std::to_string(need.lead) +
+                       " and " + std::to_string(need.trail));
+    lead = proc.requiredLead;
+    trail = proc.requiredTrail;
+  }
   if (lines <= lead + trail) {
     // Not one line of this scene has its whole aperture: focus what there is with the
     // configured overlap, and say that apertures are cut.
@@ -274,7 +289,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
                  "Azimuth focusing: a scene of " + std::to_string(lines) + " lines is too short for whole apertures (" +
                      std::to_string(need.lead) + " lines before and " + std::to_string(need.trail) +
                      " after each output line): focused with the configured overlap, apertures cut");
-    lead = trail = ha;
+    if (!shared) lead = trail = ha;
   } else if (lead != ha || trail != ha) {
     const int32_t minNet = std::min(512, Lb - 2 * ha);
     if (Lb - lead - trail < minNet) Lb = lead + trail + minNet;
@@ -343,6 +358,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   proc.firstSampleTime = par.nearRangeTime - sceneRangeShift + hr / fs;
   proc.firstLineTime = lead / prf + par.azimuthStartTime + sceneAzimuthShift;
   proc.focusedLead = lead;
+  proc.focusedTrail = trail;
   proc.outputCentroid = proc.dopplerCentroid;
   proc.outputRate = proc.dopplerRate;
   progress_update(100.0);

@@ -59,6 +59,10 @@ struct procparm : metadata::SceneReferences {
   double sceneCentroid = 0.0;        // Hz, scene centre line and first near range
   double firstLineTime = 0.0;        // sec85 of focused line 0
   int32_t focusedLead = 0;           // range-compressed lines before the first focused line
+  int32_t focusedTrail = 0;          // lines each azimuth block held after its output
+  // Images that must share one line grid (the polarisations of one product) are focused with
+  // the lead and trail of the first; -1: each block's from the apertures of this image.
+  int32_t requiredLead = -1, requiredTrail = -1;
   double firstSampleTime = 0.0;      // two-way range time of focused sample 0
 };
 
