@@ -248,6 +248,96 @@ TEST(SimulatedAp, InitialNoiseAndCalibrationAreSkippedWhateverTheKind) {
     EXPECT_EQ(noise.table.at_counter(counter).kind_word & kLineSelected, 0) << counter;
 }
 
+// An echo lost in the middle of a channel-1 block: the walk fills its line in channel 1 with the
+// last channel-1 echo and in channel 0 with zeros, both marked as stand-ins, and the grid goes
+// on; the product's calibration pulse and the change-overs' padding slots keep their lines too.
+TEST(SimulatedAp, LostEchoInsideAChannelOneBlockKeepsTheGrid) {
+  sim::SimulationConfig c = ap_config("aph_lost", sim::AcquisitionMode::kAPH);
+  const sim::SimulationTruth& clean = sar::test::simulated(c);
+  // The middle echo of the first channel-1 block after the initial packets.
+  std::vector<std::size_t> block;
+  for (std::size_t i = 0; i < clean.packets.size(); ++i) {
+    const sim::PacketTruth& p = clean.packets[i];
+    if (p.counter < 210 || p.kind != sim::PacketKind::kEcho) continue;
+    if (p.channel == 1) block.push_back(i);
+    else if (!block.empty()) break;
+  }
+  ASSERT_GT(block.size(), 10u);
+  const std::size_t lostIndex = block[block.size() / 2];
+  c.out_dir += "_lost";
+  c.lost_packets = {static_cast<int>(lostIndex)};
+  const sim::SimulationTruth& t = sar::test::simulated(c);
+  ASSERT_EQ(t.lost_lines, (std::vector<int>{static_cast<int>(lostIndex)}));
+  const Extracted x = extract(t, c.out_dir, kExtractEchoes);
+  ASSERT_TRUE(x.ok);
+  const auto lostLine = static_cast<std::size_t>(t.packets[lostIndex].grid_line);
+  const auto before = static_cast<std::size_t>(t.packets[lostIndex - 1].grid_line);
+  ASSERT_EQ(before + 1, lostLine);
+  EXPECT_EQ(x.channels[0].lines, t.channel_lines);  // no line lost from the grid
+  EXPECT_EQ(line_at(x.files[1], lostLine).samples, line_at(x.files[1], before).samples);
+  EXPECT_EQ(line_at(x.files[0], lostLine).samples, std::vector<std::complex<float>>(kSamples));
+  for (std::size_t ch = 0; ch < 2; ++ch) {
+    EXPECT_EQ(x.conf.line_replaced[ch][lostLine], 1) << ch;
+    EXPECT_EQ(x.conf.line_counter[ch][lostLine], 0) << ch;
+  }
+  // The neighbours are genuine channel-1 echoes.
+  EXPECT_EQ(x.conf.line_replaced[1][before], 0);
+  EXPECT_EQ(x.conf.line_counter[1][lostLine + 1], t.packets[lostIndex + 1].counter);
+
+  // Every line is accounted for: echoes in their own channel, stand-ins in both for the lost
+  // echo, the calibration pulses and the padding slots of the change-overs.
+  int genuine = 0, standIns = 0, calibrations = 0, padding = 0;
+  std::vector<int> kind(static_cast<std::size_t>(t.channel_lines), -1);
+  for (const sim::PacketTruth& p : t.packets)
+    if (p.grid_line >= 0 && p.grid_line < t.channel_lines) kind[static_cast<std::size_t>(p.grid_line)] = static_cast<int>(p.kind);
+  for (std::size_t l = 0; l < kind.size(); ++l) {
+    const bool replaced0 = x.conf.line_replaced[0][l] == 1, replaced1 = x.conf.line_replaced[1][l] == 1;
+    if (!replaced0 || !replaced1) {
+      ++genuine;
+      EXPECT_NE(replaced0, replaced1) << "line " << l;  // one channel holds the echo, the other a stand-in
+      continue;
+    }
+    ++standIns;
+    if (kind[l] == static_cast<int>(sim::PacketKind::kPeriodicCalibration)) ++calibrations;
+    if (kind[l] == -1) ++padding;
+  }
+  EXPECT_GE(calibrations, 1);
+  EXPECT_EQ(padding, 2);
+  EXPECT_EQ(standIns, calibrations + padding + 1);
+  EXPECT_EQ(genuine + standIns, t.channel_lines);
+}
+
+// Packets whose polarisation bits name the other channel than the timeline: the product is
+// not the sub-mode it says, and the extraction refuses it, naming the first such packet.
+TEST(SimulatedAp, PolarisationBitsAgainstTheTimelineAreRefused) {
+  sim::SimulationConfig c = ap_config("apv_swapped", sim::AcquisitionMode::kAPV);
+  c.faults = {sim::Fault::kSwappedPolarisation};
+  const sim::SimulationTruth& t = sar::test::simulated(c);
+  const Level0Header header = read_level0_header(t.level0_path);
+  std::vector<sarpar> channels(2);
+  const std::string dir = c.out_dir + "/swapped";
+  std::filesystem::create_directories(dir);
+  for (std::size_t k = 0; k < 2; ++k) channels[k].raw_file = dir + "/SS" + std::to_string(k + 1);
+  FbaqTables fbaq;
+  ASSERT_EQ(LUTfbaq_f(t.ins_path, fbaq.q, fbaq.i), 0);
+  std::vector<float> gains(kGainTableLength);
+  ASSERT_EQ(read_gain_table(t.ins_path, gains), 0);
+  LineTable table;
+  extconf conf;
+  try {
+    timeline_table_builder()(t.level0_path, t.ins_path, header.mode, table, channels);
+    extract_level0(t.level0_path, header, table, fbaq, gains, channels, conf);
+    ADD_FAILURE() << "extraction took a product whose packets contradict its timeline";
+  } catch (const sar::base::CErrorExceptionManager& e) {
+    EXPECT_EQ(e.ec(), sar::base::ec::kBadArguments);
+    ASSERT_EQ(e.details().size(), 3u);
+    EXPECT_NE(e.details()[1].find("polarisation contradicts the timeline"), std::string::npos) << e.details()[1];
+    EXPECT_NE(e.details()[2].find("packet counter"), std::string::npos) << e.details()[2];
+  }
+  // Nothing that looks like a line file is left.
+  for (const sarpar& p : channels) EXPECT_FALSE(std::filesystem::exists(p.raw_file)) << p.raw_file;
+}
+
 // ---------------------------------------------------------------------------------------------
 // Wide swath.
 
