@@ -15,6 +15,7 @@
 #include "base/errors.hpp"
 #include "base/profile.hpp"
 #include "job_harness.hpp"
+#include "test_standalone_support.hpp"
 #include "jobs/im_job.hpp"
 #include "simulator/simulator.hpp"
 
@@ -288,6 +289,44 @@ TEST(ApJobProducts, NamesAndTypesGiveTheImagesOrTheRefusal) {
     SCOPED_TRACE(path);
     EXPECT_THROW(sar::jobs::ap_images(path), sar::base::CErrorExceptionManager);
   }
+}
+
+}  // namespace
+
+namespace {
+
+// sarfocus ap: the standalone command line focuses both images into the output folder, its
+// marker lists both, and a second run with --skip-complete finds them complete.
+TEST(ApJobProducts, SarfocusApWritesBothImages) {
+  ScratchJob job("sarfocus_ap");
+  sim::SimulationConfig c;
+  c.mode = sim::AcquisitionMode::kAPH;
+  c.out_dir = (job.dir() / "in").string();
+  c.lines = 2000;
+  c.samples = 1200;
+  c.noise_db = -10.0;
+  c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
+  c.ins_template = kInsTemplate;
+  c.xca_template = kXcaTemplate;
+  const sim::SimulationTruth t = sim::run_simulation(c);
+  const fs::path out = job.dir() / "out";
+  std::vector<std::string> args = {"ap", t.level0_path, "--orbit", t.orbit_path, "--aux", c.out_dir,
+                                   "--out", out.string(), "--quicklook", "128x128"};
+  for (const std::string& p : kSmallSceneParams) {
+    args.push_back("--param");
+    args.push_back(p);
+  }
+  const CliResult r = sarfocus(args);
+  ASSERT_EQ(r.status, 0) << r.err;
+  const std::string stem = fs::path(t.level0_path).stem().string();
+  for (const char* word : {"_hv", "_hh"})
+    for (const char* suffix : {"_slc", "_slc_hdr", "_slc.sml", "_slc.tif"})
+      EXPECT_TRUE(fs::exists(out / (stem + word + suffix))) << stem + word + suffix;
+  EXPECT_NE((r.out + r.err).find(stem + "_hv_slc"), std::string::npos) << r.out << r.err;
+  args.push_back("--skip-complete");
+  const CliResult again = sarfocus(args);
+  EXPECT_EQ(again.status, 0) << again.err;
+  EXPECT_NE((again.out + again.err).find("skipped"), std::string::npos) << again.out << again.err;
 }
 
 }  // namespace
