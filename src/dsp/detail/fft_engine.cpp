@@ -8,6 +8,8 @@
 #include <thread>
 #include <utility>
 
+#include "base/parallel.hpp"
+
 #ifdef _OPENMP
 #include <omp.h>
 #endif
@@ -79,8 +81,12 @@ void parallel_for(int count, int threads, Fn&& fn) {
     return;
   }
 #ifdef _OPENMP
+  // A chunk that throws (its plan or buffers cannot be had) must not end the process from
+  // inside the region: the first failure comes out after it.
+  base::ParallelFailure failure;
 #pragma omp parallel for num_threads(threads) schedule(static)
-  for (int i = 0; i < count; ++i) fn(i);
+  for (int i = 0; i < count; ++i) failure.run([&] { fn(i); });
+  failure.rethrow();
 #else
   std::vector<std::jthread> workers;
   workers.reserve(static_cast<std::size_t>(threads - 1));
