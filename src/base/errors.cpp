@@ -28,6 +28,28 @@ const std::string& CErrorExceptionManager::detail() const {
   return details_.empty() ? empty : details_.front();
 }
 
+namespace {
+std::string joined(const std::vector<std::string>& details) {
+  std::string text;
+  for (const std::string& d : details) text += (text.empty() ? "" : ": ") + d;
+  return text;
+}
+}  // namespace
+
+InputError::InputError(InputFault fault, int32_t hostCode, std::vector<std::string> details, int64_t offset,
+                       std::string field, const std::string& what, std::string file, source_location loc)
+    : CErrorExceptionManager(hostCode, details, loc.file_name(), static_cast<int>(loc.line())),
+      std::runtime_error(what.empty() ? joined(details) : what),
+      fault_(fault),
+      file_(file.empty() && !details.empty() ? details.front() : std::move(file)),
+      offset_(offset),
+      field_(std::move(field)) {}
+
+void input_fault(InputFault fault, int32_t code, std::vector<std::string> details, int64_t offset, std::string field,
+                 std::string file, source_location loc) {
+  throw InputError(fault, code, std::move(details), offset, std::move(field), {}, std::move(file), loc);
+}
+
 void fatal(int32_t code, std::vector<std::string> details, source_location loc) {
   throw CErrorExceptionManager(code, std::move(details), loc.file_name(), static_cast<int>(loc.line()));
 }

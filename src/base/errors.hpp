@@ -79,6 +79,11 @@ class CErrorExceptionManager {
 
 using FatalError = CErrorExceptionManager;
 
+/// End the process with `status`, writing nothing more.
+struct ProcessExit {
+  int status;
+};
+
 /// What is wrong with an input file, as a reader sees it.
 enum class InputFault {
   kMissing,      // absent or unreadable
@@ -90,17 +95,20 @@ enum class InputFault {
 };
 
 /// The one failure type of the readers of untrusted files: what is wrong, the file, the byte
-/// offset and the field where it was seen, and the host code the reader would give it. Readers
-/// throw it; the job driver, which knows what the file was for, is the only place that turns
-/// it into the host's error record (and may pick another code, a stage failure say).
-class InputError : public std::runtime_error {
+/// offset and the field where it was seen, and the host code and record details the reader
+/// proposes. It is a host-visible failure as it stands (so a driver that does not look at it
+/// reports what the reader said), and a standard exception; the job driver, which knows what
+/// the file was for, may catch it and choose another code (an orbit that does not cover the
+/// scene is a stage that cannot run, say).
+class InputError : public CErrorExceptionManager, public std::runtime_error {
  public:
-  InputError(InputFault fault, int32_t hostCode, std::string file, int64_t offset, std::string field,
-             const std::string& what)
-      : std::runtime_error(what), fault_(fault), hostCode_(hostCode), file_(std::move(file)), offset_(offset),
-        field_(std::move(field)) {}
+  /// `what`: the message of the standard exception; empty: the details joined. `file`: the file
+  /// at fault; empty: the first detail.
+  InputError(InputFault fault, int32_t hostCode, std::vector<std::string> details, int64_t offset = -1,
+             std::string field = {}, const std::string& what = {}, std::string file = {},
+             source_location loc = source_location::current());
   InputFault fault() const { return fault_; }
-  int32_t host_code() const { return hostCode_; }
+  int32_t host_code() const { return ec(); }
   const std::string& file() const { return file_; }
   /// Byte offset of the faulty field in the file, -1 when not tied to a place.
   int64_t offset() const { return offset_; }
@@ -115,7 +123,6 @@ class InputError : public std::runtime_error {
 
  private:
   InputFault fault_;
-  int32_t hostCode_;
   std::string file_;
   int64_t offset_;
   std::string field_;
@@ -123,10 +130,11 @@ class InputError : public std::runtime_error {
   double spanStop_ = std::numeric_limits<double>::quiet_NaN();
 };
 
-/// End the process with `status`, writing nothing more.
-struct ProcessExit {
-  int status;
-};
+/// Raise an input error: the reader's fault, proposed code and details (the file first, unless
+/// `file` names it).
+[[noreturn]] void input_fault(InputFault fault, int32_t ec, std::vector<std::string> details, int64_t offset = -1,
+                              std::string field = {}, std::string file = {},
+                              source_location loc = source_location::current());
 
 /// Raise the fatal exit for `ec` with up to three detail strings. The source location names
 /// the unit in the trace; pass a unit name explicitly where the host expects a fixed one.

@@ -16,6 +16,8 @@ namespace sar::envisat {
 namespace {
 
 using sar::base::fatal;
+using sar::base::input_fault;
+using sar::base::InputFault;
 namespace ec = sar::base::ec;
 
 std::string fmt(const char* format, long long a, long long b = 0, long long c = 0) {
@@ -41,14 +43,14 @@ std::int64_t header_number(const std::string& path, std::string_view headers, st
   std::int64_t value = -1;
   const auto [end, err] = std::from_chars(text.data() + start, text.data() + text.size(), value);
   if (err != std::errc{} || end == text.data() + start || value < 0)
-    fatal(ec::kFileIo, {path, field,
+    input_fault(InputFault::kMalformed, ec::kFileIo, {path, field,
                         fmt("header byte %lld: not a size: ", static_cast<long long>(pos)) + "\"" +
                             std::string(text) + "\""});
   return value;
 }
 
 void size_fault(const std::string& path, const char* field, std::size_t pos, const std::string& what) {
-  fatal(ec::kFileIo, {path, field, fmt("header byte %lld: ", static_cast<long long>(pos)) + what});
+  input_fault(InputFault::kMalformed, ec::kFileIo, {path, field, fmt("header byte %lld: ", static_cast<long long>(pos)) + what});
 }
 
 }  // namespace
@@ -59,18 +61,19 @@ void AuxProduct::load(const std::string& path, int typeCode, std::size_t recordS
   std::error_code fsError;
   const auto fileSize = std::filesystem::file_size(path, fsError);
   std::ifstream in(path, std::ios::binary);
-  if (fsError || !in) fatal(missing_code(typeCode), {path, typeName});
+  if (fsError || !in) input_fault(InputFault::kMissing, missing_code(typeCode), {path, typeName});
 
   std::string headers(kAuxHeadersSize, '\0');
   in.read(headers.data(), static_cast<std::streamsize>(headers.size()));
   if (static_cast<std::size_t>(in.gcount()) != headers.size())
-    fatal(ec::kFileIo, {path, "MPH/SPH", fmt("file of %lld bytes, headers need %lld", static_cast<long long>(fileSize),
+    input_fault(InputFault::kTruncated, ec::kFileIo, {path, "MPH/SPH", fmt("file of %lld bytes, headers need %lld", static_cast<long long>(fileSize),
                                              static_cast<long long>(kAuxHeadersSize))});
 
   // The type is told by the header, as everywhere else in the intake.
   EnvisatTypes types(path);
   if (types.find_type() != typeCode)
-    fatal(ec::kBadArguments, {typeName, path, "MPH PRODUCT at byte 9: " + types.product_name().value_or("")});
+    input_fault(InputFault::kWrongType, ec::kBadArguments,
+                {typeName, path, "MPH PRODUCT at byte 9: " + types.product_name().value_or("")}, 9, "PRODUCT", path);
 
   header_.product = types.product_name().value_or("");
   header_.validityStart = headers.substr(kMphSensingStartOffset, kTimeTextLength);
@@ -106,7 +109,7 @@ void AuxProduct::load(const std::string& path, int typeCode, std::size_t recordS
   in.seekg(header_.dsOffset);
   in.read(reinterpret_cast<char*>(record_.data()), want);
   if (!in || in.gcount() != want)
-    fatal(ec::kFileIo, {path, typeName + " record",
+    input_fault(InputFault::kTruncated, ec::kFileIo, {path, typeName + " record",
                         fmt("file byte %lld: %lld of %lld bytes read", header_.dsOffset,
                             static_cast<long long>(in.gcount()), want)});
 }

@@ -20,6 +20,8 @@ namespace {
 
 namespace ec = sar::base::ec;
 using sar::base::fatal;
+using sar::base::input_fault;
+using sar::base::InputFault;
 using sar::base::report;
 using sar::base::kReportCheckpoint;
 using sar::base::kReportError;
@@ -160,7 +162,7 @@ void Walker::synchromdsr() {
   // A full block without a clean head leaves the file 68 bytes before its end, so the search
   // goes on from there; a block cut by the end of the product means no packet is left.
   if (got < kSyncBlock)
-    fatal(ec::kFileIo, {in_.path(), "no clean packet header before the end of the level 0 product", at_text(start, in_.size())});
+    input_fault(InputFault::kMalformed, ec::kFileIo, {in_.path(), "no clean packet header before the end of the level 0 product", at_text(start, in_.size())});
   in_.seek(start + got - static_cast<std::int64_t>(l0::kHeadSize));
 }
 
@@ -464,7 +466,7 @@ void Walker::finish() {
     char count[96];
     std::snprintf(count, sizeof count, "%lld of %lld echoes", static_cast<long long>(polarisationMismatches_),
                   static_cast<long long>(apEchoes_));
-    fatal(ec::kBadArguments, {in_.path(), "packet polarisation contradicts the timeline (" + std::string(count) + ")",
+    input_fault(InputFault::kContradicts, ec::kBadArguments, {in_.path(), "packet polarisation contradicts the timeline (" + std::string(count) + ")",
                               firstMismatch_});
   }
   const std::size_t n = state_.size();

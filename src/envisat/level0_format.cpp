@@ -170,11 +170,13 @@ int alternating_mode_of_packets(const std::string& path) {
 Level0Header read_level0_header(const std::string& path) {
   namespace fs = std::filesystem;
   using sar::base::fatal;
+  using sar::base::input_fault;
+  using sar::base::InputFault;
   namespace ec = sar::base::ec;
   std::error_code err;
-  if (!fs::is_regular_file(path, err)) fatal(ec::kImageMissing, {path, "level 0 product not found"});
+  if (!fs::is_regular_file(path, err)) input_fault(InputFault::kMissing, ec::kImageMissing, {path, "level 0 product not found"});
   const auto size = fs::file_size(path, err);
-  if (err) fatal(ec::kFileIo, {path, "size of the level 0 product cannot be read"});
+  if (err) input_fault(InputFault::kMissing, ec::kFileIo, {path, "size of the level 0 product cannot be read"});
 
   Level0Header h;
   h.fileSize = static_cast<std::int64_t>(size);
@@ -182,12 +184,12 @@ Level0Header read_level0_header(const std::string& path) {
     char where[96];
     std::snprintf(where, sizeof where, "%lld bytes, headers need %lld", static_cast<long long>(h.fileSize),
                   static_cast<long long>(l0::kFirstMdsr));
-    fatal(ec::kFileIo, {path, "level 0 product shorter than its headers", where});
+    input_fault(InputFault::kTruncated, ec::kFileIo, {path, "level 0 product shorter than its headers", where});
   }
   std::vector<char> bytes(static_cast<std::size_t>(l0::kFirstMdsr));
   std::ifstream in(path, std::ios::binary);
   if (!in.read(bytes.data(), static_cast<std::streamsize>(bytes.size())))
-    fatal(ec::kFileIo, {path, "level 0 headers cannot be read"});
+    input_fault(InputFault::kMissing, ec::kFileIo, {path, "level 0 headers cannot be read"});
   const std::string_view mph(bytes.data(), static_cast<std::size_t>(l0::kMphSize));
   const std::string_view sph(bytes.data() + l0::kMphSize, static_cast<std::size_t>(l0::kSphSize));
 
@@ -201,7 +203,7 @@ Level0Header read_level0_header(const std::string& path) {
   // The archive names every alternating polarisation product "ASA_AP__0P" and its SPH says
   // "AP_": the sub-mode is then told by the packets alone.
   const bool genericAp = h.productType == 0 && h.product.starts_with(kGenericApPrefix);
-  if (h.productType == 0 && !genericAp) fatal(ec::kBadArguments, {path, "not an ASAR level 0 product", h.product});
+  if (h.productType == 0 && !genericAp) input_fault(InputFault::kWrongType, ec::kBadArguments, {path, "not an ASAR level 0 product", h.product});
 
   h.mode = -1;
   for (int m = 0; m < static_cast<int>(kModes.size()); ++m) {
@@ -225,7 +227,7 @@ Level0Header read_level0_header(const std::string& path) {
                                (is_alternating(h.mode) && (h.productType == kAsaApc || h.productType == kAsaAph ||
                                                            h.productType == kAsaApv));
   if (!modeMatchesType)
-    fatal(ec::kBadArguments, {path, "level 0 SPH mode letters do not match the product",
+    input_fault(InputFault::kContradicts, ec::kBadArguments, {path, "level 0 SPH mode letters do not match the product",
                               std::string(sph.substr(l0::kSphModeLetters, 3))});
   h.channels = mode_info(h.mode).channels;
 

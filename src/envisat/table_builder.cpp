@@ -20,6 +20,8 @@ namespace {
 
 namespace ec = sar::base::ec;
 using sar::base::fatal;
+using sar::base::input_fault;
+using sar::base::InputFault;
 
 std::string at_byte(std::int64_t pos) {
   char t[64];
@@ -34,7 +36,7 @@ class Level0Bytes {
     std::error_code err;
     const auto size = std::filesystem::file_size(path_, err);
     in_.open(path_, std::ios::binary);
-    if (err || !in_) fatal(ec::kImageMissing, {path_, "level 0 product cannot be opened"});
+    if (err || !in_) input_fault(InputFault::kMissing, ec::kImageMissing, {path_, "level 0 product cannot be opened"});
     size_ = static_cast<std::int64_t>(size);
   }
   std::int64_t size() const { return size_; }
@@ -47,7 +49,7 @@ class Level0Bytes {
     in_.clear();
     in_.seekg(pos);
     in_.read(reinterpret_cast<char*>(out.data()), n);
-    if (in_.gcount() != n) fatal(ec::kFileIo, {path_, "read failed", at_byte(pos)});
+    if (in_.gcount() != n) input_fault(InputFault::kTruncated, ec::kFileIo, {path_, "read failed", at_byte(pos)});
     return n;
   }
 
@@ -107,7 +109,7 @@ PacketMark first_packet(const std::string& level0Path, int mode) {
   check_mode(mode);
   Level0Bytes file(level0Path);
   const auto at = next_clean_head(file, l0::kFirstMdsr, mode);
-  if (!at) fatal(ec::kFileIo, {level0Path, "no clean packet header in the level 0 product"});
+  if (!at) input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, "no clean packet header in the level 0 product"});
   Head h{};
   file.read_at(*at, h);
   return mark_of(decode_packet_head(h));
@@ -127,7 +129,7 @@ PacketMark last_packet(const std::string& level0Path, int mode) {
     const PacketHead p = decode_packet_head(h);
     if (d >= p.payload_bytes() && (anyKind || p.echo)) return mark_of(p);
   }
-  fatal(ec::kFileIo, {level0Path, "no whole packet in the level 0 product",
+  input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, "no whole packet in the level 0 product",
                       "file of " + std::to_string(file.size()) + " bytes"});
 }
 
@@ -209,7 +211,7 @@ int loadparam(const std::string& level0Path, const std::string& insPath, int mod
     if ((c == 0 || !is_alternating(mode)) && (beam < lowBeam || beam > highBeam)) {
       char t[96];
       std::snprintf(t, sizeof t, "no echo of channel %d among the first %d packets", c, kStatisticPackets);
-      fatal(ec::kFileIo, {level0Path, t});
+      input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, t});
     }
     beams[static_cast<std::size_t>(c)] = beam;
   }
@@ -224,7 +226,7 @@ int loadparam(const std::string& level0Path, const std::string& insPath, int mod
       char t[128];
       std::snprintf(t, sizeof t, "channel %d: PRI code %d, window length %d, sampling frequency %g", c, pri, swl,
                     p.samplingRate);
-      fatal(ec::kFileIo, {level0Path, "acquisition codes give no line grid", t});
+      input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, "acquisition codes give no line grid", t});
     }
     p.prf = p.samplingRate / pri;
     p.pulse_length = s.most_frequent(ChannelStatistic::kPulse) / p.samplingRate;
@@ -253,7 +255,7 @@ int asainspar(const std::string& insPath, std::span<sarpar> channels, int mode, 
     try {
       q = ins.parameters(timeline, beam);
     } catch (const std::out_of_range& e) {
-      fatal(ec::kBadArguments, {insPath, "ASA_INS has no swath table for the beam", e.what()});
+      input_fault(InputFault::kMalformed, ec::kBadArguments, {insPath, "ASA_INS has no swath table for the beam", e.what()});
     }
     sarpar& p = channels[c];
     p.carrierFrequency = q.carrierFrequency;
@@ -276,7 +278,7 @@ int init_IM_table(const std::string& level0Path, LineTable& table, std::span<sar
   } catch (const std::invalid_argument& e) {
     char t[96];
     std::snprintf(t, sizeof t, "first packet counter %d, last %d", first.counter, last.counter);
-    fatal(ec::kFileIo, {level0Path, e.what(), t});
+    input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, e.what(), t});
   }
   return 0;
 }
@@ -287,7 +289,7 @@ namespace {
                                const PacketMark& last) {
   char t[96];
   std::snprintf(t, sizeof t, "first packet counter %d, last %d", first.counter, last.counter);
-  fatal(ec::kFileIo, {level0Path, e.what(), t});
+  input_fault(InputFault::kMalformed, ec::kFileIo, {level0Path, e.what(), t});
 }
 }  // namespace
 
@@ -336,7 +338,7 @@ TableBuilder timeline_table_builder() {
     if (mode == kModeWS) return init_WS_table(level0Path, table, channels, insPath);
     if (is_alternating(mode)) return init_AP_table(level0Path, table, channels, insPath, mode);
     const char* letters = mode >= kModeIM && mode <= kModeGM ? mode_info(mode).letters : "?";
-    fatal(ec::kBadArguments, {level0Path, "no timeline table for the acquisition mode", letters});
+    input_fault(InputFault::kWrongType, ec::kBadArguments, {level0Path, "no timeline table for the acquisition mode", letters});
   };
 }
 

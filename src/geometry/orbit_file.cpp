@@ -23,6 +23,11 @@ base::InputFault fault_of(int status) {
     default: return base::InputFault::kMalformed;
   }
 }
+// The record shows the file and the text apart; the text repeats the file in front.
+std::string without_file(const std::string& what, const std::string& file) {
+  const std::string prefix = file + ": ";
+  return what.rfind(prefix, 0) == 0 ? what.substr(prefix.size()) : what;
+}
 int32_t host_code_of(int status) {
   switch (status) {
     case orbit_status::kNotOrbitProduct: return base::ec::kBadArguments;
@@ -33,7 +38,8 @@ int32_t host_code_of(int status) {
 }  // namespace
 
 OrbitError::OrbitError(int status, std::string file, int64_t offset, std::string field, const std::string& what)
-    : base::InputError(fault_of(status), host_code_of(status), std::move(file), offset, std::move(field), what),
+    : base::InputError(fault_of(status), host_code_of(status), {file, without_file(what, file)}, offset,
+                       std::move(field), what),
       status_(status) {}
 
 namespace {

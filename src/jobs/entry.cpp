@@ -98,10 +98,6 @@ int focussing_entry(std::string command) {
     return fatal_exit(e);
   } catch (const base::ProcessExit& e) {
     return e.status;
-  } catch (const base::InputError& e) {
-    // A driver that did not place the fault itself: the reader's code, with the file.
-    return fatal_exit(base::CErrorExceptionManager(e.host_code(), {e.file(), e.what()}, std::string(kUnitEntry),
-                                                   kLineCatchAll));
   } catch (...) {
     const std::string label = base::activity_label();
     return fatal_exit(base::CErrorExceptionManager(base::ec::kUncaught, {label}, std::string(kUnitEntry),

@@ -63,7 +63,7 @@ class BeReader {
       std::snprintf(where, sizeof where, "offset %llu (file byte %llu), %llu bytes, record of %zu bytes",
                     static_cast<unsigned long long>(offset), static_cast<unsigned long long>(fileBase_ + offset),
                     static_cast<unsigned long long>(length), bytes_.size());
-      sar::base::fatal(sar::base::ec::kFileIo, {std::string(path_), std::string(field), where});
+      sar::base::input_fault(sar::base::InputFault::kTruncated, sar::base::ec::kFileIo, {std::string(path_), std::string(field), where});
     }
     return bytes_.data() + offset;
   }

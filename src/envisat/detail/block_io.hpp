@@ -74,7 +74,7 @@ class ProductReader {
   ProductReader(std::string path, std::int64_t size)
       : path_(std::move(path)), size_(size), block_(static_cast<std::size_t>(kBlockBytes)) {
     file_ = FileDescriptor(::open(path_.c_str(), O_RDONLY | O_CLOEXEC));
-    if (!file_) sar::base::fatal(sar::base::ec::kFileIo, {path_, "level 0 product cannot be opened"});
+    if (!file_) sar::base::input_fault(sar::base::InputFault::kMissing, sar::base::ec::kFileIo, {path_, "level 0 product cannot be opened"});
     ::posix_fadvise(file_.get(), 0, 0, POSIX_FADV_SEQUENTIAL);
   }
   std::int64_t pos() const { return pos_; }
@@ -83,7 +83,7 @@ class ProductReader {
 
   void seek(std::int64_t to) {
     if (to < 0 || to > size_)
-      sar::base::fatal(sar::base::ec::kFileIo, {path_, "seek outside the level 0 product", byte_text(to, size_)});
+      sar::base::input_fault(sar::base::InputFault::kTruncated, sar::base::ec::kFileIo, {path_, "seek outside the level 0 product", byte_text(to, size_)});
     pos_ = to;
   }
 
@@ -91,10 +91,10 @@ class ProductReader {
   /// first is truncated.
   std::span<const std::uint8_t> view(std::int64_t n, const char* what) {
     if (n < 0 || n > size_ - pos_)
-      sar::base::fatal(sar::base::ec::kFileIo,
+      sar::base::input_fault(sar::base::InputFault::kTruncated, sar::base::ec::kFileIo,
                        {path_, std::string("level 0 product truncated in ") + what, byte_text(pos_, size_)});
     if (n > kBlockBytes)
-      sar::base::fatal(sar::base::ec::kFileIo, {path_, std::string("read larger than the block in ") + what,
+      sar::base::input_fault(sar::base::InputFault::kTruncated, sar::base::ec::kFileIo, {path_, std::string("read larger than the block in ") + what,
                                                  byte_text(pos_, size_)});
     if (pos_ < blockStart_ || pos_ + n > blockStart_ + blockLength_) fill(n, what);
     const auto at = static_cast<std::size_t>(pos_ - blockStart_);
@@ -141,7 +141,7 @@ class ProductReader {
       if (got <= 0) {
         if (blockLength_ >= n) break;  // what is needed is there; the rest can wait
         blockLength_ = 0;
-        sar::base::fatal(sar::base::ec::kFileIo,
+        sar::base::input_fault(sar::base::InputFault::kMalformed, sar::base::ec::kFileIo,
                          {path_, std::string("read failed in ") + what, byte_text(at, size_)});
       }
       blockLength_ += got;
