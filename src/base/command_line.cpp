@@ -59,6 +59,8 @@ std::unique_ptr<CLI::App> make_app(const std::string& program, const std::string
   auto app = std::make_unique<CLI::App>(description, program);
   app->formatter(std::make_shared<HelpFormatter>(usage));
   app->set_help_flag("-h,--help", "this text");
+  // An option given twice takes its last value, as shell scripts that append to a command expect.
+  app->option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
   return app;
 }
 
@@ -84,6 +86,29 @@ CLI::Validator real_number() {
         return {};
       },
       "X");
+}
+
+std::vector<double> numbers_of(const std::string& text) {
+  std::vector<double> values;
+  std::size_t start = 0;
+  for (;;) {
+    const std::size_t comma = text.find(',', start);
+    const std::string part = text.substr(start, comma == std::string::npos ? std::string::npos : comma - start);
+    double v = 0.0;
+    const auto [end, ec] = std::from_chars(part.data(), part.data() + part.size(), v);
+    if (part.empty() || ec != std::errc() || end != part.data() + part.size() || !std::isfinite(v)) return {};
+    values.push_back(v);
+    if (comma == std::string::npos) return values;
+    start = comma + 1;
+  }
+}
+
+CLI::Validator number_list(std::size_t count, const std::string& form) {
+  return CLI::Validator(
+      [count, form](std::string& text) -> std::string {
+        return numbers_of(text).size() == count ? std::string() : "takes " + form + ", not '" + text + "'";
+      },
+      form);
 }
 
 CLI::Validator one_of(std::vector<std::string> words) {
@@ -118,7 +143,7 @@ Parsed parse(CLI::App& app, const std::vector<std::string>& args) {
   } catch (const CLI::ArgumentMismatch& e) {
     // CLI11 says "--orbit: 1 required TEXT missing"; the option's name comes first.
     const std::string what = e.what();
-    result.error = what.substr(0, what.find(':')) + " needs a value";
+    result.error = what.find("missing") != std::string::npos ? what.substr(0, what.find(':')) + " needs a value" : what;
     return result;
   } catch (const CLI::ValidationError& e) {
     // "<option>: <what the validator said>" reads as one sentence without the colon.

@@ -33,6 +33,10 @@ inline CLI::Option* shown_as(CLI::Option* option, const std::string& text) { ret
 CLI::Validator whole_number(long long lo, long long hi);
 /// Any finite number.
 CLI::Validator real_number();
+/// `count` finite numbers separated by commas; `form` names them ("LAT,LON,H,AMP").
+CLI::Validator number_list(std::size_t count, const std::string& form);
+/// The numbers of a text `number_list` accepted.
+std::vector<double> numbers_of(const std::string& text);
 /// One of the words.
 CLI::Validator one_of(std::vector<std::string> words);
 
