@@ -18,12 +18,8 @@
 #include <utility>
 #include <vector>
 
-#include <cpl_error.h>
-#include <gdal.h>
-#include <ogr_api.h>
-#include <ogr_srs_api.h>
-
 #include "base/diagnostics.hpp"
+#include "hostlib/gdal_support.hpp"
 #include "io/description.hpp"
 
 namespace sar::hostlib {
@@ -171,23 +167,16 @@ std::vector<LonLat> corner_ring(const Footprint& fp, bool clockwise, bool contin
 
 // ---- text forms ------------------------------------------------------------------------------
 
-/// Text made safe for XML 1.0: markup characters escaped, control characters and bytes that are
-/// not UTF-8 replaced by '?'.
-std::string xml_text(std::string_view text) {
+/// Text any XML 1.0 writer can carry: control characters and bytes that are not UTF-8 replaced
+/// by '?'.
+std::string valid_text(std::string_view text) {
   std::string out;
   out.reserve(text.size());
   std::size_t i = 0;
   while (i < text.size()) {
     const auto c = static_cast<unsigned char>(text[i]);
     if (c < 0x80) {
-      switch (c) {
-        case '&': out += "&amp;"; break;
-        case '<': out += "&lt;"; break;
-        case '>': out += "&gt;"; break;
-        case '"': out += "&quot;"; break;
-        case '\'': out += "&apos;"; break;
-        default: out += (c < 0x20 && c != '\t' && c != '\n' && c != '\r') || c == 0x7f ? '?' : static_cast<char>(c);
-      }
+      out += (c < 0x20 && c != '\t' && c != '\n' && c != '\r') || c == 0x7f ? '?' : static_cast<char>(c);
       ++i;
       continue;
     }
@@ -223,6 +212,30 @@ std::string xml_text(std::string_view text) {
       ++i;
     }
   }
+  return out;
+}
+
+/// Valid text with the markup characters escaped, for the hand-made GCP document.
+std::string xml_text(std::string_view text) {
+  std::string out;
+  for (char c : valid_text(text)) {
+    switch (c) {
+      case '&': out += "&amp;"; break;
+      case '<': out += "&lt;"; break;
+      case '>': out += "&gt;"; break;
+      case '"': out += "&quot;"; break;
+      case '\'': out += "&apos;"; break;
+      default: out += c;
+    }
+  }
+  return out;
+}
+
+/// Valid text for the KML writer, which puts text holding markup characters into a CDATA
+/// section without splitting a "]]>" inside it: such a sequence would end the section early.
+std::string kml_text(std::string_view text) {
+  std::string out = valid_text(text);
+  for (std::size_t at = out.find("]]>"); at != std::string::npos; at = out.find("]]>", at)) out[at + 2] = '?';
   return out;
 }
 
@@ -264,47 +277,13 @@ std::string iso_time(std::string_view text) {
 
 std::string degrees(double v) { return printed("%.8f", v); }
 
-std::string kml_document(const Footprint& fp) {
-  const std::vector<LonLat> ring = corner_ring(fp, false, false);
-  std::string coordinates;
-  for (const auto& p : ring) {
-    if (!coordinates.empty()) coordinates += ' ';
-    coordinates += degrees(p.lon) + "," + degrees(p.lat) + ",0";
-  }
+std::string kml_description(const Footprint& fp) {
   std::string description = "Product " + fp.productName;
   if (!fp.sensorName.empty()) description += ", sensor " + fp.sensorName;
   if (!fp.acquisitionTime.empty()) description += ", acquired " + fp.acquisitionTime;
   description += printed(", %lld lines x %lld pixels", static_cast<long long>(fp.lines),
                          static_cast<long long>(fp.pixels));
-  const std::string when = iso_time(fp.acquisitionTime);
-  const std::string name = xml_text(fp.productName);
-
-  std::string k;
-  k += "<?xml version=\"1.0\" encoding=\"UTF-8\"?>\n";
-  k += "<kml xmlns=\"http://www.opengis.net/kml/2.2\">\n";
-  k += "  <Document>\n";
-  k += "    <name>" + name + "</name>\n";
-  k += "    <Style id=\"footprint\">\n";
-  k += "      <LineStyle><color>ff0000ff</color><width>2</width></LineStyle>\n";
-  k += "      <PolyStyle><color>400000ff</color></PolyStyle>\n";
-  k += "    </Style>\n";
-  k += "    <Placemark>\n";
-  k += "      <name>" + name + "</name>\n";
-  k += "      <description>" + xml_text(description) + "</description>\n";
-  if (!when.empty()) k += "      <TimeStamp><when>" + when + "</when></TimeStamp>\n";
-  k += "      <styleUrl>#footprint</styleUrl>\n";
-  k += "      <Polygon>\n";
-  k += "        <tessellate>1</tessellate>\n";
-  k += "        <outerBoundaryIs>\n";
-  k += "          <LinearRing>\n";
-  k += "            <coordinates>" + coordinates + "</coordinates>\n";
-  k += "          </LinearRing>\n";
-  k += "        </outerBoundaryIs>\n";
-  k += "      </Polygon>\n";
-  k += "    </Placemark>\n";
-  k += "  </Document>\n";
-  k += "</kml>\n";
-  return k;
+  return description;
 }
 
 std::string gcp_element(int id, const char* name, const char* position, const FootprintPoint& p) {
@@ -350,51 +329,28 @@ std::string dbf_text(std::string_view text, std::size_t length) {
   return out;
 }
 
-struct DatasetClose {
-  void operator()(void* d) const { GDALClose(d); }
-};
-struct SrsRelease {
-  void operator()(void* s) const { OSRRelease(s); }
-};
-struct FeatureDestroy {
-  void operator()(void* f) const { OGR_F_Destroy(f); }
-};
-struct FieldDestroy {
-  void operator()(void* f) const { OGR_Fld_Destroy(f); }
-};
-
-std::string gdal_error(const std::string& what) {
-  const char* message = CPLGetLastErrorMsg();
-  return what + (message && *message ? std::string(": ") + message : std::string());
-}
-
 /// One Polygon record (outer ring clockwise, longitudes continuous) and its attributes as
 /// `<folder>/<stem>.shp`, `.shx`, `.dbf`, `.prj`. 0, or 1 with `error` set.
 int write_shapefile(const Footprint& fp, const std::string& folder, const std::string& stem, std::string& error) {
-  static const bool registered = [] {
-    GDALAllRegister();
-    return true;
-  }();
-  (void)registered;
+  gdal::register_drivers();
+  const gdal::QuietErrors quiet;
   GDALDriverH driver = GDALGetDriverByName("ESRI Shapefile");
   if (!driver) {
     error = "GDAL has no shapefile driver";
     return 1;
   }
   const std::string shp = folder + "/" + stem + ".shp";
-  std::unique_ptr<void, DatasetClose> ds(GDALCreate(driver, shp.c_str(), 0, 0, 0, GDT_Unknown, nullptr));
+  gdal::Dataset ds(GDALCreate(driver, shp.c_str(), 0, 0, 0, GDT_Unknown, nullptr));
   if (!ds) {
-    error = gdal_error("cannot create " + shp);
+    error = gdal::error_text("cannot create " + shp);
     return 1;
   }
-  std::unique_ptr<void, SrsRelease> srs(OSRNewSpatialReference(nullptr));
-  OSRSetWellKnownGeogCS(srs.get(), "WGS84");
-  OSRSetAxisMappingStrategy(srs.get(), OAMS_TRADITIONAL_GIS_ORDER);
+  const gdal::Srs srs = gdal::wgs84();
   const char* const layerOptions[] = {"ENCODING=", "SHPT=POLYGON", nullptr};
   OGRLayerH layer = GDALDatasetCreateLayer(ds.get(), stem.c_str(), srs.get(), wkbPolygon,
                                            const_cast<char**>(layerOptions));
   if (!layer) {
-    error = gdal_error("cannot create the layer of " + shp);
+    error = gdal::error_text("cannot create the layer of " + shp);
     return 1;
   }
   struct Field {
@@ -407,15 +363,15 @@ int write_shapefile(const Footprint& fp, const std::string& folder, const std::s
                                {"PIXELS", OFTInteger, 10, 0},   {"CENTER_LAT", OFTReal, 13, 6},
                                {"CENTER_LON", OFTReal, 13, 6}};
   for (const Field& f : kFields) {
-    std::unique_ptr<void, FieldDestroy> field(OGR_Fld_Create(f.name, f.type));
+    std::unique_ptr<void, gdal::FieldDestroy> field(OGR_Fld_Create(f.name, f.type));
     OGR_Fld_SetWidth(field.get(), f.width);
     OGR_Fld_SetPrecision(field.get(), f.precision);
     if (OGR_L_CreateField(layer, field.get(), TRUE) != OGRERR_NONE) {
-      error = gdal_error(std::string("cannot add the field ") + f.name + " to " + shp);
+      error = gdal::error_text(std::string("cannot add the field ") + f.name + " to " + shp);
       return 1;
     }
   }
-  std::unique_ptr<void, FeatureDestroy> feature(OGR_F_Create(OGR_L_GetLayerDefn(layer)));
+  std::unique_ptr<void, gdal::FeatureDestroy> feature(OGR_F_Create(OGR_L_GetLayerDefn(layer)));
   OGR_F_SetFieldString(feature.get(), 0, dbf_text(fp.productName, 80).c_str());
   OGR_F_SetFieldString(feature.get(), 1, dbf_text(fp.sensorName, 32).c_str());
   OGR_F_SetFieldString(feature.get(), 2, dbf_text(fp.acquisitionTime, 27).c_str());
@@ -429,20 +385,96 @@ int write_shapefile(const Footprint& fp, const std::string& folder, const std::s
   OGR_G_AddGeometryDirectly(polygon, ring);
   OGR_F_SetGeometryDirectly(feature.get(), polygon);
   if (OGR_L_CreateFeature(layer, feature.get()) != OGRERR_NONE) {
-    error = gdal_error("cannot write the footprint record of " + shp);
+    error = gdal::error_text("cannot write the footprint record of " + shp);
     return 1;
   }
   feature.reset();
   CPLErrorReset();
   ds.reset();  // the files are complete only once the dataset is closed
   if (CPLGetLastErrorType() >= CE_Failure) {
-    error = gdal_error("cannot finish " + shp);
+    error = gdal::error_text("cannot finish " + shp);
     return 1;
   }
   return 0;
 }
 
-/// A private folder beside the product for the shapefile driver, removed with everything in it.
+// ---- KML -------------------------------------------------------------------------------------
+// Written by GDAL's LIBKML driver: the document carries the product's name and one style, its
+// placemark the name, a description, the acquisition time and the outline clamped to the ground.
+
+/// `<folder>/<stem>.kml` with one Placemark whose Polygon runs counter-clockwise with longitudes
+/// in -180..180. 0, or 1 with `error` set.
+int write_kml(const Footprint& fp, const std::string& folder, const std::string& stem, std::string& error) {
+  gdal::register_drivers();
+  const gdal::QuietErrors quiet;
+  GDALDriverH driver = GDALGetDriverByName("LIBKML");
+  if (!driver) {
+    error = "GDAL has no LIBKML driver";
+    return 1;
+  }
+  const std::string kml = folder + "/" + stem + ".kml";
+  const std::string documentName = "NAME=" + kml_text(fp.productName);
+  const char* const options[] = {documentName.c_str(), nullptr};
+  gdal::Dataset ds(GDALCreate(driver, kml.c_str(), 0, 0, 0, GDT_Unknown, const_cast<char**>(options)));
+  if (!ds) {
+    error = gdal::error_text("cannot create " + kml);
+    return 1;
+  }
+  // Red outline, a quarter-opaque red fill; the driver turns it into the document's Style.
+  std::unique_ptr<void, gdal::StyleTableDestroy> styles(OGR_STBL_Create());
+  if (!OGR_STBL_AddStyle(styles.get(), "footprint", "PEN(c:#FF0000FF,w:2px);BRUSH(fc:#FF000040)")) {
+    error = "cannot set up the style of " + kml;
+    return 1;
+  }
+  GDALDatasetSetStyleTable(ds.get(), styles.get());
+  const gdal::Srs srs = gdal::wgs84();
+  // A fixed layer name: the product's own could be no valid XML id.
+  OGRLayerH layer = GDALDatasetCreateLayer(ds.get(), "scene", srs.get(), wkbPolygon, nullptr);
+  if (!srs || !layer) {
+    error = gdal::error_text("cannot create the layer of " + kml);
+    return 1;
+  }
+  // The driver maps these field names onto the placemark's own elements.
+  struct Field {
+    const char* name;
+    OGRFieldType type;
+  };
+  constexpr Field kFields[] = {
+      {"name", OFTString}, {"description", OFTString}, {"timestamp", OFTString}, {"tessellate", OFTInteger}};
+  for (const Field& f : kFields) {
+    std::unique_ptr<void, gdal::FieldDestroy> field(OGR_Fld_Create(f.name, f.type));
+    if (OGR_L_CreateField(layer, field.get(), TRUE) != OGRERR_NONE) {
+      error = gdal::error_text(std::string("cannot add the field ") + f.name + " to " + kml);
+      return 1;
+    }
+  }
+  std::unique_ptr<void, gdal::FeatureDestroy> feature(OGR_F_Create(OGR_L_GetLayerDefn(layer)));
+  OGR_F_SetFieldString(feature.get(), 0, kml_text(fp.productName).c_str());
+  OGR_F_SetFieldString(feature.get(), 1, kml_text(kml_description(fp)).c_str());
+  if (const std::string when = iso_time(fp.acquisitionTime); !when.empty())
+    OGR_F_SetFieldString(feature.get(), 2, when.c_str());
+  OGR_F_SetFieldInteger(feature.get(), 3, 1);
+  OGR_F_SetStyleString(feature.get(), "@footprint");
+  OGRGeometryH polygon = OGR_G_CreateGeometry(wkbPolygon);
+  OGRGeometryH ring = OGR_G_CreateGeometry(wkbLinearRing);
+  for (const auto& p : corner_ring(fp, false, false)) OGR_G_AddPoint_2D(ring, p.lon, p.lat);
+  OGR_G_AddGeometryDirectly(polygon, ring);
+  OGR_F_SetGeometryDirectly(feature.get(), polygon);
+  if (OGR_L_CreateFeature(layer, feature.get()) != OGRERR_NONE) {
+    error = gdal::error_text("cannot write the placemark of " + kml);
+    return 1;
+  }
+  feature.reset();
+  CPLErrorReset();
+  ds.reset();  // the document is written when the dataset is closed
+  if (CPLGetLastErrorType() >= CE_Failure) {
+    error = gdal::error_text("cannot finish " + kml);
+    return 1;
+  }
+  return 0;
+}
+
+/// A private folder beside the product for the GDAL drivers, removed with everything in it.
 class ScratchFolder {
  public:
   explicit ScratchFolder(std::string path) : path_(std::move(path)) {}
@@ -622,20 +654,19 @@ int write_footprint(const std::string& slcPath, int flag) {
     const std::string base = io::description_base(slcPath);
     const fs::path basePath(base);
     const std::string stem = basePath.filename().string();
-    ScratchFolder scratch((basePath.parent_path() / ("." + stem + printed(".shp.tmp%ld", static_cast<long>(::getpid()))))
+    ScratchFolder scratch((basePath.parent_path() / ("." + stem + printed(".gis.tmp%ld", static_cast<long>(::getpid()))))
                               .string());
     StagedFiles staged;
-    const std::pair<const char*, std::string> files[] = {{".xml", xml_document(fp)}, {".kml", kml_document(fp)}};
-    for (const auto& [suffix, content] : files) {
-      if (staged.add(base + suffix, content, error) != 0) {
-        warn("Footprint of " + slcPath + " not written: " + error);
-        return kFootprintWriteFailed;
-      }
-    }
-    if (!scratch.create(error) || write_shapefile(fp, scratch.path(), stem, error) != 0) {
+    if (staged.add(base + ".xml", xml_document(fp), error) != 0) {
       warn("Footprint of " + slcPath + " not written: " + error);
       return kFootprintWriteFailed;
     }
+    if (!scratch.create(error) || write_kml(fp, scratch.path(), stem, error) != 0 ||
+        write_shapefile(fp, scratch.path(), stem, error) != 0) {
+      warn("Footprint of " + slcPath + " not written: " + error);
+      return kFootprintWriteFailed;
+    }
+    staged.adopt(scratch.path() + "/" + stem + ".kml", base + ".kml");
     // The shapefile's main file goes last, so that whoever sees it finds its companions there.
     for (const char* suffix : {".prj", ".dbf", ".shx", ".shp"})
       staged.adopt(scratch.path() + "/" + stem + suffix, base + suffix);

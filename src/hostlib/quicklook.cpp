@@ -1,28 +1,16 @@
 #include "hostlib/quicklook.hpp"
 
-#include <geotiff/geotiff.h>
-#include <geotiff/geovalues.h>
-#include <geotiff/xtiffio.h>
-
 #include <algorithm>
 #include <cmath>
 #include <filesystem>
 #include <memory>
+#include <string>
 #include <vector>
+
+#include "hostlib/gdal_support.hpp"
 
 namespace sar::hostlib {
 namespace {
-
-struct TiffCloser {
-  void operator()(TIFF* t) const {
-    if (t) XTIFFClose(t);
-  }
-};
-struct GtifFree {
-  void operator()(GTIF* g) const {
-    if (g) GTIFFree(g);
-  }
-};
 
 double median_of(std::vector<float> values) {
   values.erase(std::remove_if(values.begin(), values.end(), [](float v) { return !(v > 0.0f); }), values.end());
@@ -30,6 +18,46 @@ double median_of(std::vector<float> values) {
   const auto mid = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
   std::nth_element(values.begin(), mid, values.end());
   return *mid;
+}
+
+/// One band of 8-bit grey, deflated in strips of about 64 KiB, 0 declared as no data, and tied
+/// to WGS84 by the four outer pixel corners (near-early, far-early, near-late, far-late).
+/// 0, or 1 when GDAL cannot create or finish the file.
+int write_grey_tiff(const std::string& path, int width, int height, std::vector<uint8_t>& grey,
+                    const QuickLookRequest& request) {
+  gdal::register_drivers();
+  const gdal::QuietErrors quiet;
+  GDALDriverH driver = GDALGetDriverByName("GTiff");
+  if (!driver) return 1;
+  const std::string rowsPerStrip = "BLOCKYSIZE=" + std::to_string(std::max(1, 65536 / width));
+  const char* const options[] = {"COMPRESS=DEFLATE", "PHOTOMETRIC=MINISBLACK", "INTERLEAVE=PIXEL",
+                                 rowsPerStrip.c_str(), nullptr};
+  gdal::Dataset ds(GDALCreate(driver, path.c_str(), width, height, 1, GDT_Byte, const_cast<char**>(options)));
+  if (!ds) return 1;
+  GDALRasterBandH band = GDALGetRasterBand(ds.get(), 1);
+  if (!band || GDALSetRasterNoDataValue(band, 0.0) != CE_None) return 1;
+  if (request.georeferenced) {
+    const double w = width, h = height;
+    const double at[4][2] = {{0.0, 0.0}, {w, 0.0}, {0.0, h}, {w, h}};
+    GDAL_GCP gcps[4];
+    GDALInitGCPs(4, gcps);
+    for (std::size_t k = 0; k < 4; ++k) {
+      gcps[k].dfGCPPixel = at[k][0];
+      gcps[k].dfGCPLine = at[k][1];
+      gcps[k].dfGCPX = request.corners[k].longitude;
+      gcps[k].dfGCPY = request.corners[k].latitude;
+      gcps[k].dfGCPZ = 0.0;
+    }
+    const gdal::Srs srs = gdal::wgs84();
+    const CPLErr set = srs ? GDALSetGCPs2(ds.get(), 4, gcps, srs.get()) : CE_Failure;
+    GDALDeinitGCPs(4, gcps);
+    if (set != CE_None) return 1;
+  }
+  if (GDALRasterIO(band, GF_Write, 0, 0, width, height, grey.data(), width, height, GDT_Byte, 0, 0) != CE_None)
+    return 1;
+  CPLErrorReset();
+  ds.reset();  // the strips and tags are on disk only once the dataset is closed
+  return CPLGetLastErrorType() >= CE_Failure ? 1 : 0;
 }
 
 }  // namespace
@@ -81,46 +109,10 @@ int write_quicklook_geotiff(const std::string& outPath, int lines, int samples, 
   }
 
   const std::string tmpPath = outPath + ".part";
-  {
-    std::unique_ptr<TIFF, TiffCloser> tif(XTIFFOpen(tmpPath.c_str(), "w"));
-    if (!tif) return 10;
-    TIFF* t = tif.get();
-    TIFFSetField(t, TIFFTAG_IMAGEWIDTH, static_cast<uint32_t>(width));
-    TIFFSetField(t, TIFFTAG_IMAGELENGTH, static_cast<uint32_t>(height));
-    TIFFSetField(t, TIFFTAG_BITSPERSAMPLE, 8);
-    TIFFSetField(t, TIFFTAG_SAMPLESPERPIXEL, 1);
-    TIFFSetField(t, TIFFTAG_SAMPLEFORMAT, SAMPLEFORMAT_UINT);
-    TIFFSetField(t, TIFFTAG_PHOTOMETRIC, PHOTOMETRIC_MINISBLACK);
-    TIFFSetField(t, TIFFTAG_PLANARCONFIG, PLANARCONFIG_CONTIG);
-    TIFFSetField(t, TIFFTAG_COMPRESSION, COMPRESSION_ADOBE_DEFLATE);
-    TIFFSetField(t, TIFFTAG_ROWSPERSTRIP, static_cast<uint32_t>(std::max(1, 65536 / width)));
-    // GDAL's no-data tag is not one libtiff knows; register it for this file.
-    static const TIFFFieldInfo kNoData[] = {
-        {TIFFTAG_GDAL_NODATA, -1, -1, TIFF_ASCII, FIELD_CUSTOM, 1, 0, const_cast<char*>("GDALNoDataValue")}};
-    TIFFMergeFieldInfo(t, kNoData, 1);
-    TIFFSetField(t, TIFFTAG_GDAL_NODATA, "0");
-    if (request.georeferenced) {
-      // Four tie points at the outer pixel corners: (i, j, 0) -> (lon, lat, 0).
-      const double w = width, h = height;
-      const auto& c = request.corners;
-      const double ties[24] = {0, 0, 0, c[0].longitude, c[0].latitude, 0, w, 0, 0, c[1].longitude, c[1].latitude, 0,
-                               0, h, 0, c[2].longitude, c[2].latitude, 0, w, h, 0, c[3].longitude, c[3].latitude, 0};
-      TIFFSetField(t, TIFFTAG_GEOTIEPOINTS, 24, ties);
-      std::unique_ptr<GTIF, GtifFree> gtif(GTIFNew(t));
-      if (!gtif) return 10;
-      GTIFKeySet(gtif.get(), GTModelTypeGeoKey, TYPE_SHORT, 1, ModelTypeGeographic);
-      GTIFKeySet(gtif.get(), GTRasterTypeGeoKey, TYPE_SHORT, 1, RasterPixelIsArea);
-      GTIFKeySet(gtif.get(), GeographicTypeGeoKey, TYPE_SHORT, 1, GCS_WGS_84);
-      GTIFKeySet(gtif.get(), GeogAngularUnitsGeoKey, TYPE_SHORT, 1, Angular_Degree);
-      GTIFWriteKeys(gtif.get());
-    }
-    for (int y = 0; y < height; ++y) {
-      if (TIFFWriteScanline(t, grey.data() + static_cast<std::size_t>(y) * width, static_cast<uint32_t>(y), 0) < 0) {
-        tif.reset();
-        std::filesystem::remove(tmpPath);
-        return 10;
-      }
-    }
+  if (write_grey_tiff(tmpPath, width, height, grey, request) != 0) {
+    std::error_code ec;
+    std::filesystem::remove(tmpPath, ec);
+    return 10;
   }
   // The quick-look appears under its name only when complete.
   std::error_code ec;

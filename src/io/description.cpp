@@ -1099,11 +1099,12 @@ int CSectionDataGroup::write(const std::string& path, int keepExisting, int comp
   }
   if (complete) completeGeocoding();
 
-  std::string schemaDir = dictionary_dir("VANTERRA_XML_SCHEMA_DES_FILES_DIR");
+  // The schema by its name alone: a reader finds it in its own schema folder (or beside the
+  // product), and a product folder stays valid wherever it is moved.
   std::string out = "<?xml version=\"1.0\" ?>\n";
   out += "<HEADER_INFO xmlns=\"" + std::string(kDescriptionNamespace) +
          "\" xmlns:xsi=\"http://www.w3.org/2001/XMLSchema-instance\" xsi:schemaLocation=\"" +
-         std::string(kDescriptionNamespace) + " " + escaped(schemaDir + std::string(kDescriptionSchema)) + "\">\n";
+         std::string(kDescriptionNamespace) + " " + std::string(kDescriptionSchema) + "\">\n";
   for (const auto& s : sections_) {
     const bool replacedByOld = !s.has_data() && std::any_of(kept.begin(), kept.end(),
                                                             [&](const XmlNode& n) { return n.local_name() == s.name; });

@@ -51,7 +51,8 @@ namespace sar::io {
 
 /// Most fields one section may declare.
 inline constexpr int CVTR_DS_MAX_NBR_FIELDS = 256;
-/// Schema named by the root element of a written description.
+/// Schema named by the root element of a written description, by its file name alone (no
+/// folder), so that the description does not depend on where it was written.
 inline constexpr std::string_view kDescriptionSchema = "VanterraHeaderSchema_version_1.0.xsd";
 /// Namespace of description documents.
 inline constexpr std::string_view kDescriptionNamespace = "urn:vanterra:header:1.0";

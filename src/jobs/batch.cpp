@@ -6,9 +6,12 @@
 #include <filesystem>
 #include <fstream>
 #include <map>
+#include <memory>
 #include <mutex>
 #include <sstream>
 #include <thread>
+
+#include "base/command_line.hpp"
 
 namespace sar::jobs {
 namespace fs = std::filesystem;
@@ -309,72 +312,112 @@ std::string emit_parallel(const BatchRequest& request, const std::vector<std::st
   return line;
 }
 
+namespace {
+
+// An option of the emitted script or command: a value on one line.
+CLI::Validator one_line() {
+  return CLI::Validator(
+      [](std::string& text) -> std::string {
+        return text.find('\n') == std::string::npos ? std::string() : std::string("takes one line");
+      },
+      "TEXT");
+}
+
+const char* kBatchUsage =
+    "sarfocus batch LIST|DIR [--mode MODE] [--jobs N] [--force] [MODE options]\n"
+    "       sarfocus batch LIST|DIR --emit slurm [--slurm-option TEXT]... [--job-name NAME] [options]\n"
+    "       sarfocus batch LIST|DIR --emit parallel [--sshlogin LOGIN]... [options]";
+
+const char* kBatchText =
+    "\n"
+    "Focus many products, each in its own working directory OUT/.sarfocus/<product>/, as\n"
+    "`sarfocus MODE PRODUCT` would. LIST is a text file of product paths, one a line (blank lines\n"
+    "and lines starting with # are skipped; relative paths are taken from the list's folder);\n"
+    "DIR gives its *.N1 files. A failed product never stops the others. The MODE options are those\n"
+    "of sarfocus im --help; --threads defaults to the cores divided by --jobs.\n";
+
+const char* kBatchFooter =
+    "A local run ends with a table of product, status, time and output (the SLC, or the error\n"
+    "text). A product counts as complete, and is skipped on the next run, when its marker\n"
+    "OUT/.sarfocus/<product>/sarfocus.complete stands (written last by a successful run) and the\n"
+    "SLC, its _slc_hdr annotation and, when asked for, the quick-look are there with the sizes it\n"
+    "records. Exit status: 0 when every product is done or skipped, 1 when any failed, 2 for a\n"
+    "bad command line or inputs.\n";
+
+struct BatchWords {
+  std::string emit;
+  bool jobsGiven = false;
+};
+
+std::unique_ptr<CLI::App> batch_app(BatchRequest& req, BatchWords& words) {
+  using base::cli::shown_as;
+  auto app = base::cli::make_app("sarfocus batch", kBatchUsage, kBatchText);
+  shown_as(app->add_option("LIST", req.source, "a list file of products, or a folder of them"), "LIST|DIR");
+  shown_as(app->add_option("--mode", req.common.mode, "im (default), ap, ws, rs or wss")->check(one_line()), "MODE");
+  shown_as(app->add_option_function<int>(
+                   "-j,--jobs",
+                   [&](int n) {
+                     req.jobs = n;
+                     words.jobsGiven = true;
+                   },
+                   "products run at a time (default 1); with --emit slurm the array's\n"
+                   "throttle, with --emit parallel the jobs a host")
+               ->check(base::cli::whole_number(1, 4096)),
+           "N");
+  app->add_flag("--force", req.force, "run products again whose outputs are complete");
+  shown_as(app->add_option("--emit", words.emit,
+                           "print instead of running: with --emit slurm a Slurm array job script,\n"
+                           "one array task a product, each running `sarfocus MODE PRODUCT ...\n"
+                           "--skip-complete` (submit it with sbatch; task logs go to\n"
+                           "OUT/.sarfocus/slurm-*.out); with --emit parallel a GNU parallel\n"
+                           "command line")
+               ->check(base::cli::one_of({"slurm", "parallel"})),
+           "slurm|parallel");
+  shown_as(app->add_option("--slurm-option", req.slurmOptions,
+                           "an #SBATCH line of the script, e.g. --slurm-option --partition=short")
+               ->check(one_line())
+               ->allow_extra_args(false),
+           "TEXT");
+  shown_as(app->add_option("--job-name", req.jobName, "the Slurm job name (default sarfocus)")->check(one_line()),
+           "NAME");
+  shown_as(app->add_option("--sshlogin", req.sshLogins,
+                           "spread the parallel jobs over hosts (GNU parallel's --sshlogin, e.g.\n"
+                           "4/node1,4/node2,: where : is this machine); the paths must be the same\n"
+                           "on every host")
+               ->check(one_line())
+               ->allow_extra_args(false),
+           "LOGIN");
+  // A batch skips complete products anyway (unless --force): --skip-complete is accepted.
+  add_standalone_options(*app, req.common);
+  app->footer(kBatchFooter);
+  return app;
+}
+
+}  // namespace
+
+std::string batch_help() {
+  BatchRequest unused;
+  BatchWords words;
+  return batch_app(unused, words)->help();
+}
+
 int batch_main(const std::vector<std::string>& args, std::size_t first, const SarfocusTools& tools, std::FILE* out,
                std::FILE* err) {
   BatchRequest req;
-  std::vector<std::string> rest;
-  std::string error;
-  std::string emit;
-  bool jobsGiven = false;
-  for (std::size_t i = first; i < args.size() && error.empty(); ++i) {
-    std::string a = args[i];
-    std::string inlineValue;
-    bool hasInline = false;
-    if (a.rfind("--", 0) == 0)
-      if (const auto eq = a.find('='); eq != std::string::npos) {
-        inlineValue = a.substr(eq + 1);
-        hasInline = true;
-        a = a.substr(0, eq);
-      }
-    const bool ours = a == "--mode" || a == "--jobs" || a == "-j" || a == "--emit" || a == "--sshlogin" ||
-                      a == "--slurm-option" || a == "--job-name";
-    if (!ours) {
-      if (a == "--force") req.force = true;
-      else if (a == "--skip-complete") {
-      }  // what a batch does anyway
-      else rest.push_back(args[i]);
-      continue;
-    }
-    std::string value;
-    if (hasInline) value = inlineValue;
-    else if (i + 1 < args.size()) value = args[++i];
-    else {
-      error = a + " needs a value";
-      break;
-    }
-    if (value.find('\n') != std::string::npos) error = a + " takes one line";
-    else if (a == "--mode") req.common.mode = value;
-    else if (a == "--emit") emit = value;
-    else if (a == "--sshlogin") req.sshLogins.push_back(value);
-    else if (a == "--slurm-option") req.slurmOptions.push_back(value);
-    else if (a == "--job-name") req.jobName = value;
-    else {
-      std::size_t used = 0;
-      long n = 0;
-      try {
-        n = std::stol(value, &used);
-      } catch (const std::exception&) {
-        used = 0;
-      }
-      if (used == 0 || used != value.size() || n < 1 || n > 4096) error = "--jobs takes a whole number from 1, not '" + value + "'";
-      req.jobs = static_cast<int>(n);
-      jobsGiven = true;
-    }
-  }
-  bool help = false;
-  if (error.empty()) error = parse_standalone_options(rest, 0, req.common, help);
-  if (help) {
-    std::fputs(sarfocus_help("batch").c_str(), out);
+  BatchWords words;
+  const auto app = batch_app(req, words);
+  const auto parsed = base::cli::parse(
+      *app, std::vector<std::string>(args.begin() + static_cast<std::ptrdiff_t>(std::min(first, args.size())), args.end()));
+  if (parsed.help) {
+    std::fputs(batch_help().c_str(), out);
     return 0;
   }
-  req.source = req.common.product;
-  req.common.product.clear();
+  std::string error = parsed.error;
   if (error.empty() && !known_mode(req.common.mode))
     error = "unknown mode '" + req.common.mode + "' (im, ap, ws, rs or wss)";
   if (error.empty()) {
-    if (emit == "slurm") req.emit = BatchEmit::kSlurm;
-    else if (emit == "parallel") req.emit = BatchEmit::kParallel;
-    else if (!emit.empty()) error = "--emit takes slurm or parallel, not '" + emit + "'";
+    if (words.emit == "slurm") req.emit = BatchEmit::kSlurm;
+    else if (words.emit == "parallel") req.emit = BatchEmit::kParallel;
   }
   if (error.empty() && !req.sshLogins.empty() && req.emit != BatchEmit::kParallel)
     error = "--sshlogin goes with --emit parallel";
@@ -385,6 +428,7 @@ int batch_main(const std::vector<std::string>& args, std::size_t first, const Sa
     std::fprintf(err, "sarfocus batch: %s; see sarfocus batch --help\n", error.c_str());
     return kExitBadRequest;
   }
+  const bool jobsGiven = words.jobsGiven;
   if (!jobsGiven && req.emit == BatchEmit::kRun) req.jobs = 1;
 
   // What every product shares is checked once, before anything runs.

@@ -62,6 +62,9 @@ std::string emit_parallel(const BatchRequest& request, const std::vector<std::st
 /// A word for a POSIX shell: single-quoted unless it needs no quoting.
 std::string shell_quote(const std::string& word);
 
+/// The help text of `sarfocus batch`.
+std::string batch_help();
+
 /// `sarfocus batch LIST|DIR [options]`, args[first] on.
 int batch_main(const std::vector<std::string>& args, std::size_t first, const SarfocusTools& tools, std::FILE* out,
                std::FILE* err);

@@ -1,5 +1,6 @@
 #include "jobs/setup.hpp"
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -7,6 +8,7 @@
 #include <fstream>
 #include <stdexcept>
 
+#include "base/command_line.hpp"
 #include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 
@@ -124,54 +126,92 @@ std::string setup_working_dir(const SetupRequest& request) {
   return list.string();
 }
 
+namespace {
+
+// "N=VALUE" with N a job argument's index.
+CLI::Validator job_argument() {
+  return CLI::Validator(
+      [](std::string& text) -> std::string {
+        const auto eq = text.find('=');
+        std::string index = text.substr(0, eq);
+        if (eq == std::string::npos ||
+            !base::cli::whole_number(0, static_cast<long long>(kMinJobArguments) - 1)(index).empty())
+          return "takes N=VALUE with N from 0 to " + std::to_string(kMinJobArguments - 1) + ", not '" + text + "'";
+        return {};
+      },
+      "N=VALUE");
+}
+
+// A refusal of the command line in the one style of the engine's programs.
+int refuse(const char* command, const std::string& error) {
+  std::fprintf(stderr, "focussing %s: %s; see focussing %s --help\n", command, error.c_str(), command);
+  return 2;
+}
+
+}  // namespace
+
 int aux_index_main(int argc, char** argv) {
-  if (argc < 2) {
-    std::fprintf(stderr, "usage: focussing --aux-index DESDIR AUXDIR...\n");
-    return 2;
+  std::string desDir;
+  std::vector<std::string> dirs;
+  const auto app = base::cli::make_app("focussing --aux-index", "focussing --aux-index DESDIR AUXDIR...",
+                                       "Index the ASA_INS/ASA_XCA/ASA_XCH products of the archives AUXDIR (searched\n"
+                                       "recursively) by validity, into the job's description folder DESDIR.");
+  app->add_option("DESDIR", desDir, "description folder that receives the index");
+  base::cli::shown_as(app->add_option("AUXDIR", dirs, "archive folder of auxiliary products"), "AUXDIR...");
+  const auto parsed = base::cli::parse(*app, std::vector<std::string>(argv, argv + std::max(argc, 0)));
+  if (parsed.help) {
+    std::fputs(app->help().c_str(), stdout);
+    return 0;
   }
-  const std::vector<std::string> dirs(argv + 1, argv + argc);
+  std::string error = parsed.error;
+  if (error.empty() && (desDir.empty() || dirs.empty())) error = "needs a description folder and at least one archive";
+  if (!error.empty()) return refuse("--aux-index", error);
   const auto entries = scan_aux_products(dirs);
-  write_aux_index(entries, slash(fs::absolute(argv[0])));
-  std::printf("%zu auxiliary products indexed in %s%s\n", entries.size(), slash(fs::absolute(argv[0])).c_str(),
+  write_aux_index(entries, slash(fs::absolute(desDir)));
+  std::printf("%zu auxiliary products indexed in %s%s\n", entries.size(), slash(fs::absolute(desDir)).c_str(),
               std::string(kAuxIndexFile).c_str());
   return 0;
 }
 
 int setup_main(int argc, char** argv) {
-  if (argc < 1) {
-    std::fprintf(stderr, "usage: focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--data DIR] [--aux DIR]... [--trace] "
-                         "[--arg N=VALUE]...\n");
-    return 2;
-  }
   SetupRequest req;
-  req.dir = argv[0];
+  std::vector<std::string> jobArguments;
+  const auto app = base::cli::make_app(
+      "focussing --setup", "focussing --setup DIR [--mode IM|AP|WS|RS|WSS] [--data DIR] [--aux DIR]... [--trace] [--arg N=VALUE]...",
+      "Lay out a working directory for one job run by hand: the configuration file, a description\n"
+      "folder with the shipped parameter files and catalogues, the working file and the job list.");
+  app->add_option("DIR", req.dir, "working directory to create");
+  base::cli::shown_as(app->add_option("--mode", req.mode, "the job's mode (default IM)")
+                          ->check(base::cli::one_of({"IM", "AP", "WS", "RS", "WSS"})),
+                      "MODE");
+  base::cli::shown_as(app->add_option("--data", req.dataDir, "shipped data folder (default: the build's own)"), "DIR");
+  base::cli::shown_as(app->add_option("--aux", req.auxDirs,
+                                      "archive of ASA_INS/ASA_XCA/ASA_XCH products to index (default: the\n"
+                                      "shipped index)")
+                          ->allow_extra_args(false),
+                      "DIR");
+  app->add_flag("--trace", req.tracing, "trace the job (Vanterra.trace)");
+  base::cli::shown_as(app->add_option("--arg", jobArguments,
+                                      "job argument N of the list (0 to " + std::to_string(kMinJobArguments - 1) +
+                                          "); the others are NotOK or defaults")
+                          ->check(job_argument())
+                          ->allow_extra_args(false),
+                      "N=VALUE");
+  const auto parsed = base::cli::parse(*app, std::vector<std::string>(argv, argv + std::max(argc, 0)));
+  if (parsed.help) {
+    std::fputs(app->help().c_str(), stdout);
+    return 0;
+  }
+  std::string error = parsed.error;
+  if (error.empty() && req.dir.empty()) error = "no working directory given";
+  if (!error.empty()) return refuse("--setup", error);
+  for (const std::string& a : jobArguments) {
+    const auto eq = a.find('=');
+    const auto n = static_cast<std::size_t>(std::stoi(a.substr(0, eq)));
+    if (req.arguments.size() <= n) req.arguments.resize(n + 1);
+    req.arguments[n] = a.substr(eq + 1);
+  }
   try {
-    for (int i = 1; i < argc; ++i) {
-      const std::string a = argv[i];
-      auto value = [&]() -> std::string {
-        if (i + 1 >= argc) throw std::invalid_argument(a + " needs a value");
-        return argv[++i];
-      };
-      if (a == "--mode") {
-        req.mode = value();
-      } else if (a == "--data") {
-        req.dataDir = value();
-      } else if (a == "--aux") {
-        req.auxDirs.push_back(value());
-      } else if (a == "--trace") {
-        req.tracing = true;
-      } else if (a == "--arg") {
-        const std::string v = value();
-        const auto eq = v.find('=');
-        if (eq == std::string::npos) throw std::invalid_argument("--arg takes N=VALUE");
-        const int n = std::stoi(v.substr(0, eq));
-        if (n < 0 || n >= static_cast<int>(kMinJobArguments)) throw std::invalid_argument("--arg index 0..13");
-        if (req.arguments.size() <= static_cast<std::size_t>(n)) req.arguments.resize(static_cast<std::size_t>(n) + 1);
-        req.arguments[static_cast<std::size_t>(n)] = v.substr(eq + 1);
-      } else {
-        throw std::invalid_argument("unknown option " + a);
-      }
-    }
     const std::string list = setup_working_dir(req);
     const std::string dir = fs::absolute(req.dir).string();
     std::printf("Working directory laid out in %s\n", dir.c_str());

@@ -13,12 +13,15 @@
 #include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <sstream>
 #include <stdexcept>
 #include <thread>
 
+#include "base/command_line.hpp"
 #include "base/errors.hpp"
 #include "base/run_services.hpp"
 #include "jobs/batch.hpp"
@@ -63,6 +66,24 @@ std::vector<std::string> image_stems(std::string_view mode, const std::string& p
     // Not an AP product: the job itself will say so.
   }
   return stems;
+}
+
+// The modes as the overview lists them, one a line.
+std::string mode_list() {
+  std::string list;
+  for (const auto& m : kModes) {
+    const std::string name = m.name;
+    list += "  " + name + std::string(name.size() < 6 ? 6 - name.size() : 1, ' ') + m.title + "\n";
+  }
+  return list;
+}
+
+// "im, ap, ws, rs or wss".
+std::string mode_names() {
+  std::string names;
+  for (std::size_t i = 0; i < std::size(kModes); ++i)
+    names += std::string(i == 0 ? "" : i + 1 == std::size(kModes) ? " or " : ", ") + kModes[i].name;
+  return names;
 }
 
 // Log text of a stage that this build does not hold.
@@ -333,7 +354,7 @@ struct Prepared {
 // directory laid out. An outcome is returned when nothing is to be run.
 std::optional<StandaloneOutcome> prepare(const StandaloneRequest& req, Prepared& p) {
   p.mode = find_mode(req.mode);
-  if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (im, ap, ws, rs or wss)");
+  if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (" + mode_names() + ")");
   if (!req.multilook.empty() && req.mode != "im" && req.mode != "ap")
     return bad_request("--multilook is for the stripmap modes im and ap");
   if (req.multilook.empty() && req.mode != "wss" && (req.groundRange || req.groundStep > 0.0))
@@ -646,84 +667,130 @@ StandaloneOutcome run_standalone(const StandaloneRequest& req, const std::string
 
 // ------------------------------------------------------------------------- command line
 
+namespace {
+
+constexpr long long kMaxCount = 1000000;
+
+// "WxH" with both sides whole numbers from 1.
+CLI::Validator size_text() {
+  return CLI::Validator(
+      [](std::string& text) -> std::string {
+        const auto x = text.find('x');
+        std::string w = text.substr(0, x), h = x == std::string::npos ? "" : text.substr(x + 1);
+        if (x == std::string::npos || !base::cli::whole_number(1, kMaxCount)(w).empty() ||
+            !base::cli::whole_number(1, kMaxCount)(h).empty())
+          return "takes WxH, two whole numbers from 1, not '" + text + "'";
+        return {};
+      },
+      "WxH");
+}
+
+CLI::Validator key_value() {
+  return CLI::Validator(
+      [](std::string& text) -> std::string {
+        return text.find('=') == std::string::npos ? "takes KEY=VALUE, not '" + text + "'" : std::string();
+      },
+      "KEY=VALUE");
+}
+
+CLI::Validator looks_text() {
+  return CLI::Validator(
+      [](std::string& text) -> std::string {
+        StripLooksChoice looks;
+        return parse_looks(text, looks);
+      },
+      "AZxRG");
+}
+
+const char* kOutputs =
+    "Outputs: OUT/<product>_slc (the SLC), <product>_slc_hdr (its annotation), .sml, .hdr, .vrt,\n"
+    "and <product>_slc.tif (the quick-look); with --multilook also <product>_pwr or _gr (float\n"
+    "amplitude) with its .hdr, .vrt, _hdr and .sml. Work files, the log (Vanterra.log) and the error\n"
+    "record (Vanterra.working_error) stay in OUT/.sarfocus/<product>/; after a successful run the\n"
+    "marker sarfocus.complete there lists the outputs. The last line says what was written, or\n"
+    "the error with its code and the log's path.\n";
+
+// The command line of one mode; `req` receives what it parses.
+std::unique_ptr<CLI::App> mode_app(const ModeRow& mode, StandaloneRequest& req) {
+  auto app = base::cli::make_app("sarfocus " + std::string(mode.name),
+                                 "sarfocus " + std::string(mode.name) + " PRODUCT [options]");
+  app->add_option("PRODUCT", req.product,
+                  std::string(mode.title) + (mode.orbit ? "" : "\n(this mode takes no orbit file: --orbit is ignored)"));
+  add_standalone_options(*app, req);
+  app->footer(kOutputs);
+  app->allow_extras();  // refused below, in words that name the product
+  return app;
+}
+
+}  // namespace
+
+void add_standalone_options(CLI::App& app, StandaloneRequest& req) {
+  using base::cli::shown_as;
+  shown_as(app.add_option("--orbit", req.orbit,
+                          "orbit file, or a folder to choose the covering one from (by header:\n"
+                          "DOR_VOR before DOR_POR, AUX_FPO, AUX_FRO, then the newest issue)"),
+           "FILE|DIR");
+  shown_as(app.add_option("--aux", req.auxDir,
+                          "folder of ASA_INS/ASA_XCA/ASA_XCH products, chosen by validity\n"
+                          "(default: the shipped index data/ASA_AUX_list.dat)"),
+           "DIR");
+  shown_as(app.add_option("--out", req.outDir,
+                          "output folder (default: .); work files go to DIR/.sarfocus/<product>/"),
+           "DIR");
+  // The quick-look options act in the order given: the last one counts.
+  shown_as(app.add_option_function<std::string>(
+                   "--quicklook",
+                   [&req](const std::string& v) {
+                     const auto x = v.find('x');
+                     req.quickLookWidth = std::stoi(v.substr(0, x));
+                     req.quickLookHeight = std::stoi(v.substr(x + 1));
+                     req.quickLook = true;
+                   },
+                   "quick-look GeoTIFF size (default 1024x1024)")
+               ->check(size_text())
+               ->trigger_on_parse(),
+           "WxH");
+  app.add_flag_callback("--no-quicklook", [&req] { req.quickLook = false; }, "no quick-look")->trigger_on_parse();
+  shown_as(app.add_option("--threads", req.threads, "worker threads of the job (default: all cores)")
+               ->check(base::cli::whole_number(1, kMaxCount)),
+           "N");
+  shown_as(app.add_option("--param", req.params,
+                          "override a processing parameter (Section.Key=VALUE when ambiguous)")
+               ->check(key_value())
+               ->allow_extra_args(false),
+           "KEY=VALUE");
+  shown_as(app.add_option("--params", req.paramsFile,
+                          "override parameters from a file of [Section] and Key = Value lines"),
+           "FILE");
+  app.add_flag("--trace", req.tracing, "keep a trace of the run in the work folder");
+  shown_as(app.add_option("--multilook", req.multilook,
+                          "also a detected multilooked image, AZ lines by RG samples a look\n"
+                          "(auto: the looks the annotation suggests); im and ap")
+               ->check(looks_text()),
+           "AZxRG");
+  app.add_flag("--ground-range", req.groundRange,
+               "the multilooked image in ground range (<product>_gr, else _pwr);\n"
+               "wss: its image in ground range");
+  shown_as(app.add_option_function<int>(
+                   "--ground-step", [&req](int step) { req.groundStep = step; },
+                   "its ground step in metres (default: the looked slant cells' mean)")
+               ->check(base::cli::whole_number(1, kMaxCount)),
+           "M");
+  app.add_flag("--skip-complete", req.skipComplete, "do nothing when an earlier run's outputs are complete");
+}
+
 std::string parse_standalone_options(const std::vector<std::string>& args, std::size_t first,
                                      StandaloneRequest& req, bool& help) {
-  help = false;
-  auto whole_int = [](const std::string& text, int lo, const std::string& what, int& out) -> std::string {
-    std::size_t used = 0;
-    long v = 0;
-    try {
-      v = std::stol(text, &used);
-    } catch (const std::exception&) {
-      used = 0;
-    }
-    if (used == 0 || used != text.size() || v < lo || v > 1000000) return what + " takes a whole number, not '" + text + "'";
-    out = static_cast<int>(v);
-    return {};
-  };
-  for (std::size_t i = first; i < args.size(); ++i) {
-    std::string a = args[i];
-    std::optional<std::string> inlineValue;
-    if (a.rfind("--", 0) == 0)
-      if (const auto eq = a.find('='); eq != std::string::npos) {
-        inlineValue = a.substr(eq + 1);
-        a = a.substr(0, eq);
-      }
-    std::string missing;
-    auto value = [&]() -> std::string {
-      if (inlineValue) return *inlineValue;
-      if (i + 1 >= args.size()) {
-        missing = a + " needs a value";
-        return {};
-      }
-      return args[++i];
-    };
-    std::string error;
-    if (a == "--orbit") req.orbit = value();
-    else if (a == "--aux") req.auxDir = value();
-    else if (a == "--out") req.outDir = value();
-    else if (a == "--threads") {
-      const std::string v = value();
-      if (missing.empty()) error = whole_int(v, 1, "--threads", req.threads);
-    } else if (a == "--param") {
-      const std::string v = value();
-      if (missing.empty() && v.find('=') == std::string::npos) error = "--param takes KEY=VALUE, not '" + v + "'";
-      req.params.push_back(v);
-    } else if (a == "--params") req.paramsFile = value();
-    else if (a == "--multilook") {
-      const std::string v = value();
-      StripLooksChoice looks;
-      if (missing.empty()) error = parse_looks(v, looks);
-      req.multilook = v;
-    } else if (a == "--ground-range") req.groundRange = true;
-    else if (a == "--ground-step") {
-      int step = 0;
-      const std::string v = value();
-      if (missing.empty()) error = whole_int(v, 1, "--ground-step", step);
-      req.groundStep = step;
-    } else if (a == "--trace") req.tracing = true;
-    else if (a == "--skip-complete") req.skipComplete = true;
-    else if (a == "--no-quicklook") req.quickLook = false;
-    else if (a == "--quicklook") {
-      const std::string v = value();
-      const auto x = v.find('x');
-      if (missing.empty()) {
-        if (x == std::string::npos) error = "--quicklook takes WxH, not '" + v + "'";
-        else if (error = whole_int(v.substr(0, x), 1, "--quicklook", req.quickLookWidth); error.empty())
-          error = whole_int(v.substr(x + 1), 1, "--quicklook", req.quickLookHeight);
-        req.quickLook = true;
-      }
-    } else if (a == "--help" || a == "-h") {
-      help = true;
-    } else if (!a.empty() && a[0] == '-' && a != "-") {
-      error = "unknown option " + a;
-    } else if (req.product.empty()) {
-      req.product = a;
-    } else {
-      error = "one product only (" + req.product + " and " + a + "); sarfocus batch takes many";
-    }
-    if (!missing.empty()) return missing;
-    if (!error.empty()) return error;
+  const ModeRow* mode = find_mode(req.mode);
+  if (!mode) mode = &kModes[0];
+  const auto app = mode_app(*mode, req);
+  const auto parsed = base::cli::parse(
+      *app, std::vector<std::string>(args.begin() + static_cast<std::ptrdiff_t>(std::min(first, args.size())), args.end()));
+  help = parsed.help;
+  if (!parsed.error.empty()) return parsed.error;
+  for (const auto& word : parsed.extras) {
+    if (!word.empty() && word[0] == '-' && word != "-") return "unknown option " + word;
+    return "one product only (" + req.product + " and " + word + "); sarfocus batch takes many";
   }
   return {};
 }
@@ -752,87 +819,22 @@ std::vector<std::string> standalone_options(const StandaloneRequest& req) {
 
 namespace {
 
-const char* kOverview =
-    "usage: sarfocus MODE PRODUCT [options]   focus one product\n"
-    "       sarfocus batch LIST|DIR [options] focus many products, or emit a Slurm or GNU parallel job\n"
-    "       sarfocus help [MODE|batch]        help on a command (also: sarfocus MODE --help)\n"
-    "       sarfocus --version                the engine's version text\n"
-    "\n"
-    "MODE is the acquisition mode of the product:\n"
-    "  im    ENVISAT ASAR image mode level 0 (ASA_IM__0P)\n"
-    "  ap    ENVISAT ASAR alternating polarisation level 0 (ASA_AP__0P)\n"
-    "  ws    ENVISAT ASAR wide swath level 0 (ASA_WS__0P)\n"
-    "  rs    RADARSAT-1 CEOS raw product\n"
-    "  wss   ENVISAT ASAR wide swath single-look level 1 (ASA_WSS_1P), multilooked\n"
-    "\n"
-    "sarfocus lays out the host's files for each product in OUT/.sarfocus/<product>/, runs the\n"
-    "engine's host entry `focussing` there, and moves the products into OUT once the job has\n"
-    "succeeded. A mode whose processing chain this build does not hold yet says so.\n"
-    "\n"
-    "Exit status: 0 done (or skipped as complete), 2 bad command line or inputs, 3 mode not built\n"
-    "yet, otherwise the failed job's own status. Run `sarfocus im --help` for the options.\n";
-
-const char* kModeOptions =
-    "options:\n"
-    "  --orbit FILE|DIR     orbit file, or a folder to choose the covering one from (by header:\n"
-    "                       DOR_VOR before DOR_POR, AUX_FPO, AUX_FRO, then the newest issue)\n"
-    "  --aux DIR            folder of ASA_INS/ASA_XCA/ASA_XCH products, chosen by validity\n"
-    "                       (default: the shipped index data/ASA_AUX_list.dat)\n"
-    "  --out DIR            output folder (default: .); work files go to DIR/.sarfocus/<product>/\n"
-    "  --quicklook WxH      quick-look GeoTIFF size (default 1024x1024)\n"
-    "  --no-quicklook       no quick-look\n"
-    "  --threads N          worker threads of the job (default: all cores)\n"
-    "  --param KEY=VALUE    override a processing parameter (Section.Key=VALUE when ambiguous)\n"
-    "  --params FILE        override parameters from a file of [Section] and Key = Value lines\n"
-    "  --trace              keep a trace of the run in the work folder\n"
-    "  --multilook AZxRG    also a detected multilooked image, AZ lines by RG samples a look\n"
-    "                       (auto: the looks the annotation suggests); im and ap\n"
-    "  --ground-range       the multilooked image in ground range (<product>_gr, else _pwr);\n"
-    "                       wss: its image in ground range\n"
-    "  --ground-step M      its ground step in metres (default: the looked slant cells' mean)\n"
-    "  --skip-complete      do nothing when an earlier run's outputs are complete\n"
-    "  --help               this text\n"
-    "\n"
-    "Outputs: OUT/<product>_slc (the SLC), <product>_slc_hdr (its annotation), .sml, .hdr, .vrt,\n"
-    "and <product>_slc.tif (the quick-look); with --multilook also <product>_pwr or _gr (float\n"
-    "amplitude) with its .hdr, .vrt, _hdr and .sml. Work files, the log (Vanterra.log) and the error\n"
-    "record (Vanterra.working_error) stay in OUT/.sarfocus/<product>/; after a successful run the\n"
-    "marker sarfocus.complete there lists the outputs. The last line says what was written, or\n"
-    "the error with its code and the log's path.\n";
-
-const char* kBatchHelp =
-    "usage: sarfocus batch LIST|DIR [--mode MODE] [--jobs N] [--force] [MODE options]\n"
-    "       sarfocus batch LIST|DIR --emit slurm [--slurm-option TEXT]... [--job-name NAME] [options]\n"
-    "       sarfocus batch LIST|DIR --emit parallel [--sshlogin LOGIN]... [options]\n"
-    "\n"
-    "Focus many products, each in its own working directory OUT/.sarfocus/<product>/, as\n"
-    "`sarfocus MODE PRODUCT` would. LIST is a text file of product paths, one a line (blank lines\n"
-    "and lines starting with # are skipped; relative paths are taken from the list's folder);\n"
-    "DIR gives its *.N1 files. A failed product never stops the others.\n"
-    "\n"
-    "  --mode MODE          im (default), ap, ws, rs or wss\n"
-    "  --jobs N             products run at a time (default 1); with --emit slurm the array's\n"
-    "                       throttle, with --emit parallel the jobs a host\n"
-    "  --force              run products again whose outputs are complete\n"
-    "  --emit slurm         print a Slurm array job script instead of running: one array task a\n"
-    "                       product, each running `sarfocus MODE PRODUCT ... --skip-complete`;\n"
-    "                       submit it with sbatch; task logs go to OUT/.sarfocus/slurm-*.out\n"
-    "  --slurm-option TEXT  an #SBATCH line of the script, e.g. --slurm-option --partition=short\n"
-    "  --job-name NAME      the Slurm job name (default sarfocus)\n"
-    "  --emit parallel      print a GNU parallel command line instead of running\n"
-    "  --sshlogin LOGIN     spread the parallel jobs over hosts (GNU parallel's --sshlogin, e.g.\n"
-    "                       4/node1,4/node2,: where : is this machine); the paths must be the same\n"
-    "                       on every host\n"
-    "  MODE options         --orbit, --aux, --out, --quicklook, --no-quicklook, --threads, --param,\n"
-    "                       --params, --trace (see sarfocus im --help); --threads defaults to the\n"
-    "                       cores divided by --jobs\n"
-    "\n"
-    "A local run ends with a table of product, status, time and output (the SLC, or the error\n"
-    "text). A product counts as complete, and is skipped on the next run, when its marker\n"
-    "OUT/.sarfocus/<product>/sarfocus.complete stands (written last by a successful run) and the\n"
-    "SLC, its _slc_hdr annotation and, when asked for, the quick-look are there with the sizes it\n"
-    "records. Exit status: 0 when every product is done or skipped, 1 when any failed, 2 for a\n"
-    "bad command line or inputs.\n";
+std::string overview() {
+  return "usage: sarfocus MODE PRODUCT [options]   focus one product\n"
+         "       sarfocus batch LIST|DIR [options] focus many products, or emit a Slurm or GNU parallel job\n"
+         "       sarfocus help [MODE|batch]        help on a command (also: sarfocus MODE --help)\n"
+         "       sarfocus --version                the engine's version text\n"
+         "\n"
+         "MODE is the acquisition mode of the product:\n" +
+         mode_list() +
+         "\n"
+         "sarfocus lays out the host's files for each product in OUT/.sarfocus/<product>/, runs the\n"
+         "engine's host entry `focussing` there, and moves the products into OUT once the job has\n"
+         "succeeded. A mode whose processing chain this build does not hold yet says so.\n"
+         "\n"
+         "Exit status: 0 done (or skipped as complete), 2 bad command line or inputs, 3 mode not built\n"
+         "yet, otherwise the failed job's own status. Run `sarfocus im --help` for the options.\n";
+}
 
 std::string self_dir() {
   std::error_code ec;
@@ -843,17 +845,17 @@ std::string self_dir() {
 }  // namespace
 
 std::string sarfocus_help(std::string_view topic) {
-  if (topic.empty()) return kOverview;
-  if (topic == "batch") return kBatchHelp;
+  if (topic.empty()) return overview();
+  if (topic == "batch") return batch_help();
   const ModeRow* m = find_mode(topic);
   if (!m) return {};
-  return "usage: sarfocus " + std::string(m->name) + " PRODUCT [options]\n  PRODUCT    " + m->title + "\n" +
-         (m->orbit ? "" : "  (this mode takes no orbit file: --orbit is ignored)\n") + kModeOptions;
+  StandaloneRequest unused;
+  return mode_app(*m, unused)->help();
 }
 
 int sarfocus_run(const std::vector<std::string>& args, const SarfocusTools& tools, std::FILE* out, std::FILE* err) {
   if (args.empty()) {
-    std::fputs(kOverview, err);
+    std::fputs(overview().c_str(), err);
     return kExitBadRequest;
   }
   const std::string& first = args[0];
@@ -861,7 +863,7 @@ int sarfocus_run(const std::vector<std::string>& args, const SarfocusTools& tool
     const std::string topic = first == "help" && args.size() > 1 ? args[1] : "";
     const std::string text = sarfocus_help(topic);
     if (text.empty()) {
-      std::fprintf(err, "sarfocus: no help on '%s' (modes im, ap, ws, rs, wss; batch)\n", topic.c_str());
+      std::fprintf(err, "sarfocus: no help on '%s' (modes %s; batch)\n", topic.c_str(), mode_names().c_str());
       return kExitBadRequest;
     }
     std::fputs(text.c_str(), out);
@@ -873,8 +875,8 @@ int sarfocus_run(const std::vector<std::string>& args, const SarfocusTools& tool
   }
   if (first == "batch") return batch_main(args, 1, tools, out, err);
   if (!known_mode(first)) {
-    std::fprintf(err, "sarfocus: unknown mode '%s' (im, ap, ws, rs, wss or batch); see sarfocus --help\n",
-                 first.c_str());
+    std::fprintf(err, "sarfocus: unknown mode '%s' (%s or batch); see sarfocus --help\n", first.c_str(),
+                 mode_names().c_str());
     return kExitBadRequest;
   }
   StandaloneRequest req;

@@ -13,6 +13,10 @@
 #include <string_view>
 #include <vector>
 
+namespace CLI {
+class App;
+}
+
 namespace sar::jobs {
 
 struct StandaloneRequest {
@@ -94,6 +98,10 @@ bool known_mode(std::string_view mode);
 /// on success; `help` is set when --help was given.
 std::string parse_standalone_options(const std::vector<std::string>& args, std::size_t first,
                                      StandaloneRequest& request, bool& help);
+
+/// Adds the options of `sarfocus MODE PRODUCT` (all but the product) to a command line that
+/// fills `request`: the modes and `sarfocus batch` share them.
+void add_standalone_options(CLI::App& app, StandaloneRequest& request);
 
 /// The options that reproduce `request` on a command line (without mode and product).
 std::vector<std::string> standalone_options(const StandaloneRequest& request);

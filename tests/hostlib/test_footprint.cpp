@@ -235,6 +235,13 @@ TEST_F(FootprintFiles, CompanionsCarryTheCornersInTheRightSense) {
       for (auto& p : continuous) p[0] = kml[0][0] + std::remainder(p[0] - kml[0][0], 360.0);
       EXPECT_GT(twice_area(continuous), 0.0);
       EXPECT_EQ(xpath(slc + ".kml", "//k:Placemark/k:name"), std::vector<std::string>{"R_slc"});
+      EXPECT_EQ(xpath(slc + ".kml", "/k:kml/k:Document/k:name"), std::vector<std::string>{"R_slc"});
+      // The placemark's style is the document's one style: a red outline over a faint red fill.
+      EXPECT_EQ(xpath(slc + ".kml", "//k:Placemark/k:styleUrl"), std::vector<std::string>{"#footprint"});
+      EXPECT_EQ(xpath(slc + ".kml", "//k:Style/@id"), std::vector<std::string>{"footprint"});
+      EXPECT_EQ(xpath(slc + ".kml", "//k:Style/k:LineStyle/k:color"), std::vector<std::string>{"ff0000ff"});
+      EXPECT_EQ(xpath(slc + ".kml", "//k:Style/k:PolyStyle/k:color"), std::vector<std::string>{"400000ff"});
+      EXPECT_EQ(xpath(slc + ".kml", "//k:Placemark/k:Polygon/k:tessellate"), std::vector<std::string>{"1"});
       EXPECT_EQ(xpath(slc + ".kml", "//k:TimeStamp/k:when"), std::vector<std::string>{"2004-03-12T10:11:12.123456Z"});
       const auto description = xpath(slc + ".kml", "//k:Placemark/k:description");
       ASSERT_TRUE(description && description->size() == 1);
@@ -295,6 +302,13 @@ TEST_F(FootprintFiles, EscapesTheProductNameInEveryForm) {
   EXPECT_EQ(xpath(slc + ".kml", "//k:Placemark/k:name"), std::vector<std::string>{shown});
   EXPECT_EQ(xpath(slc + ".xml", "/SceneFootprint/@Product"), std::vector<std::string>{shown});
   EXPECT_EQ(slurp(slc + ".dbf").substr(32 * 8 + 2, shown.size()), shown);
+
+  // The KML writer wraps markup in a CDATA section, which a "]]>" in the name would end early.
+  const std::string cdata = product("cdata", "x]]>y&_slc");
+  write_description(cdata, other_info(kScenes[0]), true);
+  ASSERT_EQ(write_footprint(cdata, kFootprintAllFiles), 0);
+  EXPECT_EQ(xpath(cdata + ".kml", "//k:Placemark/k:name"), std::vector<std::string>{"x]]?y&_slc"});
+  EXPECT_EQ(xpath(cdata + ".xml", "/SceneFootprint/@Product"), std::vector<std::string>{"x]]>y&_slc"});
 }
 
 TEST_F(FootprintFiles, RefusalsLeaveNothingBehind) {

@@ -1,13 +1,16 @@
 // Quick-look rendering: size, grey levels, no-data, failure paths, and geographic tie points
-// as libtiff and (when installed) GDAL read them.
-#include <geotiff/xtiffio.h>
+// as GDAL's library and (when installed) its gdalinfo read them.
+#include <gdal.h>
 #include <gtest/gtest.h>
+#include <ogr_srs_api.h>
 #include <unistd.h>
 
 #include <cmath>
 #include <cstdio>
 #include <filesystem>
+#include <iterator>
 #include <limits>
+#include <string>
 #include <vector>
 
 #include "hostlib/quicklook.hpp"
@@ -20,25 +23,35 @@ namespace {
 struct Image {
   int width = 0, height = 0;
   std::vector<uint8_t> pixels;
-  std::vector<double> ties;
+  std::vector<GDAL_GCP> gcps;  // pixel, line and lon/lat only: the texts are not kept
+  std::string compression, gcpSrs;
+  int hasNoData = 0;
+  double noData = -1.0;
   uint8_t at(int x, int y) const { return pixels[static_cast<std::size_t>(y) * width + x]; }
 };
 
 Image read_tiff(const std::string& path) {
+  GDALAllRegister();
   Image img;
-  TIFF* t = XTIFFOpen(path.c_str(), "r");
-  if (!t) return img;
-  uint32_t w = 0, h = 0;
-  TIFFGetField(t, TIFFTAG_IMAGEWIDTH, &w);
-  TIFFGetField(t, TIFFTAG_IMAGELENGTH, &h);
-  img.width = static_cast<int>(w);
-  img.height = static_cast<int>(h);
-  img.pixels.resize(static_cast<std::size_t>(w) * h);
-  for (uint32_t y = 0; y < h; ++y) TIFFReadScanline(t, img.pixels.data() + y * w, y, 0);
-  uint16_t n = 0;
-  double* ties = nullptr;
-  if (TIFFGetField(t, TIFFTAG_GEOTIEPOINTS, &n, &ties)) img.ties.assign(ties, ties + n);
-  XTIFFClose(t);
+  GDALDatasetH ds = GDALOpen(path.c_str(), GA_ReadOnly);
+  if (!ds) return img;
+  img.width = GDALGetRasterXSize(ds);
+  img.height = GDALGetRasterYSize(ds);
+  img.pixels.resize(static_cast<std::size_t>(img.width) * img.height);
+  GDALRasterBandH band = GDALGetRasterBand(ds, 1);
+  if (GDALGetRasterCount(ds) != 1 || GDALGetRasterDataType(band) != GDT_Byte ||
+      GDALRasterIO(band, GF_Read, 0, 0, img.width, img.height, img.pixels.data(), img.width, img.height, GDT_Byte, 0,
+                   0) != CE_None)
+    img.pixels.clear();
+  img.noData = GDALGetRasterNoDataValue(band, &img.hasNoData);
+  if (const char* c = GDALGetMetadataItem(ds, "COMPRESSION", "IMAGE_STRUCTURE")) img.compression = c;
+  const GDAL_GCP* g = GDALGetGCPs(ds);
+  for (int i = 0; i < GDALGetGCPCount(ds); ++i)
+    img.gcps.push_back({nullptr, nullptr, g[i].dfGCPPixel, g[i].dfGCPLine, g[i].dfGCPX, g[i].dfGCPY, g[i].dfGCPZ});
+  if (OGRSpatialReferenceH srs = GDALGetGCPSpatialRef(ds)) {
+    if (const char* name = OSRGetName(srs)) img.gcpSrs = name;
+  }
+  GDALClose(ds);
   return img;
 }
 
@@ -105,13 +118,27 @@ TEST_F(QuickLook, GreyLevelsFollowTheMedianAndBrightTargetsSaturate) {
   EXPECT_EQ(img.at(29, 55), 64);    // just left of it
   EXPECT_EQ(img.at(10, 97), 0);     // no data
 
-  ASSERT_EQ(img.ties.size(), 24u);
-  EXPECT_DOUBLE_EQ(img.ties[3], 10.0);   // near-early longitude at pixel (0, 0)
-  EXPECT_DOUBLE_EQ(img.ties[4], 45.0);
-  EXPECT_DOUBLE_EQ(img.ties[18], 150.0);  // far-late at the outer corner (w, h)
-  EXPECT_DOUBLE_EQ(img.ties[19], 100.0);
-  EXPECT_DOUBLE_EQ(img.ties[21], 10.7);
-  EXPECT_DOUBLE_EQ(img.ties[22], 44.3);
+  EXPECT_EQ(img.compression, "DEFLATE");
+  EXPECT_EQ(img.hasNoData, 1);
+  EXPECT_EQ(img.noData, 0.0);
+  EXPECT_EQ(img.gcpSrs, "WGS 84");
+  // The four outer pixel corners in the order near-early, far-early, near-late, far-late.
+  ASSERT_EQ(img.gcps.size(), 4u);
+  const double expected[4][4] = {{0, 0, 10.0, 45.0}, {150, 0, 10.9, 45.1}, {0, 100, 9.8, 44.2}, {150, 100, 10.7, 44.3}};
+  for (std::size_t k = 0; k < 4; ++k) {
+    EXPECT_DOUBLE_EQ(img.gcps[k].dfGCPPixel, expected[k][0]) << k;
+    EXPECT_DOUBLE_EQ(img.gcps[k].dfGCPLine, expected[k][1]) << k;
+    EXPECT_DOUBLE_EQ(img.gcps[k].dfGCPX, expected[k][2]) << k;
+    EXPECT_DOUBLE_EQ(img.gcps[k].dfGCPY, expected[k][3]) << k;
+  }
+  // Nothing beside the image: every tag went into the TIFF itself.
+  EXPECT_EQ(std::distance(fs::directory_iterator(dir_), fs::directory_iterator()), 1);
+
+  // Without georeferencing, no tie points and no coordinate system.
+  r.georeferenced = false;
+  ASSERT_EQ(write_quicklook_geotiff(out, 200, 300, scene, r), 0);
+  EXPECT_TRUE(read_tiff(out).gcps.empty());
+  r.georeferenced = true;
 
   // Twice the scale doubles the background grey.
   r.scale = 2.0;

@@ -24,18 +24,13 @@ std::vector<std::string> common_args(const fs::path& in, const fs::path& out) {
   return a;
 }
 
-// File name to bytes, for the files of the output folder itself. The description names its
-// schema by a path inside the output folder's working folders; that path is the one difference
-// the folder may make, so the folder's own path is replaced by a mark.
+// File name to bytes, for the files of the output folder itself. Nothing in a product names the
+// folder it was written in, so the bytes are compared as they are.
 std::map<std::string, std::string> products_in(const fs::path& out) {
   std::map<std::string, std::string> files;
-  const std::string folder = out.string();
   for (const auto& e : fs::directory_iterator(out)) {
     if (!e.is_regular_file()) continue;
-    std::string bytes = slurp(e.path());
-    for (auto at = bytes.find(folder); at != std::string::npos; at = bytes.find(folder, at))
-      bytes.replace(at, folder.size(), "<OUT>");
-    files[e.path().filename().string()] = std::move(bytes);
+    files[e.path().filename().string()] = slurp(e.path());
   }
   return files;
 }

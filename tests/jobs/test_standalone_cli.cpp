@@ -64,6 +64,21 @@ TEST(SarfocusCli, OptionsRoundTripAndBadOnesAreNamed) {
   EXPECT_EQ(parse_standalone_options({"x.N1", "--out=/o2", "--no-quicklook"}, 0, other, help), "");
   EXPECT_EQ(other.outDir, "/o2");
   EXPECT_FALSE(other.quickLook);
+  // The quick-look options count in the order given; a repeated option keeps its last value.
+  StandaloneRequest order;
+  EXPECT_EQ(parse_standalone_options({"x.N1", "--quicklook", "300x200", "--no-quicklook", "--out", "/a", "--out=/b"}, 0,
+                                     order, help),
+            "");
+  EXPECT_FALSE(order.quickLook);
+  EXPECT_EQ(order.outDir, "/b");
+  order = {};
+  EXPECT_EQ(parse_standalone_options({"--no-quicklook", "--quicklook=30x20", "x.N1"}, 0, order, help), "");
+  EXPECT_TRUE(order.quickLook);
+  EXPECT_EQ(order.quickLookWidth, 30);
+  EXPECT_EQ(order.quickLookHeight, 20);
+  EXPECT_EQ(order.product, "x.N1");
+  EXPECT_EQ(parse_standalone_options({"x.N1", "--help"}, 0, order, help), "");
+  EXPECT_TRUE(help);
 
   const std::vector<std::pair<std::vector<std::string>, std::string>> bad = {
       {{"--threads", "0"}, "--threads"},      {{"--threads", "2x"}, "--threads"},

@@ -628,8 +628,10 @@ TEST_F(Analyser, CommandRefusesBadInputsWithAMessage) {
       {{}, 2, "no raster given"},
       {{raster}, 2, "nothing to measure"},
       {{raster, "--bogus"}, 2, "unknown option --bogus"},
-      {{raster, "--target", "10"}, 2, "--target needs LINE,SAMPLE"},
-      {{raster, "--target", "1,2", "--oversample", "8"}, 2, "--oversample needs a whole number from 16"},
+      {{raster, "--target", "10"}, 2, "--target takes LINE,SAMPLE, not '10'"},
+      {{raster, "--target", "1,2", "--oversample", "8"}, 2, "--oversample takes a whole number from 16"},
+      {{raster, "--target", "1,2", "--cell-type", "NOSUCH"}, 2, "--cell-type takes a cell type name"},
+      {{raster, "--target", "1,2", "--byte-order", "big"}, 2, "--byte-order takes LSBFirst or MSBFirst"},
       {{raster, "--target", "1,2", "--islr-span", "0.5"}, 2, "--islr-span"},
       {{raster, "--target", "1,2", "--json"}, 2, "--json needs a value"},
       {{raster, raster, "--profiles"}, 2, "more than one raster"},
@@ -652,7 +654,21 @@ TEST_F(Analyser, CommandRefusesBadInputsWithAMessage) {
     for (const std::string& a : c.args) line += a + " ";
     EXPECT_EQ(run(c.args, out, err), c.status) << line << err;
     EXPECT_NE(err.find(c.message), std::string::npos) << line << "\n" << err;
+    // A refused command is one line that points to the help.
+    if (c.status == 2) {
+      EXPECT_EQ(err.find('\n'), err.size() - 1) << err;
+      EXPECT_NE(err.find("; see sarirf --help"), std::string::npos) << err;
+    }
   }
+  // The help names every option.
+  std::string out;
+  std::string err;
+  ASSERT_EQ(run({"--help"}, out, err), 0);
+  for (const char* option : {"--target", "--targets", "--truth", "--first-line", "--first-sample", "--offset", "--lines",
+                             "--samples", "--byte-order", "--cell-type", "--header-offset", "--row-prefix",
+                             "--azimuth-spacing", "--range-spacing", "--oversample", "--search", "--neighbourhood",
+                             "--cut", "--max-cut", "--islr-span", "--profiles", "--json", "--plot", "Exit status"})
+    EXPECT_NE(out.find(option), std::string::npos) << option;
 }
 
 TEST_F(Analyser, PowerProfilesAverageColumnsAndLines) {

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <limits>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 #include <vector>
@@ -11,24 +12,24 @@
 #include "analyser/irf.hpp"
 #include "analyser/report.hpp"
 #include "analyser/targets.hpp"
+#include "base/command_line.hpp"
 #include "io/cell_types.hpp"
 
 namespace sar::analyser {
 
 namespace {
 
-constexpr const char* kUsage =
-    "usage: sarirf RASTER [--target LINE,SAMPLE]... [--targets FILE] [--truth FILE]\n"
-    "              [--first-line L] [--first-sample S] [--offset DLINE,DSAMPLE]\n"
-    "              [--lines N] [--samples M] [--byte-order LSBFirst|MSBFirst] [--cell-type NAME]\n"
-    "              [--header-offset BYTES] [--row-prefix BYTES]\n"
-    "              [--azimuth-spacing M] [--range-spacing M]\n"
-    "              [--oversample N] [--search N] [--neighbourhood N] [--cut N] [--max-cut N]\n"
-    "              [--islr-span R] [--profiles] [--json FILE] [--plot PREFIX]\n"
+constexpr const char* kUsage = "sarirf RASTER [--target LINE,SAMPLE]... [--targets FILE] [--truth FILE] [options]";
+
+constexpr const char* kAbout =
     "Measures point targets (peak, -3 dB resolution, PSLR, ISLR, phase) of a complex raster and\n"
     "its mean power profiles. The raster's layout comes from RASTER.hdr unless --lines or\n"
     "--samples is given. Expected positions are mapped to the image by\n"
-    "image = given - first + offset.\n";
+    "image = given - first + offset.";
+
+constexpr const char* kExit =
+    "Exit status: 0 when the analysis ran (targets that could not be measured are listed as\n"
+    "such), 1 when an input cannot be read or an output cannot be written, 2 for a bad command.\n";
 
 struct UsageError : std::runtime_error {
   using std::runtime_error::runtime_error;
@@ -49,101 +50,151 @@ struct Command {
   bool help = false;
 };
 
-double number_of(const std::string& option, const std::string& text) {
-  double v = 0.0;
-  if (!parse_number(text, v)) throw UsageError(option + " needs a number, not \"" + text + "\"");
-  return v;
+// "LINE,SAMPLE" as parse_position reads it.
+CLI::Validator position(const std::string& form) {
+  return CLI::Validator(
+      [form](std::string& text) -> std::string {
+        double a = 0.0, b = 0.0;
+        return parse_position(text, a, b) ? std::string() : "takes " + form + ", not '" + text + "'";
+      },
+      form);
 }
 
-long long integer_of(const std::string& option, const std::string& text, long long lo, long long hi) {
-  const double v = number_of(option, text);
-  if (v != std::floor(v) || v < static_cast<double>(lo) || v > static_cast<double>(hi)) {
-    throw UsageError(option + " needs a whole number from " + std::to_string(lo) + " to " + std::to_string(hi));
-  }
-  return static_cast<long long>(v);
+// The command line; `c` receives what it parses.
+std::unique_ptr<CLI::App> command_line(Command& c, std::vector<std::string>& positions,
+                                       std::vector<std::string>& offsets) {
+  namespace cli = base::cli;
+  using cli::shown_as;
+  constexpr long long kIntMax = std::numeric_limits<std::int32_t>::max();
+  auto app = cli::make_app("sarirf", kUsage, kAbout);
+  app->add_option("RASTER", c.raster, "complex raster to analyse");
+  shown_as(app->add_option("--target", positions, "expected position of a target, repeatable")
+               ->check(position("LINE,SAMPLE"))
+               ->allow_extra_args(false),
+           "LINE,SAMPLE");
+  shown_as(app->add_option("--targets", c.target_lists, "a file of targets, LINE SAMPLE [NAME] a line; repeatable")
+               ->allow_extra_args(false),
+           "FILE");
+  shown_as(app->add_option_function<std::string>("--truth", [&c](const std::string& v) { c.truth = v; },
+                                                 "the simulator's truth file: its targets and range spacing"),
+           "FILE");
+  shown_as(app->add_option_function<double>("--first-line", [&c](double v) { c.mapping.line_offset -= v; },
+                                            "where the image starts in the given lines (image = given - L + offset)")
+               ->check(cli::real_number()),
+           "L");
+  shown_as(app->add_option_function<double>("--first-sample", [&c](double v) { c.mapping.sample_offset -= v; },
+                                            "where the image starts in the given samples")
+               ->check(cli::real_number()),
+           "S");
+  shown_as(app->add_option("--offset", offsets, "added to every expected position")
+               ->check(position("DLINE,DSAMPLE"))
+               ->allow_extra_args(false),
+           "DLINE,DSAMPLE");
+  shown_as(app->add_option_function<std::int32_t>("--lines", [&c](std::int32_t v) { c.layout.lines = v; },
+                                                  "lines of the raster (instead of its header)")
+               ->check(cli::whole_number(1, kIntMax)),
+           "N");
+  shown_as(app->add_option_function<std::int32_t>("--samples", [&c](std::int32_t v) { c.layout.samples = v; },
+                                                  "samples of a line (instead of its header)")
+               ->check(cli::whole_number(1, kIntMax)),
+           "M");
+  shown_as(app->add_option_function<std::string>(
+                   "--byte-order", [&c](const std::string& v) { c.layout.byte_order = io::byte_order_from_name(v); },
+                   "byte order of the cells")
+               ->check(cli::one_of({"LSBFirst", "MSBFirst"})),
+           "LSBFirst|MSBFirst");
+  shown_as(app->add_option_function<std::string>(
+                   "--cell-type",
+                   [&c](const std::string& v) { c.layout.cell_type = io::cell_type_from_name(v); },
+                   "cell type name of the raster header")
+               ->check(CLI::Validator(
+                   [](std::string& v) -> std::string {
+                     return io::cell_type_from_name(v) < 0 ? "takes a cell type name, not '" + v + "'" : std::string();
+                   },
+                   "NAME")),
+           "NAME");
+  shown_as(app->add_option_function<std::int64_t>(
+                   "--header-offset", [&c](std::int64_t v) { c.layout.header_offset = v; },
+                   "bytes before the first line")
+               ->check(cli::whole_number(0, std::numeric_limits<std::int64_t>::max() / 2)),
+           "BYTES");
+  shown_as(app->add_option_function<std::int32_t>("--row-prefix", [&c](std::int32_t v) { c.layout.row_prefix = v; },
+                                                  "bytes before each line")
+               ->check(cli::whole_number(0, kIntMax)),
+           "BYTES");
+  shown_as(app->add_option("--azimuth-spacing", c.spacing.azimuth_m, "metres between lines")->check(cli::real_number()),
+           "M");
+  shown_as(app->add_option("--range-spacing", c.spacing.range_m, "metres between samples")->check(cli::real_number()),
+           "M");
+  shown_as(app->add_option("--oversample", c.options.oversample, "oversampling factor of the cuts (default 16)")
+               ->check(cli::whole_number(16, 256)),
+           "N");
+  shown_as(app->add_option("--search", c.options.search_radius,
+                           "the peak is sought within N samples of the expected position (default 8)")
+               ->check(cli::whole_number(0, 4096)),
+           "N");
+  shown_as(app->add_option("--neighbourhood", c.options.neighbourhood,
+                           "side of the neighbourhood oversampled to find the peak (default 32)")
+               ->check(cli::whole_number(8, 256)),
+           "N");
+  shown_as(app->add_option("--cut", c.options.cut_length, "first window of a cut (default 128)")
+               ->check(cli::whole_number(8, 65536)),
+           "N");
+  shown_as(app->add_option("--max-cut", c.options.max_cut_length,
+                           "a cut's window grows up to this for the sidelobes (default 1024)")
+               ->check(cli::whole_number(8, 65536)),
+           "N");
+  shown_as(app->add_option("--islr-span", c.options.islr_span,
+                           "half width of the ISLR's sidelobe region, in resolutions (above 1,\n"
+                           "default 10)")
+               ->check(CLI::Validator(
+                   [](std::string& v) -> std::string {
+                     double span = 0.0;
+                     return parse_number(v, span) && span > 1.0 && span <= 1000.0
+                                ? std::string()
+                                : "takes a number of resolutions above 1, not '" + v + "'";
+                   },
+                   "R")),
+           "R");
+  app->add_flag("--profiles", c.profiles, "also the mean power profiles in azimuth and range");
+  shown_as(app->add_option_function<std::string>("--json", [&c](const std::string& v) { c.json = v; },
+                                                 "write the report as JSON"),
+           "FILE");
+  shown_as(app->add_option_function<std::string>("--plot", [&c](const std::string& v) { c.plot = v; },
+                                                 "write the cuts and profiles as data, a gnuplot script and PNGs"),
+           "PREFIX");
+  app->footer(kExit);
+  app->allow_extras();  // refused in parse(), in words that name the raster
+  return app;
 }
 
-Command parse(std::span<const std::string> args) {
+Command parse(std::span<const std::string> args, std::string* help) {
   Command c;
-  for (std::size_t i = 0; i < args.size(); ++i) {
-    const std::string& a = args[i];
-    const auto next = [&]() -> const std::string& {
-      if (i + 1 >= args.size()) throw UsageError(a + " needs a value");
-      return args[++i];
-    };
-    constexpr long long kIntMax = std::numeric_limits<std::int32_t>::max();
-    if (a == "--help" || a == "-h") {
-      c.help = true;
-    } else if (a == "--target") {
-      ExpectedTarget t;
-      if (!parse_position(next(), t.line, t.sample)) throw UsageError("--target needs LINE,SAMPLE");
-      t.name = "target_" + std::to_string(c.targets.size() + 1);
-      c.targets.push_back(t);
-    } else if (a == "--targets") {
-      c.target_lists.push_back(next());
-    } else if (a == "--truth") {
-      c.truth = next();
-    } else if (a == "--first-line") {
-      c.mapping.line_offset -= number_of(a, next());
-    } else if (a == "--first-sample") {
-      c.mapping.sample_offset -= number_of(a, next());
-    } else if (a == "--offset") {
-      double dl = 0.0;
-      double ds = 0.0;
-      if (!parse_position(next(), dl, ds)) throw UsageError("--offset needs DLINE,DSAMPLE");
-      c.mapping.line_offset += dl;
-      c.mapping.sample_offset += ds;
-    } else if (a == "--lines") {
-      c.layout.lines = static_cast<std::int32_t>(integer_of(a, next(), 1, kIntMax));
-    } else if (a == "--samples") {
-      c.layout.samples = static_cast<std::int32_t>(integer_of(a, next(), 1, kIntMax));
-    } else if (a == "--byte-order") {
-      const std::string& v = next();
-      if (v != "LSBFirst" && v != "MSBFirst") throw UsageError("--byte-order is LSBFirst or MSBFirst");
-      c.layout.byte_order = io::byte_order_from_name(v);
-    } else if (a == "--cell-type") {
-      const std::string& v = next();
-      const std::int32_t type = io::cell_type_from_name(v);
-      if (type < 0) throw UsageError("unknown cell type \"" + v + "\"");
-      c.layout.cell_type = type;
-    } else if (a == "--header-offset") {
-      c.layout.header_offset = integer_of(a, next(), 0, std::numeric_limits<std::int64_t>::max() / 2);
-    } else if (a == "--row-prefix") {
-      c.layout.row_prefix = static_cast<std::int32_t>(integer_of(a, next(), 0, kIntMax));
-    } else if (a == "--azimuth-spacing") {
-      c.spacing.azimuth_m = number_of(a, next());
-    } else if (a == "--range-spacing") {
-      c.spacing.range_m = number_of(a, next());
-    } else if (a == "--oversample") {
-      c.options.oversample = static_cast<int>(integer_of(a, next(), 16, 256));
-    } else if (a == "--search") {
-      c.options.search_radius = static_cast<int>(integer_of(a, next(), 0, 4096));
-    } else if (a == "--neighbourhood") {
-      c.options.neighbourhood = static_cast<int>(integer_of(a, next(), 8, 256));
-    } else if (a == "--cut") {
-      c.options.cut_length = static_cast<int>(integer_of(a, next(), 8, 65536));
-    } else if (a == "--max-cut") {
-      c.options.max_cut_length = static_cast<int>(integer_of(a, next(), 8, 65536));
-    } else if (a == "--islr-span") {
-      c.options.islr_span = number_of(a, next());
-      if (!(c.options.islr_span > 1.0 && c.options.islr_span <= 1000.0)) {
-        throw UsageError("--islr-span needs a number of resolutions above 1");
-      }
-    } else if (a == "--profiles") {
-      c.profiles = true;
-    } else if (a == "--json") {
-      c.json = next();
-    } else if (a == "--plot") {
-      c.plot = next();
-    } else if (!a.empty() && a[0] == '-') {
-      throw UsageError("unknown option " + a);
-    } else if (c.raster.empty()) {
-      c.raster = a;
-    } else {
-      throw UsageError("more than one raster: " + c.raster + ", " + a);
-    }
+  std::vector<std::string> positions, offsets;
+  const auto app = command_line(c, positions, offsets);
+  const base::cli::Parsed parsed = base::cli::parse(*app, std::vector<std::string>(args.begin(), args.end()));
+  if (parsed.help) {
+    c.help = true;
+    *help = app->help();
+    return c;
   }
-  if (c.help) return c;
+  if (!parsed.error.empty()) throw UsageError(parsed.error);
+  for (const std::string& extra : parsed.extras) {
+    if (!extra.empty() && extra[0] == '-') throw UsageError("unknown option " + extra);
+    throw UsageError("more than one raster: " + c.raster + ", " + extra);
+  }
+  for (const std::string& p : positions) {
+    ExpectedTarget t;
+    parse_position(p, t.line, t.sample);
+    t.name = "target_" + std::to_string(c.targets.size() + 1);
+    c.targets.push_back(t);
+  }
+  for (const std::string& o : offsets) {
+    double dl = 0.0, ds = 0.0;
+    parse_position(o, dl, ds);
+    c.mapping.line_offset += dl;
+    c.mapping.sample_offset += ds;
+  }
   if (c.raster.empty()) throw UsageError("no raster given");
   if (c.targets.empty() && c.target_lists.empty() && !c.truth && !c.profiles) {
     throw UsageError("nothing to measure: give targets (--target, --targets, --truth) or --profiles");
@@ -176,14 +227,15 @@ IrfMeasure measure_in_raster(RasterReader& reader, const ExpectedTarget& t, cons
 
 int run_sarirf(std::span<const std::string> args, std::ostream& out, std::ostream& err) {
   Command c;
+  std::string help;
   try {
-    c = parse(args);
+    c = parse(args, &help);
   } catch (const UsageError& e) {
-    err << "sarirf: " << e.what() << '\n' << kUsage;
+    err << "sarirf: " << e.what() << "; see sarirf --help\n";
     return 2;
   }
   if (c.help) {
-    out << kUsage;
+    out << help;
     return 0;
   }
   try {

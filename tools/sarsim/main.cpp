@@ -26,30 +26,14 @@
 //
 // Faults: lost, corrupt-header, mode-id, seq-wrap, swst-change, truncated.
 #include <cstdio>
-#include <cstdlib>
 #include <exception>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
+#include "base/command_line.hpp"
 #include "simulator/simulator.hpp"
 
 namespace {
-
-void usage() {
-  std::fputs(
-      "usage: sarsim --out DIR [--mode im|apc|aph|apv|ws] [--block-echoes L]\n"
-      "              [--lines N] [--samples M] [--target LAT,LON,H,AMP]... [--noise DB]\n"
-      "              [--fault lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated]...\n"
-      "              [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S] [--first-counter C]\n"
-      "              [--ins-template FILE] [--xca-template FILE] [--no-aux]\n"
-      "              [--yaw-steering on|off] [--squint-hz F] [--yaw-bias-deg D]\n"
-      "              [--clutter-db DB] [--clutter-contrast low|high]\n"
-      "       sarsim wss --out DIR [--orbit FILE] [--time T] [--samples N] [--bursts K] [--burst-lines L]\n"
-      "              [--cycle-lines C] [--target SWATH,LINE,SAMPLE,AMP]... [--seed S]\n"
-      "              [--fault truncated|drop-swath=D]   (an ASA_WSS_1P level 1 product)\n",
-      stderr);
-}
 
 // Real products the auxiliary files are copied from, unless the command line names others.
 const char* const kInsTemplate =
@@ -57,29 +41,8 @@ const char* const kInsTemplate =
 const char* const kXcaTemplate =
     SARSIM_REAL_DATA_DIR "/ASA_XCA_AX/ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000";
 
-double number(const std::string& text, const char* what) {
-  char* end = nullptr;
-  const double v = std::strtod(text.c_str(), &end);
-  if (text.empty() || end == nullptr || *end != '\0') throw std::invalid_argument(std::string("bad ") + what + ": " + text);
-  return v;
-}
-
-sar::simulator::Target parse_target(const std::string& text) {
-  std::vector<std::string> parts;
-  std::size_t start = 0;
-  while (true) {
-    const std::size_t comma = text.find(',', start);
-    parts.push_back(text.substr(start, comma - start));
-    if (comma == std::string::npos) break;
-    start = comma + 1;
-  }
-  if (parts.size() != 4) throw std::invalid_argument("a target is LAT,LON,H,AMP: " + text);
-  sar::simulator::Target t;
-  t.position = {number(parts[0], "latitude"), number(parts[1], "longitude"), number(parts[2], "height")};
-  t.amplitude = number(parts[3], "amplitude");
-  if (t.position.lat_deg < -90.0 || t.position.lat_deg > 90.0) throw std::invalid_argument("latitude out of range");
-  return t;
-}
+constexpr double kPi = 3.14159265358979323846;
+constexpr long long kMaxCount = 100000000;
 
 }  // namespace
 
@@ -90,80 +53,129 @@ int main(int argc, char** argv) {
     return wss_main(argc - 1, argv + 1,
                     std::string(SARSIM_REAL_DATA_DIR) +
                         "/DOR_VOR_AX/DOR_VOR_AXVF-P20080331_075200_20080301_215527_20080303_002327");
+  namespace cli = sar::base::cli;
   sar::simulator::SimulationConfig config;
   config.ins_template = kInsTemplate;
   config.xca_template = kXcaTemplate;
-  bool have_out = false;
+  std::string mode = "im", yawSteering, contrast = "low";
+  std::vector<std::string> targets, faults;
+  double squintHz = 0.0, yawBiasDeg = 0.0;
+  bool noAux = false;
+
+  const auto app = cli::make_app(
+      "sarsim",
+      "sarsim --out DIR [--mode im|apc|aph|apv|ws] [options]\n"
+      "       sarsim wss --out DIR [options]   (an ASA_WSS_1P level 1 product; sarsim wss --help)",
+      "A simulated ENVISAT ASAR level 0 product of point targets, its DOR_VOR orbit file, the matching\n"
+      "ASA_INS and ASA_XCA products and a truth file; their paths are printed, one a line.");
+  cli::shown_as(app->add_option("--out", config.out_dir, "output folder (required)")->required(), "DIR");
+  cli::shown_as(app->add_option("--mode", mode,
+                                "acquisition: image mode (default), alternating polarisation (apc, aph,\n"
+                                "apv) or wide swath; AP and WS products start with their noise and\n"
+                                "calibration packets (210 in AP, 525 in WS), a WS cycle is about 360")
+                    ->check(cli::one_of({"im", "apc", "aph", "apv", "ws"})),
+                "MODE");
+  app->add_flag("--ap-archive-name", config.ap.generic_name,
+                "AP: name the product ASA_AP__0P with SPH mode letters AP_, as the archive does, so that only the "
+                "packets tell the sub-mode");
+  cli::shown_as(app->add_option("--block-echoes", config.ap.block_echoes,
+                                "AP block length (default: the ASA_INS template's value for the beam)")
+                    ->check(cli::whole_number(1, kMaxCount)),
+                "L");
+  cli::shown_as(app->add_option("--lines", config.lines, "packets of the stream (default 512)")
+                    ->check(cli::whole_number(1, kMaxCount)),
+                "N");
+  cli::shown_as(app->add_option("--samples", config.samples, "complex samples of an echo line (default 1024)")
+                    ->check(cli::whole_number(1, kMaxCount)),
+                "M");
+  cli::shown_as(app->add_option("--target", targets,
+                                "a point target, degrees, metres and amplitude (default one at\n"
+                                "45,10,0,30)")
+                    ->check(cli::number_list(4, "LAT,LON,H,AMP"))
+                    ->allow_extra_args(false),
+                "LAT,LON,H,AMP");
+  cli::shown_as(app->add_option("--noise", config.noise_db,
+                                "noise power of a complex sample, dB re 1 count^2 (default 20;\n"
+                                "below -100: none)")
+                    ->check(cli::real_number()),
+                "DB");
+  cli::shown_as(app->add_option("--fault", faults, "a fault of the stream, repeatable")
+                    ->check(cli::one_of({"lost", "corrupt-header", "mode-id", "seq-wrap", "swst-change", "truncated",
+                                         "swapped-polarisation"}))
+                    ->allow_extra_args(false),
+                "lost|corrupt-header|mode-id|seq-wrap|swst-change|truncated|swapped-polarisation");
+  cli::shown_as(app->add_option("--time", config.scene_time,
+                                "zero-Doppler time of the first target (default 02-MAR-2008 10:00:00.000000)"),
+                "\"dd-MMM-yyyy hh:mm:ss.uuuuuu\"");
+  app->add_flag("--ascending", config.ascending, "an ascending pass (default descending)");
+  cli::shown_as(app->add_option("--seed", config.seed, "random seed (default 1)")->check(cli::whole_number(0, kMaxCount)),
+                "S");
+  cli::shown_as(app->add_option("--first-counter", config.first_counter, "the first packet's sequence counter")
+                    ->check(cli::whole_number(-1, kMaxCount)),
+                "C");
+  cli::shown_as(app->add_option("--ins-template", config.ins_template,
+                                "ASA_INS product to patch (default: the sample archive's)"),
+                "FILE");
+  cli::shown_as(app->add_option("--xca-template", config.xca_template,
+                                "ASA_XCA product to patch (default: the sample archive's)"),
+                "FILE");
+  app->add_flag("--no-aux", noAux, "write neither ASA_INS nor ASA_XCA");
+  cli::shown_as(app->add_option("--yaw-steering", yawSteering,
+                                "ENVISAT's yaw steering law (default off: the beam is steered to\n"
+                                "zero Doppler)")
+                    ->check(cli::one_of({"on", "off"})),
+                "on|off");
+  auto* squint = app->add_option("--squint-hz", squintHz,
+                                 "the squint that puts the Doppler centroid at F Hz at the scene centre")
+                     ->check(cli::real_number());
+  cli::shown_as(squint, "F");
+  cli::shown_as(app->add_option("--yaw-bias-deg", yawBiasDeg, "a yaw bias, degrees")->check(cli::real_number()), "D");
+  cli::shown_as(app->add_option("--clutter-db", config.clutter.power_db,
+                                "distributed clutter of this mean power (dB re 1 count^2 a raw\n"
+                                "sample, before the receive gain) with the beam's centroid")
+                    ->check(cli::real_number()),
+                "DB");
+  cli::shown_as(app->add_option("--clutter-contrast", contrast,
+                                "a homogeneous scene (low, the default) or one of texture, bright\n"
+                                "points and a land/water edge (high)")
+                    ->check(cli::one_of({"low", "high"})),
+                "low|high");
+
+  const cli::Parsed parsed = cli::parse(*app, argc, argv);
+  if (parsed.help) {
+    std::fputs(app->help().c_str(), stdout);
+    return 0;
+  }
+  if (!parsed.error.empty()) {
+    std::fprintf(stderr, "sarsim: %s; see sarsim --help\n", parsed.error.c_str());
+    return 2;
+  }
   try {
-    for (int i = 1; i < argc; ++i) {
-      const std::string arg = argv[i];
-      auto value = [&]() -> std::string {
-        if (i + 1 >= argc) throw std::invalid_argument("missing value after " + arg);
-        return argv[++i];
-      };
-      if (arg == "--out") {
-        config.out_dir = value();
-        have_out = true;
-      } else if (arg == "--mode") {
-        config.mode = sar::simulator::mode_from_name(value());
-      } else if (arg == "--block-echoes") {
-        config.ap.block_echoes = static_cast<int>(number(value(), "block echoes"));
-      } else if (arg == "--lines") {
-        config.lines = static_cast<int>(number(value(), "line count"));
-      } else if (arg == "--samples") {
-        config.samples = static_cast<int>(number(value(), "sample count"));
-      } else if (arg == "--target") {
-        config.targets.push_back(parse_target(value()));
-      } else if (arg == "--noise") {
-        config.noise_db = number(value(), "noise level");
-      } else if (arg == "--fault") {
-        config.faults.push_back(sar::simulator::fault_from_name(value()));
-      } else if (arg == "--time") {
-        config.scene_time = value();
-      } else if (arg == "--ascending") {
-        config.ascending = true;
-      } else if (arg == "--seed") {
-        config.seed = static_cast<uint64_t>(number(value(), "seed"));
-      } else if (arg == "--first-counter") {
-        config.first_counter = static_cast<int>(number(value(), "counter"));
-      } else if (arg == "--ins-template") {
-        config.ins_template = value();
-      } else if (arg == "--xca-template") {
-        config.xca_template = value();
-      } else if (arg == "--no-aux") {
-        config.ins_template.clear();
-        config.xca_template.clear();
-      } else if (arg == "--yaw-steering") {
-        const std::string v = value();
-        if (v != "on" && v != "off") throw std::invalid_argument("--yaw-steering is on or off: " + v);
-        config.attitude.yaw_steering = v == "on";
-      } else if (arg == "--squint-hz") {
-        config.centroid_hz = number(value(), "Doppler centroid");
-      } else if (arg == "--yaw-bias-deg") {
-        config.attitude.yaw_bias_rad = number(value(), "yaw bias") * 3.14159265358979323846 / 180.0;
-      } else if (arg == "--clutter-db") {
-        config.clutter.power_db = number(value(), "clutter power");
-      } else if (arg == "--clutter-contrast") {
-        config.clutter.contrast = sar::simulator::clutter_contrast_from_name(value());
-      } else if (arg == "--help" || arg == "-h") {
-        usage();
-        return 0;
-      } else {
-        throw std::invalid_argument("unknown option " + arg);
+    config.mode = sar::simulator::mode_from_name(mode);
+    for (const auto& f : faults) config.faults.push_back(sar::simulator::fault_from_name(f));
+    for (const auto& t : targets) {
+      const std::vector<double> v = cli::numbers_of(t);
+      if (v[0] < -90.0 || v[0] > 90.0) {
+        std::fprintf(stderr, "sarsim: --target latitude out of range: %s; see sarsim --help\n", t.c_str());
+        return 2;
       }
+      config.targets.push_back({{v[0], v[1], v[2]}, v[3]});
     }
-    if (!have_out) throw std::invalid_argument("--out is required");
     if (config.targets.empty()) config.targets.push_back({{45.0, 10.0, 0.0}, 30.0});
+    if (noAux) {
+      config.ins_template.clear();
+      config.xca_template.clear();
+    }
+    if (!yawSteering.empty()) config.attitude.yaw_steering = yawSteering == "on";
+    if (squint->count() > 0) config.centroid_hz = squintHz;
+    config.attitude.yaw_bias_rad = yawBiasDeg * kPi / 180.0;
+    config.clutter.contrast = sar::simulator::clutter_contrast_from_name(contrast);
     const sar::simulator::SimulationTruth truth = sar::simulator::run_simulation(config);
     std::printf("%s\n%s\n", truth.level0_path.c_str(), truth.orbit_path.c_str());
     if (!truth.ins_path.empty()) std::printf("%s\n", truth.ins_path.c_str());
     if (!truth.xca_path.empty()) std::printf("%s\n", truth.xca_path.c_str());
     std::printf("%s\n", truth.truth_path.c_str());
     return 0;
-  } catch (const std::invalid_argument& e) {
-    std::fprintf(stderr, "sarsim: %s\n", e.what());
-    usage();
-    return 2;
   } catch (const std::exception& e) {
     std::fprintf(stderr, "sarsim: %s\n", e.what());
     return 1;

@@ -11,42 +11,40 @@
 // The lines are centred on the first target's beam-centre crossing; with the unsteered beam
 // of RADARSAT-1 its zero-Doppler time lies seconds away, outside the raw lines. --samples is a
 // multiple of 8.
+#include <cmath>
 #include <cstdio>
-#include <cstdlib>
 #include <exception>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
+#include "base/command_line.hpp"
 #include "simulator/rsat_product.hpp"
 
 namespace {
 
-void usage() {
-  std::fputs(
-      "usage: sarsim-rs --out DIR [--beam F1|S3] [--lines N] [--samples M] [--target LAT,LON,H,AMP]...\n"
-      "                 [--noise DB] [--time \"dd-MMM-yyyy hh:mm:ss.uuuuuu\"] [--ascending] [--seed S]\n"
-      "                 [--replica-every K] [--gap LINE,COUNT] [--swst-change LINE,COUNTS]\n"
-      "                 [--attenuation-step LINE,DB] [--repeated-index LINE]\n"
-      "                 [--clutter-db DB] [--clutter-contrast low|high]\n",
-      stderr);
+namespace cli = sar::base::cli;
+
+constexpr long long kMaxCount = 100000000;
+
+// Two whole numbers separated by a comma, as "LINE,COUNT".
+CLI::Validator whole_pair(const std::string& form) {
+  return CLI::Validator(
+      [form](std::string& text) -> std::string {
+        const std::vector<double> v = cli::numbers_of(text);
+        const auto whole = [](double x) { return std::fabs(x) <= kMaxCount && x == std::floor(x); };
+        return v.size() == 2 && whole(v[0]) && whole(v[1]) ? std::string()
+                                                           : "takes " + form + ", two whole numbers, not '" + text + "'";
+      },
+      form);
 }
 
-std::vector<double> numbers(const std::string& text, std::size_t count, const char* what) {
-  std::vector<double> out;
-  std::size_t start = 0;
-  while (true) {
-    const std::size_t comma = text.find(',', start);
-    const std::string part = text.substr(start, comma - start);
-    char* end = nullptr;
-    const double v = std::strtod(part.c_str(), &end);
-    if (part.empty() || *end != '\0') throw std::invalid_argument(std::string("bad ") + what + ": " + text);
-    out.push_back(v);
-    if (comma == std::string::npos) break;
-    start = comma + 1;
-  }
-  if (out.size() != count) throw std::invalid_argument(std::string("bad ") + what + ": " + text);
-  return out;
+// Sets `first` and `second` from a text `whole_pair` accepted.
+auto pair_into(int& first, int& second) {
+  return [&first, &second](const std::string& text) {
+    const std::vector<double> v = cli::numbers_of(text);
+    first = static_cast<int>(v[0]);
+    second = static_cast<int>(v[1]);
+  };
 }
 
 }  // namespace
@@ -54,71 +52,85 @@ std::vector<double> numbers(const std::string& text, std::size_t count, const ch
 int main(int argc, char** argv) {
   sar::simulator::rsat::RsatConfig c;
   c.targets.clear();
-  bool haveOut = false;
-  try {
-    for (int i = 1; i < argc; ++i) {
-      const std::string arg = argv[i];
-      auto value = [&]() -> std::string {
-        if (i + 1 >= argc) throw std::invalid_argument("missing value after " + arg);
-        return argv[++i];
-      };
-      auto integer = [&](const char* what) { return static_cast<int>(numbers(value(), 1, what)[0]); };
-      if (arg == "--out") {
-        c.out_dir = value();
-        haveOut = true;
-      } else if (arg == "--beam") {
-        c.beam = value();
-      } else if (arg == "--lines") {
-        c.lines = integer("line count");
-      } else if (arg == "--samples") {
-        c.samples = integer("sample count");
-      } else if (arg == "--target") {
-        const auto v = numbers(value(), 4, "target (LAT,LON,H,AMP)");
-        c.targets.push_back({{v[0], v[1], v[2]}, v[3]});
-      } else if (arg == "--noise") {
-        c.noise_db = numbers(value(), 1, "noise")[0];
-      } else if (arg == "--time") {
-        c.scene_time = value();
-      } else if (arg == "--ascending") {
-        c.ascending = true;
-      } else if (arg == "--seed") {
-        c.seed = static_cast<uint64_t>(integer("seed"));
-      } else if (arg == "--replica-every") {
-        c.replica_every = integer("replica spacing");
-      } else if (arg == "--gap") {
-        const auto v = numbers(value(), 2, "gap (LINE,COUNT)");
-        c.gap_line = static_cast<int>(v[0]);
-        c.gap_length = static_cast<int>(v[1]);
-      } else if (arg == "--swst-change") {
-        const auto v = numbers(value(), 2, "SWST change (LINE,COUNTS)");
-        c.swst_change_line = static_cast<int>(v[0]);
-        c.swst_change_counts = static_cast<int>(v[1]);
-      } else if (arg == "--attenuation-step") {
-        const auto v = numbers(value(), 2, "attenuation step (LINE,DB)");
-        c.attenuation_step_line = static_cast<int>(v[0]);
-        c.attenuation_step_db = static_cast<int>(v[1]);
-      } else if (arg == "--clutter-db") {
-        c.clutter.power_db = numbers(value(), 1, "clutter power")[0];
-      } else if (arg == "--clutter-contrast") {
-        c.clutter.contrast = sar::simulator::clutter_contrast_from_name(value());
-      } else if (arg == "--repeated-index") {
-        c.repeated_index_line = integer("line");
-      } else if (arg == "--help" || arg == "-h") {
-        usage();
-        return 0;
-      } else {
-        throw std::invalid_argument("unknown option " + arg);
-      }
-    }
-    if (!haveOut) throw std::invalid_argument("--out is required");
-    if (c.targets.empty()) c.targets.push_back({{45.0, 10.0, 0.0}, 4.0});
-    (void)sar::simulator::rsat::beam_setup(c.beam);
-  } catch (const std::invalid_argument& e) {
-    std::fprintf(stderr, "sarsim-rs: %s\n", e.what());
-    usage();
+  std::vector<std::string> targets;
+  std::string contrast = "low";
+
+  const auto app = cli::make_app(
+      "sarsim-rs", "sarsim-rs --out DIR [options]",
+      "A simulated RADARSAT-1 CEOS raw product of point targets: the leader lea_01.001, the data file\n"
+      "dat_01.001 and truth.txt, whose paths are printed, one a line. The lines are centred on the\n"
+      "first target's beam-centre crossing.");
+  cli::shown_as(app->add_option("--out", c.out_dir, "output folder (required)")->required(), "DIR");
+  cli::shown_as(app->add_option("--beam", c.beam, "beam (default F1)")->check(cli::one_of({"F1", "S3"})), "F1|S3");
+  cli::shown_as(app->add_option("--lines", c.lines, "raw lines (default 2048)")->check(cli::whole_number(1, kMaxCount)),
+                "N");
+  cli::shown_as(app->add_option("--samples", c.samples, "samples of a line, a multiple of 8 (default 1024)")
+                    ->check(cli::whole_number(8, kMaxCount)),
+                "M");
+  cli::shown_as(app->add_option("--target", targets,
+                                "a point target, degrees, metres and amplitude (default one at\n"
+                                "45,10,0,4)")
+                    ->check(cli::number_list(4, "LAT,LON,H,AMP"))
+                    ->allow_extra_args(false),
+                "LAT,LON,H,AMP");
+  cli::shown_as(app->add_option("--noise", c.noise_db,
+                                "power of a complex sample before quantisation, dB re 1 (default 3)")
+                    ->check(cli::real_number()),
+                "DB");
+  cli::shown_as(app->add_option("--time", c.scene_time,
+                                "beam-centre crossing of the first target (default\n"
+                                "10-OCT-2001 14:30:00.000000)"),
+                "\"dd-MMM-yyyy hh:mm:ss.uuuuuu\"");
+  app->add_flag("--ascending", c.ascending, "an ascending pass (default descending)");
+  cli::shown_as(app->add_option("--seed", c.seed, "random seed (default 7)")->check(cli::whole_number(0, kMaxCount)),
+                "S");
+  cli::shown_as(app->add_option("--replica-every", c.replica_every, "a replica on every K-th line (default 64)")
+                    ->check(cli::whole_number(1, kMaxCount)),
+                "K");
+  cli::shown_as(app->add_option_function<std::string>("--gap", pair_into(c.gap_line, c.gap_length),
+                                                      "the records of COUNT lines from LINE missing")
+                    ->check(whole_pair("LINE,COUNT")),
+                "LINE,COUNT");
+  cli::shown_as(app->add_option_function<std::string>("--swst-change",
+                                                      pair_into(c.swst_change_line, c.swst_change_counts),
+                                                      "the sampling window start grows by COUNTS from LINE")
+                    ->check(whole_pair("LINE,COUNTS")),
+                "LINE,COUNTS");
+  cli::shown_as(app->add_option_function<std::string>("--attenuation-step",
+                                                      pair_into(c.attenuation_step_line, c.attenuation_step_db),
+                                                      "the receiver attenuation grows by DB from LINE")
+                    ->check(whole_pair("LINE,DB")),
+                "LINE,DB");
+  cli::shown_as(app->add_option("--repeated-index", c.repeated_index_line,
+                                "this line's record carries the index of the one before")
+                    ->check(cli::whole_number(0, kMaxCount)),
+                "LINE");
+  cli::shown_as(app->add_option("--clutter-db", c.clutter.power_db, "distributed clutter of this mean power, dB")
+                    ->check(cli::real_number()),
+                "DB");
+  cli::shown_as(app->add_option("--clutter-contrast", contrast,
+                                "a homogeneous scene (low, the default) or one of texture, bright\n"
+                                "points and a land/water edge (high)")
+                    ->check(cli::one_of({"low", "high"})),
+                "low|high");
+
+  const cli::Parsed parsed = cli::parse(*app, argc, argv);
+  if (parsed.help) {
+    std::fputs(app->help().c_str(), stdout);
+    return 0;
+  }
+  if (!parsed.error.empty()) {
+    std::fprintf(stderr, "sarsim-rs: %s; see sarsim-rs --help\n", parsed.error.c_str());
     return 2;
   }
   try {
+    for (const auto& t : targets) {
+      const std::vector<double> v = cli::numbers_of(t);
+      c.targets.push_back({{v[0], v[1], v[2]}, v[3]});
+    }
+    if (c.targets.empty()) c.targets.push_back({{45.0, 10.0, 0.0}, 4.0});
+    c.clutter.contrast = sar::simulator::clutter_contrast_from_name(contrast);
+    (void)sar::simulator::rsat::beam_setup(c.beam);
     const auto truth = sar::simulator::rsat::simulate_rsat(c);
     std::printf("%s\n%s\n%s\n", truth.leader_path.c_str(), truth.data_path.c_str(), truth.truth_path.c_str());
   } catch (const std::exception& e) {
