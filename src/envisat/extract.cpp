@@ -466,8 +466,12 @@ void Walker::finish() {
     char count[96];
     std::snprintf(count, sizeof count, "%lld of %lld echoes", static_cast<long long>(polarisationMismatches_),
                   static_cast<long long>(apEchoes_));
-    input_fault(InputFault::kContradicts, ec::kBadArguments, {in_.path(), "packet polarisation contradicts the timeline (" + std::string(count) + ")",
-                              firstMismatch_});
+    // The record is short: the product's kind and the first packet; the path and the count go
+    // to the log.
+    report(kReportError, in_.path() + ": packet polarisation contradicts the timeline in " + count);
+    input_fault(InputFault::kContradicts, ec::kBadArguments,
+                {"ASA_AP0", "packet polarisation contradicts the timeline", firstMismatch_}, -1, "polarisation",
+                in_.path());
   }
   const std::size_t n = state_.size();
   int minSwst = kSwstMinStart, maxSwst = 0;

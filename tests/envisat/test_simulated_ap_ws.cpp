@@ -331,6 +331,7 @@ TEST(SimulatedAp, PolarisationBitsAgainstTheTimelineAreRefused) {
   } catch (const sar::base::CErrorExceptionManager& e) {
     EXPECT_EQ(e.ec(), sar::base::ec::kBadArguments);
     ASSERT_EQ(e.details().size(), 3u);
+    EXPECT_EQ(e.details()[0], "ASA_AP0");
     EXPECT_NE(e.details()[1].find("polarisation contradicts the timeline"), std::string::npos) << e.details()[1];
     EXPECT_NE(e.details()[2].find("packet counter"), std::string::npos) << e.details()[2];
   }

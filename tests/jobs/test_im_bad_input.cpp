@@ -176,6 +176,13 @@ TEST_F(ImBadInput, StopsWithTheRightCodeAndLeavesNoProduct) {
       {"an ASA_XCA given as ASA_INS",
        [](ScratchJob& j, J u, P p) { return prepare(j, p.clean, "", p.clean.xca_path, "", {}, u); },
        ec::kBadArguments, "ASA_INS", "AP"},
+      {"packets whose polarisation contradicts the timeline",
+       [](ScratchJob& j, J u, P) {
+         static const sim::SimulationTruth swapped =
+             make("swapped", {sim::Fault::kSwappedPolarisation}, "02-MAR-2008 10:00:00.000000", u.acquisition);
+         return prepare(j, swapped, "", "", "", {}, u);
+       },
+       ec::kBadArguments, "polarisation contradicts the timeline", "AP"},
       {"a product of the other stripmap job",
        [](ScratchJob& j, J u, P) {
          const JobUnderTest& other = std::string(u.mode) == "IM" ? kApJob : kImJob;
