@@ -1,10 +1,13 @@
 #include "dsp/detail/fft_engine.hpp"
 
+#include "base/parallel.hpp"
+
 #include <algorithm>
 #include <atomic>
 #include <cstdint>
 #include <map>
 #include <mutex>
+#include <new>
 #include <thread>
 #include <utility>
 
@@ -188,6 +191,21 @@ std::shared_ptr<const Stage> Stage::make(const BatchShape& shape, bool inPlace) 
   }
   auto stage = std::make_shared<Stage>(shape, chunk);
   const int threads = engine_threads();
+  if (stage->turned()) {
+    const PlanKey fullKey = stage->turned_key(chunk, threads);
+    auto full = cached_plan(fullKey);
+    if (!full) return nullptr;
+    stage->warm_.push_back(std::move(full));
+    stage->warmKeys_.push_back(fullKey);
+    if (const int rest = shape.howmany % chunk; rest != 0) {
+      const PlanKey tailKey = stage->turned_key(rest, threads);
+      auto tail = cached_plan(tailKey);
+      if (!tail) return nullptr;
+      stage->warm_.push_back(std::move(tail));
+      stage->warmKeys_.push_back(tailKey);
+    }
+    return stage;
+  }
   const PlanKey fullKey = stage->key_for(chunk, inPlace, 0, 0, threads);
   auto full = cached_plan(fullKey);
   if (!full) return nullptr;
@@ -222,7 +240,96 @@ PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int
   return k;
 }
 
+PlanKey Stage::turned_key(int howmany, int threads) const {
+  PlanKey k;
+  k.shape = BatchShape{shape_.n, howmany, 1, shape_.n, shape_.sign};
+  k.inPlace = true;
+  k.alignIn = k.alignOut = 0;  // the turning buffer is the kit's own, 64-byte aligned
+  k.threads = planner_threads_for(threads);
+  k.flags = planner_flags();
+  return k;
+}
+
+namespace {
+
+// Turning buffer of one thread, kept from call to call.
+fcomplex* turning_buffer(std::size_t samples) {
+  struct Buffer {
+    fcomplex* p = nullptr;
+    std::size_t size = 0;
+    ~Buffer() { fftwf_free(p); }
+  };
+  thread_local Buffer b;
+  if (b.size < samples) {
+    fftwf_free(b.p);
+    b.p = static_cast<fcomplex*>(fftwf_malloc(samples * sizeof(fcomplex)));
+    b.size = b.p ? samples : 0;
+  }
+  return b.p;
+}
+
+// Rows of this many samples are moved together, so that both sides of the transpose touch
+// whole cache lines while the tile stays in the first-level cache.
+constexpr int kTileRows = 16;
+
+// t[k n + l] = src[l stride + k] for k < count, l < n.
+void gather_columns(const fcomplex* src, std::int64_t stride, int n, int count, fcomplex* t) {
+  for (int l0 = 0; l0 < n; l0 += kTileRows) {
+    const int l1 = std::min(n, l0 + kTileRows);
+    for (int k = 0; k < count; ++k) {
+      fcomplex* dst = t + static_cast<std::int64_t>(k) * n;
+      for (int l = l0; l < l1; ++l) dst[l] = src[static_cast<std::int64_t>(l) * stride + k];
+    }
+  }
+}
+
+void scatter_columns(const fcomplex* t, int n, int count, fcomplex* dst, std::int64_t stride) {
+  for (int l0 = 0; l0 < n; l0 += kTileRows) {
+    const int l1 = std::min(n, l0 + kTileRows);
+    for (int l = l0; l < l1; ++l) {
+      fcomplex* row = dst + static_cast<std::int64_t>(l) * stride;
+      for (int k = 0; k < count; ++k) row[k] = t[static_cast<std::int64_t>(k) * n + l];
+    }
+  }
+}
+
+}  // namespace
+
+void Stage::run_turned(const fcomplex* in, fcomplex* out, double scale) const {
+  const int threads = engine_threads();
+  const int chunks = (shape_.howmany + chunk_ - 1) / chunk_;
+  const int rest = shape_.howmany % chunk_;
+  auto plan_for = [&](int howmany, std::size_t warm) {
+    const PlanKey key = turned_key(howmany, threads);
+    if (warm < warmKeys_.size() && warmKeys_[warm] == key) return warm_[warm];
+    return cached_plan(key);
+  };
+  auto full = plan_for(chunk_, 0);
+  auto tail = rest != 0 ? plan_for(rest, 1) : nullptr;
+  if (!full || (rest != 0 && !tail)) return;
+  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
+  const int workers = (chunks > 1 && samples >= kParallelSamples) ? threads : 1;
+  const std::size_t need = static_cast<std::size_t>(shape_.n) * static_cast<std::size_t>(chunk_);
+  base::ParallelFailure failure;
+  parallel_for(chunks, workers, [&](int c) { failure.run([&] {
+    fcomplex* t = turning_buffer(need);
+    if (!t) throw std::bad_alloc();
+    const std::int64_t offset = static_cast<std::int64_t>(chunk_) * c;
+    const bool last = c == chunks - 1 && rest != 0;
+    const int count = last ? rest : chunk_;
+    gather_columns(in + offset, shape_.stride, shape_.n, count, t);
+    (last ? *tail : *full).execute(t, t);
+    if (scale != 1.0) scale_samples(t, static_cast<std::int64_t>(shape_.n) * count, scale);
+    scatter_columns(t, shape_.n, count, out + offset, shape_.stride);
+  }); });
+  failure.rethrow();
+}
+
 void Stage::run(const fcomplex* in, fcomplex* out, double scale) const {
+  if (turned()) {
+    run_turned(in, out, scale);
+    return;
+  }
   const bool inPlace = in == out;
   const int ai = alignment_of(in);
   const int ao = alignment_of(out);
