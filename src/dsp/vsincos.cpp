@@ -3,6 +3,7 @@
 #include <emmintrin.h>
 #include <sleef.h>
 
+#include <algorithm>
 #include <array>
 #include <cmath>
 #include <stdexcept>
@@ -25,6 +26,26 @@ void sincos_sse2(const double* phase, double* s, double* c, std::size_t n) {
     c[i] = _mm_cvtsd_f64(r.y);
   }
 }
+void rotate_sse2(fcomplex* x, const double* phase, const double* weight, std::size_t n) {
+  constexpr std::size_t kSlice = 256;
+  std::array<double, kSlice> s{}, c{};
+  for (std::size_t o = 0; o < n; o += kSlice) {
+    const std::size_t m = std::min(kSlice, n - o);
+    sincos_sse2(phase + o, s.data(), c.data(), m);
+    if (weight) {
+      for (std::size_t i = 0; i < m; ++i) {
+        c[i] *= weight[o + i];
+        s[i] *= weight[o + i];
+      }
+    }
+    fcomplex* v = x + o;
+    for (std::size_t i = 0; i < m; ++i) {
+      const double re = v[i].real(), im = v[i].imag();
+      v[i] = fcomplex(static_cast<float>(re * c[i] - im * s[i]), static_cast<float>(re * s[i] + im * c[i]));
+    }
+  }
+}
+
 }  // namespace detail
 
 namespace {
@@ -42,9 +63,6 @@ Kernel kernel() {
   return k;
 }
 
-// Phases are taken in slices that stay in the first-level cache with their sines and cosines.
-constexpr std::size_t kSlice = 256;
-
 }  // namespace
 
 const char* sincos_path() { return kernel() == detail::sincos_avx2 ? "avx2" : "sse2"; }
@@ -58,26 +76,11 @@ void sincos_n(std::span<const double> phase, std::span<double> s, std::span<doub
 void rotate_n(std::span<fcomplex> x, std::span<const double> phase, std::span<const double> weight) {
   if (phase.size() < x.size() || (!weight.empty() && weight.size() < x.size()))
     throw std::invalid_argument("rotate_n: phases or weights shorter than the samples");
-  const Kernel k = kernel();
-  std::array<double, kSlice> s{}, c{};
-  for (std::size_t o = 0; o < x.size(); o += kSlice) {
-    const std::size_t m = std::min(kSlice, x.size() - o);
-    k(phase.data() + o, s.data(), c.data(), m);
-    fcomplex* v = x.data() + o;
-    if (weight.empty()) {
-      for (std::size_t i = 0; i < m; ++i) {
-        const double re = v[i].real(), im = v[i].imag();
-        v[i] = fcomplex(static_cast<float>(re * c[i] - im * s[i]), static_cast<float>(re * s[i] + im * c[i]));
-      }
-    } else {
-      const double* w = weight.data() + o;
-      for (std::size_t i = 0; i < m; ++i) {
-        const double pc = w[i] * c[i], ps = w[i] * s[i];
-        const double re = v[i].real(), im = v[i].imag();
-        v[i] = fcomplex(static_cast<float>(re * pc - im * ps), static_cast<float>(re * ps + im * pc));
-      }
-    }
-  }
+  const double* w = weight.empty() ? nullptr : weight.data();
+  if (kernel() == detail::sincos_avx2)
+    detail::rotate_avx2(x.data(), phase.data(), w, x.size());
+  else
+    detail::rotate_sse2(x.data(), phase.data(), w, x.size());
 }
 
 }  // namespace sar::dsp

@@ -24,6 +24,9 @@ const char* sincos_path();
 namespace detail {
 void sincos_avx2(const double* phase, double* s, double* c, std::size_t n);
 void sincos_sse2(const double* phase, double* s, double* c, std::size_t n);
+/// x[i] = weight[i] exp(j phase[i]) x[i] (weight may be null: ones), as rotate_n.
+void rotate_avx2(fcomplex* x, const double* phase, const double* weight, std::size_t n);
+void rotate_sse2(fcomplex* x, const double* phase, const double* weight, std::size_t n);
 }  // namespace detail
 
 }  // namespace sar::dsp

@@ -327,13 +327,18 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
     kr[static_cast<std::size_t>((i + n / 2) % n)] = k;
   }
   for (int i = 0; i < n; ++i) wr[static_cast<std::size_t>(i)] = w.range_weight(kr[static_cast<std::size_t>(i)]);
-  std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
+  const double x0 = -(n / 2) * dr * std::cos(squint);
+  // Reference function, back to range and the line's migration ramp in one pass per line,
+  // while the line is in cache.
+  dsp::fft_plan back;
+  if (dsp::fft_makep_c(back, n, n, 1, 1, -1, 0, 1) != 0) return 1;
+  base::ParallelFailure failure;
 #pragma omp parallel
   {
     LineScratch sc;
-    sc.reserve(static_cast<std::size_t>(n));
+    failure.run([&] { sc.reserve(static_cast<std::size_t>(n)); });
 #pragma omp for schedule(static)
-    for (int j = 0; j < L; ++j) {
+    for (int j = 0; j < L; ++j) failure.run([&] {
       fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
       const double y = ky[static_cast<std::size_t>(j)];
       const LineWeight lw(w, y, kr0 - (n / 2) * B / n, kr0 + (n - 1 - n / 2) * B / n);
@@ -343,16 +348,13 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
         sc.phase[static_cast<std::size_t>(i)] = (y - ky0) * sa + (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k - kr0) * sr;
         sc.weight[static_cast<std::size_t>(i)] = lw.weight(k, wr[static_cast<std::size_t>(i)], s1, s2);
       }
-      dsp::rotate_n(std::span<fcomplex>(row, static_cast<std::size_t>(n)), sc.phase, sc.weight);
-    }
+      const std::span<fcomplex> line(row, static_cast<std::size_t>(n));
+      dsp::rotate_n(line, sc.phase, sc.weight);
+      dsp::pfft_c(back, line);
+      RngShift(row, n, dr, rs[static_cast<std::size_t>(j)], row, n, x0, 1.0);
+    });
   }
-  dsp::fft_c(n, n, L, L, -1, 0, wk.data);
-  const double x0 = -(n / 2) * dr * std::cos(squint);
-#pragma omp parallel for schedule(static)
-  for (int j = 0; j < L; ++j) {
-    fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
-    RngShift(row, n, dr, rs[static_cast<std::size_t>(j)], row, n, x0, 1.0);
-  }
+  failure.rethrow();
   dsp::fft_c(n, n, L, L, 0, -1, wk.data);
   return 0;
 }
