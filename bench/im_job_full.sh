@@ -56,7 +56,7 @@ ins=$(ls "$input"/ASA_INS_AX*)
 xca=$(ls "$input"/ASA_XCA_AX*)
 
 job="$work/job"
-exe="$build/src/jobs/focussing"
+exe="${SAR_FOCUSSING:-$build/src/jobs/focussing}"  # another build of the engine to compare
 
 summary=""
 for threads in "${thread_counts[@]}"; do

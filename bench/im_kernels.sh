@@ -50,20 +50,24 @@ for kernel in "${kernels[@]}"; do
   [ -z "${SAR_BENCH_AZIMUTH_OVERLAP:-}" ] ||
     sed -i "s/^AzimuthOverlap = .*/AzimuthOverlap = $SAR_BENCH_AZIMUTH_OVERLAP/" "$job/des/parameters_IM.hdr"
   start=$(date +%s.%N)
-  if ! OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" "$exe" "main_focussing_asar_IM#$job/job.txt" >/dev/null; then
+  # Processor time (user and system) beside the wall time: on a shared machine it is the figure
+  # the load disturbs least.
+  if ! OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -f "%U %S" -o "$job/cpu.txt" \
+      "$exe" "main_focussing_asar_IM#$job/job.txt" >/dev/null; then
     echo "im_kernels: kernel $kernel failed" >&2
     cat "$job/Vanterra.working_error" >&2 || true
     exit 1
   fi
   wall=$(awk -v s="$start" -v e="$(date +%s.%N)" 'BEGIN {printf "%.2f", e - s}')
   azimuth=$(grep -o "Stage time azimuth *[0-9.]*" "$job/Vanterra.log" | awk '{print $4}')
+  cpu=$(awk '{printf "%.2f", $1 + $2}' "$job/cpu.txt")
   slc=$(grep -o "SLC: .*" "$job/Vanterra.log" | tail -n 1)
   first_line=$(echo "$slc" | awk '{print $9}')
   first_sample=$(echo "$slc" | awk '{print $13}')
   off_line=$(awk -v a="$first_line" -v b="$(key first_line_time_sec85)" -v p="$(key prf)" 'BEGIN{printf "%.4f", (a-b)*p}')
   off_sample=$(awk -v a="$first_sample" -v b="$(key near_range_time)" -v f="$(key sampling_frequency)" \
     'BEGIN{printf "%.4f", (a-b)*f}')
-  echo "== kernel $kernel (PerformInterpolation $kernel, $threads threads): wall ${wall} s, azimuth stage ${azimuth} s"
+  echo "== kernel $kernel (PerformInterpolation $kernel, $threads threads): wall ${wall} s, processor ${cpu} s, azimuth stage ${azimuth} s"
   "$build/tools/sarirf" "$job/scene_slc" --truth "$truth" --first-line "$off_line" --first-sample "$off_sample" \
     --json "$job/irf.json" | sed 's/^/  /'
   rm -f "$job/scene_slc"
