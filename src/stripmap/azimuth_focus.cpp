@@ -198,8 +198,11 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     base::ParallelFailure failure;
 #pragma omp parallel
     {
-      std::vector<double> phase(kd != 0.0 ? static_cast<std::size_t>(std::max(back, 0)) : 0);
-      for (std::size_t i = 0; i < phase.size(); ++i) phase[i] = kd * ((o + static_cast<int32_t>(i)) * step + 0.0);
+      std::vector<double> phase;
+      failure.run([&] {
+        phase.resize(kd != 0.0 ? static_cast<std::size_t>(std::max(back, 0)) : 0);
+        for (std::size_t i = 0; i < phase.size(); ++i) phase[i] = kd * ((o + static_cast<int32_t>(i)) * step + 0.0);
+      });
 #pragma omp for schedule(static)
       for (int32_t l = 0; l < lines; ++l) failure.run([&] {
         const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
