@@ -88,15 +88,25 @@ TEST(VectorSinCos, VectorRotationEqualsTheScalarFormulaBitForBit) {
     phase[i] = 1e4 * std::sin(0.01 * static_cast<double>(i * i));
     weight[i] = 1.0 / (1.0 + 0.01 * static_cast<double>(i));
   }
-  sar::dsp::sincos_n(phase, s, c);
-  for (const bool weighted : {false, true}) {
-    std::vector<fcomplex> y = x;
-    sar::dsp::rotate_n(y, phase, weighted ? std::span<const double>(weight) : std::span<const double>());
-    for (std::size_t i = 0; i < n; ++i) {
-      const double pc = weighted ? weight[i] * c[i] : c[i], ps = weighted ? weight[i] * s[i] : s[i];
-      const double re = x[i].real(), im = x[i].imag();
-      const fcomplex want(static_cast<float>(re * pc - im * ps), static_cast<float>(re * ps + im * pc));
-      ASSERT_EQ(y[i], want) << "sample " << i << (weighted ? " weighted" : "");
+  // The path this machine chose, then the baseline path on its own sines and cosines.
+  for (const bool baseline : {false, true}) {
+    if (baseline)
+      sar::dsp::detail::sincos_sse2(phase.data(), s.data(), c.data(), n);
+    else
+      sar::dsp::sincos_n(phase, s, c);
+    for (const bool weighted : {false, true}) {
+      std::vector<fcomplex> y = x;
+      const double* w = weighted ? weight.data() : nullptr;
+      if (baseline)
+        sar::dsp::detail::rotate_sse2(y.data(), phase.data(), w, n);
+      else
+        sar::dsp::rotate_n(y, phase, weighted ? std::span<const double>(weight) : std::span<const double>());
+      for (std::size_t i = 0; i < n; ++i) {
+        const double pc = weighted ? weight[i] * c[i] : c[i], ps = weighted ? weight[i] * s[i] : s[i];
+        const double re = x[i].real(), im = x[i].imag();
+        const fcomplex want(static_cast<float>(re * pc - im * ps), static_cast<float>(re * ps + im * pc));
+        ASSERT_EQ(y[i], want) << "sample " << i << (weighted ? " weighted" : "") << (baseline ? " sse2" : "");
+      }
     }
   }
 }
