@@ -27,6 +27,8 @@ if [ ! -x /usr/bin/time ]; then
   exit 2
 fi
 cmake --build "$build" -j2 --target sarsim focussing bench_scene_transforms >/dev/null
+# The machine is shared: its load at the start and the end says how far the figures can be trusted.
+echo "== load at start: $(uptime | sed 's/.*load average: //') ($(nproc) cores)"
 
 # The bound first, in the same run: this machine's speed varies from hour to hour.
 bound_2T="" bound_1T=""
@@ -54,7 +56,7 @@ ins=$(ls "$input"/ASA_INS_AX*)
 xca=$(ls "$input"/ASA_XCA_AX*)
 
 job="$work/job"
-exe="$build/src/jobs/focussing"
+exe="${SAR_FOCUSSING:-$build/src/jobs/focussing}"  # another build of the engine to compare
 
 summary=""
 for threads in "${thread_counts[@]}"; do
@@ -77,6 +79,7 @@ fi
 wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
   "$job/time.txt")
 peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
+cpu=$(awk -F': ' '/User time/ {u = $2} /System time/ {s = $2} END {printf "%.2f", u + s}' "$job/time.txt")
 
 echo "== bare transforms of the same scene"
 bare=$(SAR_BENCH_LINES="$lines" SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="$threads" \
@@ -91,9 +94,10 @@ echo
 echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
 grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
-line=$(awk -v w="$wall" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" -v b="$bound" -v t="$threads" 'BEGIN {
+line=$(awk -v w="$wall" -v c="$cpu" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" -v b="$bound" -v t="$threads" 'BEGIN {
   bare = (r + a) / 1000.0
   printf "  wall time            %9.2f s\n", w
+  printf "  processor time       %9.2f s (user and system, all threads)\n", c
   printf "  peak memory          %9.2f GiB\n", p / 1048576.0
   printf "  bare transforms      %9.2f s (range lines %.2f s, azimuth columns %.2f s)\n", bare, r / 1000.0, a / 1000.0
   printf "  job / bare           %9.2f\n", w / bare
@@ -103,5 +107,6 @@ echo "$line"
 summary+="${threads} threads: $(echo "$line" | awk '/wall time/ {w=$3} /peak memory/ {m=$3} /job \/ bound/ {r=$4} END {printf "wall %s s, peak %s GiB, job / bound %s", w, m, (r == "" ? "-" : r)}')"$'\n'
 done
 echo
+echo "== load at end: $(uptime | sed 's/.*load average: //')"
 echo "Summary (${lines} x ${samples}, Flag_incore ${incore}):"
 printf '%s' "$summary" | sed 's/^/  /'

@@ -5,7 +5,7 @@ set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
 
-packages=(build-essential cmake pkg-config libfftw3-dev libeigen3-dev libxml2-dev libcli11-dev
+packages=(build-essential cmake pkg-config libfftw3-dev libsleef-dev libeigen3-dev libxml2-dev libcli11-dev
           libgtest-dev libgmock-dev libbenchmark-dev gdal-bin libgdal-dev
           clang libclang-rt-14-dev)
 missing=()

@@ -9,6 +9,8 @@
 #include <stdexcept>
 #include <vector>
 
+#include "dsp/vsincos.hpp"
+
 #if defined(__SSE2__)
 #include <emmintrin.h>
 #endif
@@ -222,8 +224,12 @@ std::shared_ptr<const CztInputChirp> CztTables::input(const czt_plan& plan, cons
   c->aBits = k.aBits;
   c->bBits = bits;
   c->d.resize(static_cast<std::size_t>(N));
-  for (int n = 0; n < N; ++n)
-    c->d[static_cast<std::size_t>(n)] = phasor(k.q[static_cast<std::size_t>(n + N - 1)] - n * b);
+  // A new start comes with every Doppler line of the Stolt kernel: the chirp's phases go
+  // through the vector sine and cosine.
+  std::vector<double> phase(static_cast<std::size_t>(N)), sn(phase.size()), cs(phase.size());
+  for (int n = 0; n < N; ++n) phase[static_cast<std::size_t>(n)] = k.q[static_cast<std::size_t>(n + N - 1)] - n * b;
+  sincos_n(phase, sn, cs);
+  for (std::size_t n = 0; n < phase.size(); ++n) c->d[n] = fcomplex(static_cast<float>(cs[n]), static_cast<float>(sn[n]));
   std::lock_guard lock(mutex_);
   input_ = c;
   return c;

@@ -6,7 +6,9 @@
 #include <vector>
 
 #include "base/diagnostics.hpp"
+#include "base/parallel.hpp"
 #include "base/run_services.hpp"
+#include "dsp/vsincos.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/range_focus.hpp"
 #include "stripmap/raster_files.hpp"
@@ -168,6 +170,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   for (int32_t sb = 0; sb < Ns && status == 0; ++sb) {
     const int32_t o = sb * Sn;
     const int32_t take = std::min(Sb, n - o);
+#pragma omp parallel for schedule(static)
     for (int32_t l = 0; l < lines; ++l) {
       const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
       const auto row = work.begin() + static_cast<std::ptrdiff_t>(l) * Sb;
@@ -191,22 +194,31 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     previousKxc = kxc;
     if ((status = frame.check(focazwk(wk, result))) != 0) break;
     const int32_t back = std::min(Sn, n - o - Ov);
-    for (int32_t l = 0; l < lines; ++l) {
-      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
-      std::copy(src, src + back, block.data() + static_cast<std::ptrdiff_t>(l) * n + o);
+    // The copy back carries the ramp that removes the change of the wavenumber centre
+    // (exp(j k_d i dr) over the block's samples i), while the lines are in cache.
+    const double step = result.rangeSpacing;
+    base::ParallelFailure failure;
+#pragma omp parallel
+    {
+      std::vector<double> phase;
+      failure.run([&] {
+        phase.resize(kd != 0.0 ? static_cast<std::size_t>(std::max(back, 0)) : 0);
+        for (std::size_t i = 0; i < phase.size(); ++i) phase[i] = kd * ((o + static_cast<int32_t>(i)) * step + 0.0);
+      });
+#pragma omp for schedule(static)
+      for (int32_t l = 0; l < lines; ++l) failure.run([&] {
+        const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
+        fcomplex* dst = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
+        std::copy(src, src + back, dst);
+        if (!phase.empty()) dsp::rotate_n(std::span<fcomplex>(dst, phase.size()), phase);
+      });
     }
+    failure.rethrow();
   }
   wk.nearTime = savedNear;
   wk.samples = n;
   wk.data = block;
-  if (status != 0) return status;
-  if (kd != 0.0) {
-    for (int32_t l = 0; l < lines; ++l) {
-      fcomplex* row = block.data() + static_cast<std::ptrdiff_t>(l) * n;
-      RngShift(row, n, result.rangeSpacing, kd, row, n, 0.0, 1.0);
-    }
-  }
-  return 0;
+  return status;
 }
 
 int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {

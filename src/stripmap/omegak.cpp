@@ -10,7 +10,7 @@
 #include "dsp/czt.hpp"
 #include "dsp/fft.hpp"
 #include "dsp/filters.hpp"
-#include "dsp/phasor.hpp"
+#include "dsp/vsincos.hpp"
 
 namespace sar::stripmap {
 
@@ -20,11 +20,17 @@ using dcomplex = std::complex<double>;
 
 double sinc(double u) { return u == 0.0 ? 1.0 : std::sin(kPi * u) / (kPi * u); }
 
-fcomplex rotate(fcomplex x, double phase, double weight) {
-  const dcomplex p = dsp::phasor(phase, weight);
-  return fcomplex(static_cast<float>(x.real() * p.real() - x.imag() * p.imag()),
-                  static_cast<float>(x.real() * p.imag() + x.imag() * p.real()));
-}
+// Per-thread scratch of the per-sample loops: the phases and weights of one line are gathered
+// first and turned into phasors by the vector sine and cosine in one call.
+struct LineScratch {
+  std::vector<double> phase, weight, s, c;
+  void reserve(std::size_t n) {
+    phase.resize(n);
+    weight.resize(n);
+    s.resize(n);
+    c.resize(n);
+  }
+};
 
 // Spectral weighting of a block: range and azimuth windows, antenna whitening, and the sums
 // that normalise the image so that a window does not change the mean power of distributed
@@ -287,7 +293,20 @@ void KyAxis(const wkparm& wk, std::vector<double>& ky, std::vector<double>& ky2,
 void RngShift(const fcomplex* input, int n, double step, double k, fcomplex* output, int nOut, double x0,
               double norm) {
   const double inv = 1.0 / norm;
-  for (int i = 0; i < n; ++i) output[i] = rotate(input[i], k * (i * step + x0), inv);
+  constexpr int kSlice = 512;
+  std::array<double, kSlice> phase{}, weight{};
+  weight.fill(inv);
+  for (int o = 0; o < n; o += kSlice) {
+    const int m = std::min(kSlice, n - o);
+    for (int i = 0; i < m; ++i) phase[static_cast<std::size_t>(i)] = k * ((o + i) * step + x0);
+    if (input != output) std::copy(input + o, input + o + m, output + o);
+    const std::span<fcomplex> part(output + o, static_cast<std::size_t>(m));
+    const std::span<const double> ph(phase.data(), static_cast<std::size_t>(m));
+    if (inv == 1.0)
+      dsp::rotate_n(part, ph);
+    else
+      dsp::rotate_n(part, ph, std::span<const double>(weight.data(), static_cast<std::size_t>(m)));
+  }
   for (int i = n; i < nOut; ++i) output[i] = fcomplex{};
 }
 
@@ -308,26 +327,34 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
     kr[static_cast<std::size_t>((i + n / 2) % n)] = k;
   }
   for (int i = 0; i < n; ++i) wr[static_cast<std::size_t>(i)] = w.range_weight(kr[static_cast<std::size_t>(i)]);
-  std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
-#pragma omp parallel for schedule(static)
-  for (int j = 0; j < L; ++j) {
-    fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
-    const double y = ky[static_cast<std::size_t>(j)];
-    const LineWeight lw(w, y, kr0 - (n / 2) * B / n, kr0 + (n - 1 - n / 2) * B / n);
-    double s1 = 0.0, s2 = 0.0;
-    for (int i = 0; i < n; ++i) {
-      const double k = kr[static_cast<std::size_t>(i)];
-      const double phi = (y - ky0) * sa + (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k - kr0) * sr;
-      row[i] = rotate(row[i], phi, lw.weight(k, wr[static_cast<std::size_t>(i)], s1, s2));
-    }
-  }
-  dsp::fft_c(n, n, L, L, -1, 0, wk.data);
   const double x0 = -(n / 2) * dr * std::cos(squint);
-#pragma omp parallel for schedule(static)
-  for (int j = 0; j < L; ++j) {
-    fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
-    RngShift(row, n, dr, rs[static_cast<std::size_t>(j)], row, n, x0, 1.0);
+  // Reference function, back to range and the line's migration ramp in one pass per line,
+  // while the line is in cache.
+  dsp::fft_plan back;
+  if (dsp::fft_makep_c(back, n, n, 1, 1, -1, 0, 1) != 0) return 1;
+  base::ParallelFailure failure;
+#pragma omp parallel
+  {
+    LineScratch sc;
+    failure.run([&] { sc.reserve(static_cast<std::size_t>(n)); });
+#pragma omp for schedule(static)
+    for (int j = 0; j < L; ++j) failure.run([&] {
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      const double y = ky[static_cast<std::size_t>(j)];
+      const LineWeight lw(w, y, kr0 - (n / 2) * B / n, kr0 + (n - 1 - n / 2) * B / n);
+      double s1 = 0.0, s2 = 0.0;
+      for (int i = 0; i < n; ++i) {
+        const double k = kr[static_cast<std::size_t>(i)];
+        sc.phase[static_cast<std::size_t>(i)] = (y - ky0) * sa + (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k - kr0) * sr;
+        sc.weight[static_cast<std::size_t>(i)] = lw.weight(k, wr[static_cast<std::size_t>(i)], s1, s2);
+      }
+      const std::span<fcomplex> line(row, static_cast<std::size_t>(n));
+      dsp::rotate_n(line, sc.phase, sc.weight);
+      dsp::pfft_c(back, line);
+      RngShift(row, n, dr, rs[static_cast<std::size_t>(j)], row, n, x0, 1.0);
+    });
   }
+  failure.rethrow();
   dsp::fft_c(n, n, L, L, 0, -1, wk.data);
   return 0;
 }
@@ -361,9 +388,11 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
 #pragma omp parallel
   {
     dsp::cvector z, out;
+    LineScratch sc;
     failure.run([&] {
       z.resize(static_cast<std::size_t>(M2) + 1);
       out.resize(static_cast<std::size_t>(M));
+      sc.reserve(static_cast<std::size_t>(std::max(M2 + 1, M)));
     });
 #pragma omp for schedule(dynamic, 16)
     for (int j = 0; j < L; ++j) failure.run([&] {
@@ -385,25 +414,41 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
       const int m2 = std::min(M2 - 1, static_cast<int>(std::floor(bin(i2))) + 1);
       double s1 = 0.0, s2 = 0.0;
       const LineWeight lw(w, y, kr0 + s + m1 * dk, kr0 + s + m2 * dk);
-      for (int m = m1; m <= m2; ++m) {
-        const double k = kr0 + s + m * dk;
-        const double phi = (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k + r - kr0) * sr;
-        z[static_cast<std::size_t>(m)] = rotate(z[static_cast<std::size_t>(m)], phi, lw.weight(k, 1.0, s1, s2));
+      if (m2 >= m1) {
+        const auto count = static_cast<std::size_t>(m2 - m1 + 1);
+        for (int m = m1; m <= m2; ++m) {
+          const double k = kr0 + s + m * dk;
+          const auto u = static_cast<std::size_t>(m - m1);
+          sc.phase[u] = (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k + r - kr0) * sr;
+          sc.weight[u] = lw.weight(k, 1.0, s1, s2);
+        }
+        dsp::rotate_n(std::span<fcomplex>(z.data() + m1, count), std::span<const double>(sc.phase.data(), count),
+                      std::span<const double>(sc.weight.data(), count));
       }
       sums[static_cast<std::size_t>(j)] = {s1, s2};
       std::fill(out.begin(), out.end(), fcomplex{});
       const double lineTurn = (y - ky0) * sa + (wk.R0 / std::cos(squint)) * r;
+      // Linear interpolation between the two chirp-Z bins, each turned back by its half-bin
+      // phase: (1 - t) e^{j pi t} z_p + t e^{-j pi (1 - t)} z_{p+1}, and the line's own turn.
+      // Since e^{-j pi (1 - t)} = -e^{j pi t}, one rotation serves all three. The bins and
+      // phases of the line's span are gathered first for one call of the vector sine.
+      const auto span = static_cast<std::size_t>(i2 - i1 + 1);
       for (int i = i1; i <= i2; ++i) {
         const double x = bin(i);
+        const auto u = static_cast<std::size_t>(i - i1);
+        sc.weight[u] = x;  // the fractional bin, kept for the mix below
+        sc.phase[u] = kPi * (x - std::floor(x)) + lineTurn;
+      }
+      dsp::sincos_n(std::span<const double>(sc.phase.data(), span), sc.s, sc.c);
+      for (int i = i1; i <= i2; ++i) {
+        const auto u = static_cast<std::size_t>(i - i1);
+        const double x = sc.weight[u];
         const int p = static_cast<int>(std::floor(x));
         if (p < 0 || p >= M2) continue;
         const double t = x - p;
-        // Linear interpolation between the two chirp-Z bins, each turned back by its half-bin
-        // phase: (1 - t) e^{j pi t} z_p + t e^{-j pi (1 - t)} z_{p+1}, and the line's own turn.
-        // Since e^{-j pi (1 - t)} = -e^{j pi t}, one rotation serves all three.
         const dcomplex mix = (1.0 - t) * dcomplex(z[static_cast<std::size_t>(p)]) -
                              t * dcomplex(z[static_cast<std::size_t>(p + 1)]);
-        const dcomplex v = mix * dsp::phasor(kPi * t + lineTurn);
+        const dcomplex v = mix * dcomplex(sc.c[u], sc.s[u]);
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
       }
       finish_row(back, out, row, Nout, n);
@@ -443,6 +488,14 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
   const Weighting w = make_weighting(wk, true);
   std::vector<double> wr(static_cast<std::size_t>(N));
   for (int m = 0; m < N; ++m) wr[static_cast<std::size_t>(m)] = w.range_weight(krs + m * dk);
+  // The output turn exp(j (kx - kx0) q) depends on the kx bin only: one table for the block.
+  std::vector<dcomplex> turn(static_cast<std::size_t>(M));
+  {
+    std::vector<double> ph(static_cast<std::size_t>(M)), ts(ph.size()), tc(ph.size());
+    for (int i = 0; i < M; ++i) ph[static_cast<std::size_t>(i)] = (kx.at(i) - kx0) * q;
+    dsp::sincos_n(ph, ts, tc);
+    for (std::size_t i = 0; i < turn.size(); ++i) turn[i] = dcomplex(tc[i], ts[i]);
+  }
 
   dsp::fft_c(n, n, L, L, 0, 1, wk.data);
   dsp::fft_plan fwd, back;
@@ -453,9 +506,11 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
 #pragma omp parallel
   {
     dsp::cvector buf, out;
+    LineScratch sc;
     failure.run([&] {
       buf.resize(static_cast<std::size_t>(N + 2 * order + 2));
       out.resize(static_cast<std::size_t>(M));
+      sc.reserve(static_cast<std::size_t>(N));
     });
 #pragma omp for schedule(dynamic, 16)
     for (int j = 0; j < L; ++j) failure.run([&] {
@@ -476,9 +531,11 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
       const LineWeight lw(w, y, krs, kre);
       for (int m = 0; m < N; ++m) {
         const double k = krs + m * dk;
-        const double phi = (std::sqrt(k * k - y * y) - kx0) * (wk.R0 - q) - (k - kr0) * (sr - P * dr) + (y - ky0) * sa;
-        line[m] = rotate(line[m], phi, lw.weight(k, wr[static_cast<std::size_t>(m)], s1, s2));
+        sc.phase[static_cast<std::size_t>(m)] =
+            (std::sqrt(k * k - y * y) - kx0) * (wk.R0 - q) - (k - kr0) * (sr - P * dr) + (y - ky0) * sa;
+        sc.weight[static_cast<std::size_t>(m)] = lw.weight(k, wr[static_cast<std::size_t>(m)], s1, s2);
       }
+      dsp::rotate_n(std::span<fcomplex>(line, static_cast<std::size_t>(N)), sc.phase, sc.weight);
       sums[static_cast<std::size_t>(j)] = {s1, s2};
       std::fill(out.begin(), out.end(), fcomplex{});
       for (int i = i1; i <= i2; ++i) {
@@ -490,7 +547,7 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
         // buf index p + t counts from the `order` leading zeros: sample p + t - order of the line.
         dcomplex acc;
         for (int t = 0; t < taps; ++t) acc += dcomplex(buf[static_cast<std::size_t>(p + t)]) * dcomplex(h[t]);
-        acc *= dsp::phasor((kx.at(i) - kx0) * q);
+        acc *= turn[static_cast<std::size_t>(i)];
         out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(acc.real()), static_cast<float>(acc.imag()));
       }
       finish_row(back, out, row, Nout, n);

@@ -1,10 +1,14 @@
 #include "dsp/detail/fft_engine.hpp"
 
+#include "base/parallel.hpp"
+
 #include <algorithm>
 #include <atomic>
 #include <cstdint>
 #include <map>
 #include <mutex>
+#include <new>
+#include <stdexcept>
 #include <thread>
 #include <utility>
 
@@ -194,6 +198,16 @@ std::shared_ptr<const Stage> Stage::make(const BatchShape& shape, bool inPlace) 
   }
   auto stage = std::make_shared<Stage>(shape, chunk);
   const int threads = engine_threads();
+  if (stage->turned() || stage->rows()) {
+    // One plan of a single transform, run once per row: FFTW's estimate for a batch of long
+    // transforms is often much slower than its plan for one transform run in a loop.
+    const PlanKey key = stage->turned() ? stage->turned_key(threads) : stage->row_key(inPlace, 0, 0, threads);
+    auto one = cached_plan(key);
+    if (!one) return nullptr;
+    stage->warm_.push_back(std::move(one));
+    stage->warmKeys_.push_back(key);
+    return stage;
+  }
   const PlanKey fullKey = stage->key_for(chunk, inPlace, 0, 0, threads);
   auto full = cached_plan(fullKey);
   if (!full) return nullptr;
@@ -228,7 +242,155 @@ PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int
   return k;
 }
 
+PlanKey Stage::turned_key(int threads) const {
+  PlanKey k;
+  k.shape = BatchShape{shape_.n, 1, 1, shape_.n, shape_.sign};
+  k.inPlace = true;
+  k.alignIn = k.alignOut = 0;  // the turning buffer is the kit's own, 64-byte aligned
+  k.threads = planner_threads_for(threads);
+  k.flags = planner_flags();
+  return k;
+}
+
+PlanKey Stage::row_key(bool inPlace, int alignIn, int alignOut, int threads) const {
+  PlanKey k;
+  k.shape = BatchShape{shape_.n, 1, 1, shape_.n, shape_.sign};
+  k.inPlace = inPlace;
+  k.alignIn = alignIn;
+  k.alignOut = inPlace ? alignIn : alignOut;
+  k.threads = planner_threads_for(threads);
+  k.flags = planner_flags();
+  return k;
+}
+
+std::shared_ptr<const FftwPlan> Stage::single_plan(const PlanKey& key) const {
+  if (!warmKeys_.empty() && warmKeys_[0] == key) return warm_[0];
+  return cached_plan(key);
+}
+
+void Stage::run_rows(const fcomplex* in, fcomplex* out, double scale) const {
+  const bool inPlace = in == out;
+  const int threads = engine_threads();
+  const int chunks = (shape_.howmany + chunk_ - 1) / chunk_;
+  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
+  const int workers = (chunks > 1 && samples >= kParallelSamples) ? threads : 1;
+  base::ParallelFailure failure;
+  parallel_for(chunks, workers, [&](int c) { failure.run([&] {
+    const int first = c * chunk_;
+    const int count = std::min(chunk_, shape_.howmany - first);
+    // Rows of one pitch share their alignment class; the plan is looked up again only when
+    // the class changes from one row to the next.
+    std::shared_ptr<const FftwPlan> plan;
+    int lastIn = -1, lastOut = -1;
+    for (int t = 0; t < count; ++t) {
+      const std::int64_t offset = static_cast<std::int64_t>(first + t) * shape_.dist;
+      const int ai = alignment_of(in + offset), ao = alignment_of(out + offset);
+      if (!plan || ai != lastIn || ao != lastOut) {
+        plan = single_plan(row_key(inPlace, ai, ao, threads));
+        if (!plan) throw std::runtime_error("fft: the engine refused a row transform");
+        lastIn = ai;
+        lastOut = ao;
+      }
+      plan->execute(in + offset, out + offset);
+      if (scale != 1.0) scale_samples(out + offset, shape_.n, scale);
+    }
+  }); });
+  failure.rethrow();
+}
+
+namespace {
+
+// Turning buffer of one thread, kept from call to call.
+fcomplex* turning_buffer(std::size_t samples) {
+  struct Buffer {
+    fcomplex* p = nullptr;
+    std::size_t size = 0;
+    ~Buffer() { fftwf_free(p); }
+  };
+  thread_local Buffer b;
+  if (b.size < samples) {
+    fftwf_free(b.p);
+    b.p = static_cast<fcomplex*>(fftwf_malloc(samples * sizeof(fcomplex)));
+    b.size = b.p ? samples : 0;
+  }
+  return b.p;
+}
+
+// Rows of this many samples are moved together, so that both sides of the transpose touch
+// whole cache lines while the tile stays in the first-level cache.
+constexpr int kTileRows = 16;
+
+// t[k n + l] = src[l stride + k] for k < count, l < n.
+void gather_columns(const fcomplex* src, std::int64_t stride, int n, int count, fcomplex* t) {
+  for (int l0 = 0; l0 < n; l0 += kTileRows) {
+    const int l1 = std::min(n, l0 + kTileRows);
+    for (int k = 0; k < count; ++k) {
+      fcomplex* dst = t + static_cast<std::int64_t>(k) * n;
+      for (int l = l0; l < l1; ++l) dst[l] = src[static_cast<std::int64_t>(l) * stride + k];
+    }
+  }
+}
+
+void scatter_columns(const fcomplex* t, int n, int count, fcomplex* dst, std::int64_t stride) {
+  for (int l0 = 0; l0 < n; l0 += kTileRows) {
+    const int l1 = std::min(n, l0 + kTileRows);
+    for (int l = l0; l < l1; ++l) {
+      fcomplex* row = dst + static_cast<std::int64_t>(l) * stride;
+      for (int k = 0; k < count; ++k) row[k] = t[static_cast<std::int64_t>(k) * n + l];
+    }
+  }
+}
+
+}  // namespace
+
+void Stage::run_turned(const fcomplex* in, fcomplex* out, double scale) const {
+  const int threads = engine_threads();
+  const int chunks = (shape_.howmany + chunk_ - 1) / chunk_;
+  const auto one = single_plan(turned_key(threads));
+  if (!one) return;
+  const std::int64_t samples = static_cast<std::int64_t>(shape_.n) * shape_.howmany;
+  const int workers = (chunks > 1 && samples >= kParallelSamples) ? threads : 1;
+  const std::size_t need = static_cast<std::size_t>(shape_.n) * static_cast<std::size_t>(chunk_);
+  base::ParallelFailure failure;
+  parallel_for(chunks, workers, [&](int c) { failure.run([&] {
+    fcomplex* t = turning_buffer(need);
+    if (!t) throw std::bad_alloc();
+    const std::int64_t offset = static_cast<std::int64_t>(chunk_) * c;
+    const int count = std::min(chunk_, shape_.howmany - chunk_ * c);
+    gather_columns(in + offset, shape_.stride, shape_.n, count, t);
+    // Every turned row starts on a 64-byte boundary when n is a multiple of 8; otherwise the
+    // rows fall into other alignment classes and take their own plans.
+    std::shared_ptr<const FftwPlan> plan = one;
+    int last = 0;
+    for (int k = 0; k < count; ++k) {
+      fcomplex* row = t + static_cast<std::int64_t>(k) * shape_.n;
+      const int a = alignment_of(row);
+      if (a != last) {
+        PlanKey key = turned_key(threads);
+        key.alignIn = key.alignOut = a;
+        plan = cached_plan(key);
+        if (!plan) throw std::runtime_error("fft: the engine refused a column transform");
+        last = a;
+      } else if (a == 0) {
+        plan = one;
+      }
+      plan->execute(row, row);
+    }
+    if (scale != 1.0) scale_samples(t, static_cast<std::int64_t>(shape_.n) * count, scale);
+    scatter_columns(t, shape_.n, count, out + offset, shape_.stride);
+  }); });
+  failure.rethrow();
+}
+
 void Stage::run(const fcomplex* in, fcomplex* out, double scale) const {
+  if (turned()) {
+    run_turned(in, out, scale);
+    return;
+  }
+  if (rows()) {
+    run_rows(in, out, scale);
+    return;
+  }
   const bool inPlace = in == out;
   const int ai = alignment_of(in);
   const int ao = alignment_of(out);

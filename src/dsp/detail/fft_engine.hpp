@@ -83,6 +83,15 @@ class Stage {
   /// Use make(): a bare stage has no plans yet.
   Stage(const BatchShape& shape, int chunk) : shape_(shape), chunk_(chunk) {}
 
+  /// Whether the stage transforms columns of a row-major matrix (samples `stride` apart,
+  /// neighbouring transforms adjacent). Such a stage turns each chunk of columns into rows of
+  /// a contiguous buffer (a cache-tiled transpose), transforms those and turns them back:
+  /// a transform whose samples lie a whole row apart misses the cache on every sample.
+  bool turned() const { return shape_.stride > 1 && shape_.dist == 1; }
+  /// Whether the stage transforms rows (contiguous samples). Rows and turned columns run one
+  /// plan of a single transform per row, so a row's bytes cannot depend on its batch.
+  bool rows() const { return shape_.stride == 1; }
+
   const BatchShape& shape() const { return shape_; }
   int chunk() const { return chunk_; }
   /// Runs the stage from `in` to `out` (equal pointers: in place), then multiplies every
@@ -91,6 +100,13 @@ class Stage {
 
  private:
   PlanKey key_for(int howmany, bool inPlace, int alignIn, int alignOut, int threads) const;
+  /// Key of the single-transform plan a turned stage runs on each row of its transposed chunks.
+  PlanKey turned_key(int threads) const;
+  /// Key of the single-transform plan of a row stage, for rows of the given alignment classes.
+  PlanKey row_key(bool inPlace, int alignIn, int alignOut, int threads) const;
+  std::shared_ptr<const FftwPlan> single_plan(const PlanKey& key) const;
+  void run_turned(const fcomplex* in, fcomplex* out, double scale) const;
+  void run_rows(const fcomplex* in, fcomplex* out, double scale) const;
   int planner_threads_for(int threads) const;
 
   BatchShape shape_;
