@@ -64,7 +64,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     return frame.check(kRejected);
   }
   const double outNear = focused.nearTime + (c0 + ov / 2) / fs;
-  const int32_t Nf = dsp::genpow(3 * N, 1);
+  const int32_t Nf = dsp::genpow(std::max(par.burstPadding, 2) * N, 1);
   const double h = half_window(scan, par);
 
   // Column geometry and the spread of the window centres across range.

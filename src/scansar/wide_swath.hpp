@@ -71,6 +71,7 @@ struct wsparm {
   double groundResolution = 150.0;        // m
   int32_t compensateAntenna = 1;          // de-scalloping
   bool normalisedSinc = false;            // the pattern's sinc as sin(pi y)/(pi y): wrong, kept to show it
+  int32_t burstPadding = 3;               // a burst is focused in genpow(burstPadding x echoes) lines
   int32_t samplesInBlock = 512;           // range sub-block of the omega-K kernel
   int32_t rangeOverlap = 32;              // full overlap of range sub-blocks
   double antennaLength = 10.0;            // m
