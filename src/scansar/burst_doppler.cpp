@@ -30,6 +30,7 @@ constexpr double kPi = 3.14159265358979323846;
 constexpr double kC = 299792458.0;
 constexpr int kColumnBlock = 32;
 constexpr int kAmbiguitySpan = 10;
+constexpr std::size_t kSlopeBlocks = 8;
 
 double wrap(double x, double period) { return x - period * std::floor(x / period + 0.5); }
 
@@ -56,7 +57,8 @@ bool fractional_centroid(const CorrelationSums& sums, const RangeFocused& f, dou
   }
   c1 = 0.0;
   c0 = mean * prf / (2.0 * kPi) - c1 * (f.nearTime + count / 2.0 / fs - refTime);
-  if (x.size() >= 3) {
+  // A slope needs a swath wide enough to hold it; a narrow one keeps its mean.
+  if (x.size() >= kSlopeBlocks) {
     std::array<double, 2> c{};
     if (stripmap::polfit(x, y, c, 1) == 0) {
       c0 = c[0];
@@ -114,7 +116,7 @@ double zero_doppler_centroid(const metadata::SceneReferences&, double, double, d
 
 int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneReferences& refs,
                   std::span<const RangeFocused> focused, std::span<const CorrelationSums> sums, DopplerEstimate& est,
-                  GeometricCentroid geometric) {
+                  const GeometricCentroid& geometric) {
   base::Frame frame("burst_doppler");
   est = DopplerEstimate{};
   est.refTime = scan.nearTime[0];

@@ -27,6 +27,7 @@
 #include <array>
 #include <complex>
 #include <cstdint>
+#include <functional>
 #include <span>
 #include <string>
 #include <vector>
@@ -131,14 +132,14 @@ struct DopplerEstimate {
 /// Geometric centroid (Hz) at azimuth time t and range time tau: the orbit in `refs` and the
 /// antenna's attitude, here the zero-Doppler steering of ENVISAT. The callable lets a test or a
 /// job give another law.
-using GeometricCentroid = double (*)(const metadata::SceneReferences& refs, double t, double tau, double wavelength);
+using GeometricCentroid = std::function<double(const metadata::SceneReferences& refs, double t, double tau, double wavelength)>;
 double zero_doppler_centroid(const metadata::SceneReferences& refs, double t, double tau, double wavelength);
 
 /// Burst Doppler estimation of the selected sub-swaths. `sums` may be empty for a sub-swath
 /// (the geometric centroid is then used). Returns 0, or 10 when the orbit gives no geometry.
 int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneReferences& refs,
                   std::span<const RangeFocused> focused, std::span<const CorrelationSums> sums,
-                  DopplerEstimate& est, GeometricCentroid geometric = zero_doppler_centroid);
+                  DopplerEstimate& est, const GeometricCentroid& geometric = zero_doppler_centroid);
 
 /// The estimate to and from `D/doppler.par`. Return 0, or 1 when the file is missing or short.
 int save_doppler(const std::string& path, const DopplerEstimate& est, std::span<const RangeFocused> focused);
@@ -169,6 +170,23 @@ double line_time(const scansar& scan, const wsparm& par, int64_t line);
 /// Header of a focused sub-swath, `D/SS<s+1>.out.hdr`. Returns 0, or the profile's status.
 int write_WShdr(const std::string& path, int s, const scansar& scan, const wsparm& par, const DopplerEstimate& est,
                 const RangeFocused& focused, bool ascending);
+
+/// Stages of a run. A run that skips range and Doppler reads their results back from
+/// `D/doppler.par` and the range focused files; one that skips azimuth stops after writing them.
+struct WsStages {
+  bool rangeDoppler = true;
+  bool azimuth = true;
+  bool deleteTemporary = true;  // the range focused files go once azimuth focusing is done
+};
+
+/// The wide swath processor: from the five extracted sub-swaths (`channels`, index = sub-swath,
+/// their line files named in raw_file) and the scene's orbit and nominal replica (`refs`), the
+/// focused sub-swaths `D/SS<s>.out` with their headers, for the sub-swaths par.swathsToProcess
+/// selects. Returns 0, 1 for a burst selection outside the product, 10 for inputs that do not
+/// describe a wide swath acquisition, or the failing stage's status.
+int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const metadata::SceneReferences& refs,
+                wsparm& par, const WsStages& stages, bool ascending,
+                const GeometricCentroid& geometric = zero_doppler_centroid);
 
 /// A 17-byte line prefix.
 void encode_line_prefix(double sec85, int32_t line, unsigned char* out17);
