@@ -23,12 +23,4 @@ int main_focussing_asar_ap(const std::string& listPath) {
   stop_at("APprocessor", "APprocessor()");
 }
 
-int main_focussing_asar_ws_v2(const std::string& listPath) {
-  start_job(listPath, "Focussing ASAR WS",
-            "\nINPUT ASA_WS : [ %s ]\nINPUT DORIS : [ %s ]\nINPUT ASA_INS : [ %s ]\nINPUT ASA_XCA : [ %s ]\nINPUT "
-            "ASA_XCH : [ %s ]\nOUTPUT ROOT NAME : [ %s ]",
-            {0, 1, 2, 3, 7, 4});
-  stop_at("WSprocessor", "WSprocessor()");
-}
-
 }  // namespace sar::jobs
