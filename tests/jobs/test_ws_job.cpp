@@ -31,7 +31,6 @@ class WsJob : public ::testing::Test {
     c.samples = 640;
     c.lines = 525 + 4 * 360;
     c.noise_db = 0.0;
-    c.ws.swaths[1].incidence_deg = 28.8;  // SS2's window early in its PRI (see the scansar tests)
     c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
     c.ins_template = kInsTemplate;
     c.xca_template = kXcaTemplate;

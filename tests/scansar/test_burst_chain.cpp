@@ -35,9 +35,6 @@ sim::SimulationConfig ws_config(const std::string& tag, std::array<int, 5> order
   c.samples = kSamples;
   c.keep_echoes = false;
   c.ws.order = order;
-  // SS2 at 28.5 degrees opens its window 9284 samples after its pulse; the extraction counts
-  // the smallest window from 5000 up, so it is moved to open early in the next PRI.
-  c.ws.swaths[1].incidence_deg = 28.8;
   c.lines = 525 + 8 * 360;
   c.noise_db = 0.0;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}};

@@ -27,9 +27,6 @@ inline simulator::SimulationConfig ws_product(const std::string& tag, std::array
   c.samples = samples;
   c.keep_echoes = false;
   c.ws.order = order;
-  // SS2 at 28.5 degrees opens its window 9284 samples after its pulse; the extraction counts
-  // the smallest window from 5000 up, so it is moved to open early in the next PRI.
-  c.ws.swaths[1].incidence_deg = 28.8;
   c.lines = 525 + cycles * 360;
   c.noise_db = 0.0;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
