@@ -1,6 +1,7 @@
 // The wide swath job: a level 0 ASA_WS product through extraction and the burst chain to five
 // focused sub-swath images with their headers, D/SS<s>.out and D/SS<s>.out.hdr beside the
 // output root. Joining them into one image is the multilooker's step, which comes after.
+#include <chrono>
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
@@ -137,12 +138,15 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   extra.extract_percent = 100;
   extra.extract_kind = envisat::kExtractEchoes;
   {
+    const auto start = std::chrono::steady_clock::now();
     base::Frame frame("envi_extract");
     const int st = envisat::envi_extract(args[0], ins, xch, channels, extra, envisat::timeline_table_builder());
     if (st != 0) {
       note_failed_stage("envi_extract");
       base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_extract"});
     }
+    base::LogPrintf("Stage time %-14s %9.2f s\n", "extraction",
+                    std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count());
   }
   // Each sub-swath file holds its own bursts' echoes.
   for (envisat::sarpar& c : channels) c.lines = c.burst_count * c.burst_echoes;

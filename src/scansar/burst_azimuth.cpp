@@ -36,6 +36,7 @@ constexpr int kRejected = 10;
 constexpr double kPi = 3.14159265358979323846;
 constexpr double kC = 299792458.0;
 constexpr int kMargin = 32;
+constexpr int32_t kScaleNode = 16;
 constexpr double kPassBand = 0.75, kStopBand = 2.0;  // in burst bandwidths
 
 double poly(const std::array<double, 5>& c, double x) {
@@ -134,6 +135,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   std::vector<fcomplex> image(static_cast<std::size_t>(Lpb) * W);
   std::vector<unsigned char> line(17 + 8 * static_cast<std::size_t>(W));
   dsp::cvector z;
+  std::vector<float> scaleTable;
   par.firstLine[i] = 1000000;
   par.lastLine[i] = -1000000;
   par.earliestTime[i] = 1e20;
@@ -170,48 +172,90 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     const int64_t L1 = L0 + Lpb - 1;
     (void)hi;
     std::fill(image.begin(), image.end(), fcomplex{});
+    // One span of block rows for every column: the union of the columns' windows.
+    double u0 = 1e300, u1 = -1e300;
     for (int32_t c = 0; c < W; ++c) {
-      const double k = ka[static_cast<std::size_t>(c)], f0 = fdc[static_cast<std::size_t>(c)];
-      const double centre = tc - f0 / k;
-      const double B = std::abs(k) * N / p;
-      // Unwrapped block rows spanned by the column's window.
-      const double u0 = (centre - h - tb) * p, u1 = (centre + h - tb) * p;
-      const auto m0 = static_cast<int64_t>(std::floor(u0)) - kMargin;
-      const auto m1 = static_cast<int64_t>(std::ceil(u1)) + kMargin;
-      const int32_t len = dsp::genpow(static_cast<int32_t>(m1 - m0 + 1), 1);
-      z.assign(static_cast<std::size_t>(len), fcomplex{});
+      const double centre = tc - fdc[static_cast<std::size_t>(c)] / ka[static_cast<std::size_t>(c)];
+      u0 = std::min(u0, (centre - h - tb) * p);
+      u1 = std::max(u1, (centre + h - tb) * p);
+    }
+    const auto m0 = static_cast<int64_t>(std::floor(u0)) - kMargin;
+    const auto m1 = static_cast<int64_t>(std::ceil(u1)) + kMargin;
+    const auto span = static_cast<int32_t>(m1 - m0 + 1);
+    const int32_t len = dsp::genpow(span, 1);
+    z.assign(static_cast<std::size_t>(len) * W, fcomplex{});
+    const double t0 = m0 / p - (N - 1) / (2.0 * p);
+    // Deramp: exp(j pi Ka t^2) along the span, by a phasor recurrence (its second difference
+    // is constant), re-seeded every 256 rows against drift.
+#pragma omp parallel for schedule(static)
+    for (int32_t c = 0; c < W; ++c) {
+      const double k = ka[static_cast<std::size_t>(c)];
+      fcomplex* row = z.data() + static_cast<std::ptrdiff_t>(c) * len;
       const int32_t col = c0 + c;
-      for (int64_t m = m0; m <= m1; ++m) {
-        const int64_t r = ((m % Nf) + Nf) % Nf;
-        const double t = m / p - (N - 1) / (2.0 * p);
-        const double ph = kPi * k * t * t;
-        const std::complex<double> v = std::complex<double>(block[static_cast<std::size_t>(r) * M + col]) *
-                                       std::polar(1.0, ph);
-        z[static_cast<std::size_t>(m - m0)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+      std::complex<double> w, r;
+      const std::complex<double> q = std::polar(1.0, 2.0 * kPi * k / (p * p));
+      for (int32_t m = 0; m < span; ++m) {
+        if (m % 256 == 0) {
+          const double t = t0 + m / p;
+          w = std::polar(1.0, kPi * k * t * t);
+          r = std::polar(1.0, kPi * k * (2.0 * t / p + 1.0 / (p * p)));
+        }
+        const int64_t g = m0 + m;
+        const int64_t src = ((g % Nf) + Nf) % Nf;
+        const std::complex<double> v = std::complex<double>(block[static_cast<std::size_t>(src) * M + col]) * w;
+        row[m] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+        w *= r;
+        r *= q;
       }
-      dsp::fft_c(len, len, 1, 1, 1, 0, z);
-      for (int32_t q = 0; q < len; ++q) {
-        const double f = std::abs((q <= len / 2 ? q : q - len) * p / len);
+    }
+    dsp::fft_c(len, len, W, W, 1, 0, z);
+    // The alias-rejection low-pass of each column's burst band.
+#pragma omp parallel for schedule(static)
+    for (int32_t c = 0; c < W; ++c) {
+      const double B = std::abs(ka[static_cast<std::size_t>(c)]) * N / p;
+      fcomplex* row = z.data() + static_cast<std::ptrdiff_t>(c) * len;
+      for (int32_t qb = 0; qb < len; ++qb) {
+        const double f = std::abs((qb <= len / 2 ? qb : qb - len) * p / len);
         double g = 0.0;
         if (f <= kPassBand * B) g = 1.0;
         else if (f < kStopBand * B) g = 0.5 * (1.0 + std::cos(kPi * (f - kPassBand * B) / ((kStopBand - kPassBand) * B)));
-        z[static_cast<std::size_t>(q)] *= static_cast<float>(g);
+        row[qb] *= static_cast<float>(g);
       }
-      dsp::fft_c(len, len, 1, 1, -1, 0, z);
-      for (int64_t l = L0; l <= L1; ++l) {
-        const double T = l * a;
+    }
+    dsp::fft_c(len, len, W, W, -1, 0, z);
+    // De-scalloping factors: the centroid and rate move slowly across range, so they are taken
+    // at nodes every kScaleNode columns.
+    const int32_t nodes = (W + kScaleNode - 1) / kScaleNode;
+    const auto lines = static_cast<int32_t>(L1 - L0 + 1);
+    scaleTable.assign(static_cast<std::size_t>(nodes) * lines, 1.0f);
+    if (par.compensateAntenna) {
+#pragma omp parallel for schedule(static)
+      for (int32_t n = 0; n < nodes; ++n) {
+        const auto c = static_cast<std::size_t>(std::min(W - 1, n * kScaleNode + kScaleNode / 2));
+        for (int32_t l = 0; l < lines; ++l) {
+          const double d = (L0 + l) * a - tc;
+          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(scallop.scale(-d * ka[c], fdc[c], p));
+        }
+      }
+    }
+    // Resampling onto the output lines, reramp and de-scalloping.
+#pragma omp parallel for schedule(static)
+    for (int32_t c = 0; c < W; ++c) {
+      const double k = ka[static_cast<std::size_t>(c)];
+      const double centre = tc - fdc[static_cast<std::size_t>(c)] / k;
+      const fcomplex* row = z.data() + static_cast<std::ptrdiff_t>(c) * len;
+      const float* scale = scaleTable.data() + static_cast<std::size_t>(c / kScaleNode) * lines;
+      for (int32_t l = 0; l < lines; ++l) {
+        const double T = (L0 + l) * a;
         if (std::abs(T - centre) > h) continue;
         const double u = (T - tb) * p - static_cast<double>(m0);
-        const auto q = static_cast<int64_t>(std::floor(u));
-        if (q < 0 || q + 1 >= m1 - m0 + 1) continue;
-        const double frac = u - static_cast<double>(q);
-        const std::complex<double> v = (1.0 - frac) * std::complex<double>(z[static_cast<std::size_t>(q)]) +
-                                       frac * std::complex<double>(z[static_cast<std::size_t>(q + 1)]);
+        const auto qi = static_cast<int64_t>(std::floor(u));
+        if (qi < 0 || qi + 1 >= span) continue;
+        const double frac = u - static_cast<double>(qi);
+        const std::complex<double> v = (1.0 - frac) * std::complex<double>(row[qi]) + frac * std::complex<double>(row[qi + 1]);
         const double d = T - tc;
-        double scale = 1.0;
-        if (par.compensateAntenna) scale = scallop.scale(-d * k, f0, p);
-        const std::complex<double> o = v * std::polar(scale, -kPi * k * d * d);
-        image[static_cast<std::size_t>(l - L0) * W + c] = fcomplex(static_cast<float>(o.real()), static_cast<float>(o.imag()));
+        const std::complex<double> o = v * std::polar(static_cast<double>(scale[l]), -kPi * k * d * d);
+        image[static_cast<std::size_t>(l) * W + c] = fcomplex(static_cast<float>(o.real()), static_cast<float>(o.imag()));
       }
     }
     for (int64_t l = L0; l <= L1; ++l) {

@@ -1,4 +1,5 @@
 // The wide swath processor: the burst chain over the selected sub-swaths, stage by stage.
+#include <chrono>
 #include <filesystem>
 #include <string>
 
@@ -7,6 +8,23 @@
 #include "scansar/wide_swath.hpp"
 
 namespace sar::scansar {
+namespace {
+// Wall time of a stage into the log, so that an operator sees where a run spent it.
+class StageClock {
+ public:
+  explicit StageClock(const char* stage) : stage_(stage) {}
+  StageClock(const StageClock&) = delete;
+  StageClock& operator=(const StageClock&) = delete;
+  ~StageClock() {
+    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
+    base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, s);
+  }
+
+ private:
+  const char* stage_;
+  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+};
+}  // namespace
 
 int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const metadata::SceneReferences& refs,
                 wsparm& par, const WsStages& stages, bool ascending, const GeometricCentroid& geometric) {
@@ -22,6 +40,8 @@ int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const 
   DopplerEstimate est;
   if (stages.rangeDoppler) {
     std::array<CorrelationSums, kSwaths> sums{};
+    {
+    const StageClock clock("range");
     for (int s = 0; s < kSwaths; ++s) {
       if (!par.swathsToProcess[static_cast<std::size_t>(s)]) continue;
       base::LogPrintf("Range focusing sub-swath %d\n", s + 1);
@@ -29,6 +49,8 @@ int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const 
       if (const int st = burst_range_focus(dir, s, channels[i], scan, par, refs.replica, focused[i], sums[i]); st != 0)
         return frame.check(st);
     }
+    }
+    const StageClock clock("Doppler");
     if (const int st = burst_doppler(scan, par, refs, focused, sums, est, geometric); st != 0) return frame.check(st);
     if (const int st = save_doppler(dopplerFile, est, focused); st != 0) return frame.check(st);
   }
@@ -38,6 +60,7 @@ int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const 
   }
   if (!stages.azimuth) return 0;
   base::LogPrintf("Starting AZFOC\n");
+  const StageClock clock("azimuth");
   for (int s = 0; s < kSwaths; ++s) {
     const auto i = static_cast<std::size_t>(s);
     if (!par.swathsToProcess[i]) continue;
