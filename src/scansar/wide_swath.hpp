@@ -43,6 +43,8 @@ inline constexpr int kSwaths = 5;
 /// Echoes between the last echo of a burst and the end of its block: the calibration pulse and
 /// the change-over PRI. The block's first rank - kBurstSpacing PRIs hold noise packets.
 inline constexpr int kBurstSpacing = 2;
+/// Beam slots (1-based) of SS1..SS5 in the ASA_INS and ASA_XCA pattern tables.
+inline constexpr std::array<int, kSwaths> kBeamSlot = {8, 3, 4, 5, 6};
 /// Mid-swath incidence angles (degrees) of SS1..SS5 for the range look bandwidths.
 inline constexpr std::array<double, kSwaths> kLookIncidence = {21.64, 28.62, 33.62, 37.5, 40.87};
 

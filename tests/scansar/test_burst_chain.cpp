@@ -28,6 +28,7 @@ namespace {
 
 constexpr int kSamples = 1000;
 constexpr double kPi = 3.14159265358979323846;
+constexpr int kTargetOfSwath[5] = {1, 2, 0, 3, 4};  // the first target lies in SS3
 
 sim::SimulationConfig ws_config(const std::string& tag, std::array<int, 5> order) {
   sim::SimulationConfig c = sar::test::small_im_config("scansar_" + tag, {});
@@ -35,7 +36,7 @@ sim::SimulationConfig ws_config(const std::string& tag, std::array<int, 5> order
   c.samples = kSamples;
   c.keep_echoes = false;
   c.ws.order = order;
-  c.lines = 525 + 8 * 360;
+  c.lines = 525 + 6 * 360;
   c.noise_db = 0.0;
   c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
   for (int s : {0, 1, 3, 4}) c.targets.push_back({sim::ws_swath_target(c, s, 0.0), 30.0});
@@ -137,10 +138,6 @@ class WsBurstChain : public ::testing::Test {
     truth_ = &sar::test::simulated(*config_);
     chain_ = new Chain;
     front_end(*truth_, config_->out_dir + "/run", *chain_);
-    for (int s = 0; s < 5 && !::testing::Test::HasFatalFailure(); ++s)
-      ASSERT_EQ(burst_azimuth_focus(chain_->dir, s, chain_->scan, chain_->par, chain_->est,
-                                    chain_->focused[static_cast<std::size_t>(s)]),
-                0);
   }
   static void TearDownTestSuite() {
     delete chain_;
@@ -154,12 +151,20 @@ sim::SimulationConfig* WsBurstChain::config_ = nullptr;
 const sim::SimulationTruth* WsBurstChain::truth_ = nullptr;
 Chain* WsBurstChain::chain_ = nullptr;
 
+// Focused without and with de-scalloping. De-scalloping scales each line by the pattern at the
+// Doppler a target at that line's time had in the burst; a target seen off the beam centre
+// (up to half a cycle of Doppler, about 200 Hz, in the burst nearest it) has its response tilted
+// by the pattern's slope, which moves its peak by up to about 0.11 ms (0.2 of these 0.6 ms
+// lines): the position is held to 0.2 lines without it and to 0.35 with it.
 TEST_F(WsBurstChain, PointTargetsLieOnTheTimeTagsAndRangeGridWithTheWindowsWidths) {
   ASSERT_NE(chain_, nullptr);
-  const Chain& x = *chain_;
-  const int target_of_swath[5] = {1, 2, 0, 3, 4};
+  Chain& x = *chain_;
+  for (const int compensate : {0, 1}) {
+  x.par.compensateAntenna = compensate;
+  for (int s = 0; s < 5; ++s)
+    ASSERT_EQ(burst_azimuth_focus(x.dir, s, x.scan, x.par, x.est, x.focused[static_cast<std::size_t>(s)]), 0);
   for (int s = 0; s < 5; ++s) {
-    SCOPED_TRACE("SS" + std::to_string(s + 1));
+    SCOPED_TRACE("SS" + std::to_string(s + 1) + (compensate ? " de-scalloped" : ""));
     const auto i = static_cast<std::size_t>(s);
     const RangeFocused& f = x.focused[i];
     const int width = f.validColumns - x.par.rangeOverlap;
@@ -167,7 +172,7 @@ TEST_F(WsBurstChain, PointTargetsLieOnTheTimeTagsAndRangeGridWithTheWindowsWidth
     const std::vector<Line> lines = read_out(chain_->dir + "/SS" + std::to_string(s + 1) + ".out", width);
     const int Lpb = x.par.linesPerBurst[i];
     ASSERT_EQ(static_cast<int>(lines.size()), Lpb * x.scan.bursts);
-    const sim::TargetTruth& tt = truth_->targets[static_cast<std::size_t>(target_of_swath[s])];
+    const sim::TargetTruth& tt = truth_->targets[static_cast<std::size_t>(kTargetOfSwath[s])];
     const double expLine = (tt.zero_doppler_time - x.scan.firstLineTime) / x.par.azimuthStep;
     const double expSample = (tt.range_time - outNear) * x.scan.samplingRate;
     ASSERT_GT(expSample, 40.0);
@@ -203,15 +208,16 @@ TEST_F(WsBurstChain, PointTargetsLieOnTheTimeTagsAndRangeGridWithTheWindowsWidth
     const double azTheory = window_width(burst_window(x.scan.echoes[i], x.par.azimuthHamming),
                                          std::abs(ka) / x.scan.prf[i]) / x.par.azimuthStep;
     const double rgTheory = range_width_samples(x.par.rangeHamming, x.scan.chirpBandwidth[i], x.scan.samplingRate);
-    RecordProperty("SS" + std::to_string(s + 1),
+    RecordProperty("SS" + std::to_string(s + 1) + (compensate ? "_descalloped" : ""),
                    "az_off " + std::to_string(m.peak_line - expLine) + " rg_off " + std::to_string(m.peak_sample - expSample) +
                        " az_res " + std::to_string(m.res_az_px) + "/" + std::to_string(azTheory) + " rg_res " +
                        std::to_string(m.res_rg_px) + "/" + std::to_string(rgTheory) + " pslr_az " +
                        std::to_string(m.pslr_az_db) + " pslr_rg " + std::to_string(m.pslr_rg_db));
-    EXPECT_NEAR(m.peak_line, expLine, 0.2);
+    EXPECT_NEAR(m.peak_line, expLine, compensate ? 0.35 : 0.2);
     EXPECT_NEAR(m.peak_sample, expSample, 0.2);
     EXPECT_NEAR(m.res_az_px / azTheory, 1.0, 0.10);
     EXPECT_NEAR(m.res_rg_px / rgTheory, 1.0, 0.10);
+  }
   }
 }
 

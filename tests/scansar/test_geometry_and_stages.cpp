@@ -12,6 +12,7 @@
 
 #include "base/errors.hpp"
 #include "dsp/fft.hpp"
+#include "envisat/aux_products.hpp"
 #include "ws_fixture.hpp"
 
 using namespace sar::scansar;
@@ -135,7 +136,7 @@ wsparm BurstDoppler::par_;
 std::array<RangeFocused, kSwaths> BurstDoppler::focused_;
 std::array<CorrelationSums, kSwaths> BurstDoppler::sums_;
 
-TEST_F(BurstDoppler, CentroidOfEverySubSwathWithItsAmbiguity) {
+TEST_F(BurstDoppler, CentroidOfEverySubSwathWithItsAmbiguityOrTheOnesGiven) {
   ASSERT_NE(x_, nullptr);
   struct Row {
     const char* name;
@@ -171,19 +172,17 @@ TEST_F(BurstDoppler, CentroidOfEverySubSwathWithItsAmbiguity) {
       EXPECT_NEAR(r[0] + x * (r[1] + x * r[2]), tt.doppler_rate, 0.01 * std::abs(tt.doppler_rate)) << "SS" << s + 1;
     }
   }
-}
-
-TEST_F(BurstDoppler, AGivenAmbiguityReferenceIsTakenAsItStands) {
-  ASSERT_NE(x_, nullptr);
-  wsparm par = par_;
-  // A reference one PRF of SS1 below the truth: the data's fractions are kept, their
-  // ambiguity follows the reference and no warning is raised.
-  const sim::TargetTruth& first = truth_->targets[static_cast<std::size_t>(sar::test::target_of_swath(0))];
-  par.centroidReference = first.doppler_centroid - scan_.prf[0];
-  DopplerEstimate est;
-  ASSERT_EQ(burst_doppler(scan_, par, x_->refs, focused_, sums_, est, prediction(0.0)), 0);
-  EXPECT_FALSE(est.geometricApplied);
-  EXPECT_NEAR(centroid_at(est, 0, first.range_time), first.doppler_centroid - scan_.prf[0], 0.04 * scan_.prf[0]);
+  {
+    // A given ambiguity reference is taken as it stands: one PRF of SS1 below the truth, the
+    // data's fractions are kept, their ambiguity follows the reference and no warning is raised.
+    wsparm par = par_;
+    const sim::TargetTruth& first = truth_->targets[static_cast<std::size_t>(sar::test::target_of_swath(0))];
+    par.centroidReference = first.doppler_centroid - scan_.prf[0];
+    DopplerEstimate est;
+    ASSERT_EQ(burst_doppler(scan_, par, x_->refs, focused_, sums_, est, prediction(0.0)), 0);
+    EXPECT_FALSE(est.geometricApplied);
+    EXPECT_NEAR(centroid_at(est, 0, first.range_time), first.doppler_centroid - scan_.prf[0], 0.04 * scan_.prf[0]);
+  }
 }
 
 // ---------------------------------------------------------------------------------------------
@@ -272,6 +271,27 @@ TEST_F(WsStagesRun, BadInputGivesItsStatusAndLeavesNoProduct) {
   } catch (const sar::base::CErrorExceptionManager& e) {
     EXPECT_EQ(e.ec(), sar::base::ec::kFileIo);
     EXPECT_EQ(e.detail(), channels[4].raw_file);
+  }
+}
+
+}  // namespace
+
+namespace {
+
+// The sub-swaths' beam slots in the instrument tables: the pattern's reference look angle of
+// each slot in the real ASA_INS against the look angle of the sub-swath's mid-swath incidence
+// (a sphere of the Earth's mean radius, the platform 782 km above it).
+TEST(BeamSlots, PatternLookAnglesMatchTheSubSwathsIncidences) {
+  const sar::envisat::InsRecord ins = sar::envisat::InsRecord::read(sar::test::kInsTemplate);
+  constexpr double kDeg = 3.14159265358979323846 / 180.0;
+  const double re = 6371000.0, rs = re + 782000.0;
+  for (int s = 0; s < kSwaths; ++s) {
+    const double look = std::asin(re / rs * std::sin(kLookIncidence[static_cast<std::size_t>(s)] * kDeg)) / kDeg;
+    const double table = ins.pattern_reference_angle(kBeamSlot[static_cast<std::size_t>(s)]);
+    RecordProperty("SS" + std::to_string(s + 1), std::to_string(table) + " / " + std::to_string(look));
+    EXPECT_NEAR(table, look, 0.3) << "SS" << s + 1;
+    // The raw beam code of the sub-swath names no pattern at all.
+    EXPECT_EQ(ins.pattern_reference_angle(15 + s), 0.0f) << "SS" << s + 1;
   }
 }
 
