@@ -31,6 +31,7 @@ constexpr double kC = 299792458.0;
 constexpr int kColumnBlock = 32;
 constexpr int kAmbiguitySpan = 10;
 constexpr std::size_t kSlopeBlocks = 8;
+constexpr double kNoiseSigmas = 5.0;
 
 double wrap(double x, double period) { return x - period * std::floor(x / period + 0.5); }
 
@@ -44,8 +45,16 @@ bool fractional_centroid(const CorrelationSums& sums, const RangeFocused& f, dou
   if (sums.pairs <= 0 || sums.sum.empty()) return false;
   const int32_t first = f.firstValid, count = f.validColumns;
   std::complex<double> total{};
-  for (int32_t k = first; k < first + count; ++k) total += sums.sum[static_cast<std::size_t>(k)];
+  double power = 0.0;
+  for (int32_t k = first; k < first + count; ++k) {
+    total += sums.sum[static_cast<std::size_t>(k)];
+    if (static_cast<std::size_t>(k) < sums.power.size()) power += sums.power[static_cast<std::size_t>(k)];
+  }
   if (std::abs(total) <= 2.220446e-16) return false;
+  // Noise alone leaves a correlation coefficient of about 1 / sqrt(samples): a sub-swath whose
+  // echoes correlate no better than five times that holds no centroid to read.
+  const double samples = static_cast<double>(sums.pairs) * count;
+  if (power > 0.0 && std::abs(total) / power < kNoiseSigmas / std::sqrt(samples)) return false;
   const double mean = std::arg(total);
   std::vector<double> x, y;
   for (int32_t k = first; k + kColumnBlock <= first + count; k += kColumnBlock) {

@@ -73,6 +73,7 @@ int burst_range_focus(const std::string& dir, int s, const sarpar& channel, cons
   }
 
   sums.sum.assign(static_cast<std::size_t>(out.width), {0.0, 0.0});
+  sums.power.assign(static_cast<std::size_t>(out.width), 0.0);
   sums.pairs = 0;
   ByteWriter file(dir + "/rgfoc_ss" + std::to_string(s + 1));
   std::vector<unsigned char> raw(static_cast<std::size_t>(record * N));
@@ -110,8 +111,11 @@ int burst_range_focus(const std::string& dir, int s, const sarpar& channel, cons
     for (int32_t e = 1; e < N; ++e) {
       const fcomplex* a = focused.data() + static_cast<std::ptrdiff_t>(e) * out.width;
       const fcomplex* p = a - out.width;
-      for (int32_t k = 0; k < out.width; ++k)
-        sums.sum[static_cast<std::size_t>(k)] += std::complex<double>(a[k]) * std::conj(std::complex<double>(p[k]));
+      for (int32_t k = 0; k < out.width; ++k) {
+        const std::complex<double> x(a[k]), y(p[k]);
+        sums.sum[static_cast<std::size_t>(k)] += x * std::conj(y);
+        sums.power[static_cast<std::size_t>(k)] += 0.5 * (std::norm(x) + std::norm(y));
+      }
     }
     sums.pairs += N - 1;
     const double t = near;

@@ -95,9 +95,11 @@ int derive_geometry(std::span<const sarpar> channels, scansar& scan);
 int check_bursts(const scansar& scan, wsparm& par);
 
 /// Correlation sums of adjacent echoes over all bursts of a sub-swath, per output column:
-/// sum of z[i] conj(z[i-1]), and the count of pairs.
+/// sum of z[i] conj(z[i-1]), the pairs' mean power (|z[i]|^2 + |z[i-1]|^2) / 2, and the count of
+/// pairs.
 struct CorrelationSums {
   std::vector<std::complex<double>> sum;
+  std::vector<double> power;
   int64_t pairs = 0;
 };
 

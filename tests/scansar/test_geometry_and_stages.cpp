@@ -8,6 +8,7 @@
 #include <iterator>
 #include <string>
 #include <functional>
+#include <random>
 #include <vector>
 
 #include "base/errors.hpp"
@@ -182,6 +183,25 @@ TEST_F(BurstDoppler, CentroidOfEverySubSwathWithItsAmbiguityOrTheOnesGiven) {
     ASSERT_EQ(burst_doppler(scan_, par, x_->refs, focused_, sums_, est, prediction(0.0)), 0);
     EXPECT_FALSE(est.geometricApplied);
     EXPECT_NEAR(centroid_at(est, 0, first.range_time), first.doppler_centroid - scan_.prf[0], 0.04 * scan_.prf[0]);
+  }
+  {
+    // A sub-swath of noise alone: correlations of random phase, as weak as noise leaves them.
+    // It holds no centroid, and takes the orbit's.
+    std::array<CorrelationSums, kSwaths> sums = sums_;
+    CorrelationSums& noise = sums[1];
+    std::mt19937 random(3);
+    std::normal_distribution<double> g(0.0, 1.0);
+    const double perColumn = std::sqrt(static_cast<double>(noise.pairs));
+    for (std::size_t k = 0; k < noise.sum.size(); ++k) {
+      noise.sum[k] = {g(random) * perColumn, g(random) * perColumn};
+      noise.power[k] = static_cast<double>(noise.pairs);
+    }
+    DopplerEstimate est;
+    ASSERT_EQ(burst_doppler(scan_, par_, x_->refs, focused_, sums, est, prediction(150.0)), 0);
+    const sim::TargetTruth& tt = truth_->targets[static_cast<std::size_t>(sar::test::target_of_swath(1))];
+    EXPECT_NEAR(centroid_at(est, 1, tt.range_time), tt.doppler_centroid + 150.0, 1.0);
+    EXPECT_NEAR(centroid_at(est, 0, truth_->targets[1].range_time), truth_->targets[1].doppler_centroid,
+                0.04 * scan_.prf[0]);
   }
 }
 
