@@ -271,6 +271,9 @@ void Walker::echo(std::int64_t i, int channel, int expected) {
     s.swstSeen = true;
     s.currentSwst = swst;
     p.swst_change_count = 0;
+    // The start value only stands for "no window met yet": a channel whose windows all open
+    // later than it (a wide swath sub-swath late in its PRI) has its first window as the smallest.
+    if (s.minSwst >= kSwstMinStart) s.minSwst = swst;
   } else if (swst != s.currentSwst) {
     if (mode_ == kModeWS && p.swst_change_count >= 0 && p.swst_change_count < kMaxSwstChanges)
       p.swst_change_burst[static_cast<std::size_t>(p.swst_change_count)] = burstCounter_;

@@ -52,8 +52,9 @@ const EntryCase kCases[] = {
     {"ap_prefix_runs_ap_driver",
      [](ScratchJob& j) { return "main_focussing_asar_AP#" + list_of(j, with_header(im_args(j))); }, 456962, 7,
      "ASA_AP0", "START : Focussing ASAR AP"},
+    // The WS job runs, and refuses the IM level 0 product it is given.
     {"ws_prefix", [](ScratchJob& j) { return "main_focussing_asar_WS#" + list_of(j, with_header(im_args(j))); },
-     130560, 2, "WSprocessor()", "START : Focussing ASAR WS"},
+     456962, 7, "ASA_WS0", "START : Focussing ASAR WS"},
     {"rs_prefix", [](ScratchJob& j) { return "main_focussing_asar_RS#" + list_of(j, with_header(im_args(j))); },
      130560, 2, "RADARExtract()", "START : Focussing ASAR RS"},
     // The WSS job runs, and refuses the IM level 0 product it is given.

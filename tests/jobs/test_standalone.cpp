@@ -101,8 +101,8 @@ TEST(Standalone, BadInputsGiveOneClearLineAndWriteNothing) {
   }
   {
     auto r = base;
-    r.mode = "ws";
-    cases.push_back({"mode still to come", r, "mode 'ws' is not available"});
+    r.mode = "ap";
+    cases.push_back({"mode still to come", r, "mode 'ap' is not available"});
   }
   {
     auto r = base;

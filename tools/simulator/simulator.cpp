@@ -212,6 +212,33 @@ Fault fault_from_name(const std::string& name) {
   throw std::invalid_argument("unknown fault: " + name);
 }
 
+Geodetic ws_swath_target(const SimulationConfig& c, int swath, double along_track_s) {
+  if (c.targets.empty() || swath < 0 || swath > 4) throw std::invalid_argument("ws_swath_target needs a first target and a sub-swath 0 to 4");
+  const double t_scene = base::ascii2sec85(c.scene_time);
+  const OrbitModel orbit = OrbitModel::for_scene(c.targets.front().position, t_scene, scene_incidence(c), c.ascending,
+                                                 c.orbit_number);
+  const Vec3 first = geodetic_to_ecef(c.targets.front().position);
+  const double re = first.norm();
+  const StateVector st = orbit.state(t_scene + along_track_s);
+  const double rs = orbit.state(t_scene).position.norm();
+  const double R = slant_range_at_incidence(rs, re, c.ws.swaths[static_cast<std::size_t>(swath)].incidence_deg);
+  // In the plane normal to the velocity through the satellite: down and to the first target's side.
+  const Vec3 vhat = st.velocity.unit();
+  Vec3 down = st.position * -1.0;
+  down = (down - vhat * down.dot(vhat)).unit();
+  Vec3 side = vhat.cross(down).unit();
+  const Vec3 toFirst = first - orbit.state(t_scene).position;
+  if (side.dot(toFirst) < 0.0) side = side * -1.0;
+  double lo = 0.0, hi = kPi / 2;
+  for (int it = 0; it < 200; ++it) {
+    const double m = 0.5 * (lo + hi);
+    const Vec3 p = st.position + (down * std::cos(m) + side * std::sin(m)) * R;
+    if (p.norm() < re) lo = m; else hi = m;
+  }
+  const double m = 0.5 * (lo + hi);
+  return ecef_to_geodetic(st.position + (down * std::cos(m) + side * std::sin(m)) * R);
+}
+
 ClutterGeometry clutter_geometry(const SimulationConfig& c, const SimulationTruth& truth) {
   if (c.targets.empty()) throw std::invalid_argument("the scene needs at least one target");
   if (is_ws(c)) throw std::invalid_argument("clutter is simulated in IM and AP only");

@@ -271,6 +271,11 @@ SimulationTruth run_simulation(const SimulationConfig& config);
 /// their own reflectivity. IM and AP only.
 ClutterGeometry clutter_geometry(const SimulationConfig& config, const SimulationTruth& truth);
 
+/// A wide swath target for sub-swath `swath` of a configuration whose first target is set: on
+/// the first target's sphere, at the middle of that sub-swath's range window, seen at zero
+/// Doppler `along_track_s` seconds after the scene time.
+Geodetic ws_swath_target(const SimulationConfig& config, int swath, double along_track_s);
+
 /// Receive gain g(k) of the model in `im`, for k in [0, count).
 std::vector<double> receive_gain(const ImParameters& im, int count);
 

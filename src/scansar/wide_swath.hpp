@@ -1,0 +1,199 @@
+#pragma once
+// Wide swath (ScanSAR) burst chain: five sub-swaths, each imaged in short bursts, each burst
+// focused alone and its lines placed on one azimuth time grid common to every burst and
+// sub-swath.
+//
+// Stages, each callable on its own so that a job can stop after one and resume later:
+//   derive_geometry      the acquisition of the five sub-swaths from their `sarpar` records
+//   burst_range_focus    per sub-swath: I/Q repair, window alignment, range compression with a
+//                        Hamming weight, invalid columns trimmed; the correlation sums of
+//                        adjacent echoes are kept for the centroid
+//   burst_doppler        centroid per sub-swath from the sums, ambiguity resolved jointly over
+//                        the sub-swaths' different PRFs and checked against the orbit; the
+//                        Doppler rate and the slant-to-ground geometry from the orbit
+//   burst_azimuth_focus  per burst: Hamming weight, omega-K compression of the burst padded to
+//                        three times its length, deramp, replication of the periodic block,
+//                        alias-rejection low-pass, resampling onto the common time grid, reramp
+//                        and de-scalloping
+//
+// Files under the work directory D, s = 1..5:
+//   D/SS<s>            extracted echoes (the extraction's line file: float32 range time, samples)
+//   D/rgfoc_ss<s>      per burst a float64 near range time, then echoes x width complex floats
+//   D/rgfoc_ss<s>.hdr  range focusing parameters
+//   D/doppler.par      the centroid and rate estimates, read back by a resumed run
+//   D/SS<s>.out        azimuth focused lines: a 17-byte big-endian prefix (MJD2000 days, seconds,
+//                      microseconds, a zero flag byte, the output line number), then the samples
+//   D/SS<s>.out.hdr    everything the multilooker needs of the sub-swath
+#include <array>
+#include <complex>
+#include <cstdint>
+#include <functional>
+#include <span>
+#include <string>
+#include <vector>
+
+#include "metadata/acquisition.hpp"
+#include "metadata/scene_references.hpp"
+
+namespace sar::scansar {
+
+using fcomplex = std::complex<float>;
+using metadata::sarpar;
+inline constexpr int kSwaths = 5;
+/// Echoes between the last echo of a burst and the end of its block: the calibration pulse and
+/// the change-over PRI. The block's first rank - kBurstSpacing PRIs hold noise packets.
+inline constexpr int kBurstSpacing = 2;
+/// Beam slots (1-based) of SS1..SS5 in the ASA_INS and ASA_XCA pattern tables.
+inline constexpr std::array<int, kSwaths> kBeamSlot = {8, 3, 4, 5, 6};
+/// Mid-swath incidence angles (degrees) of SS1..SS5 for the range look bandwidths.
+inline constexpr std::array<double, kSwaths> kLookIncidence = {21.64, 28.62, 33.62, 37.5, 40.87};
+
+/// The acquisition of the five sub-swaths. Index s is the sub-swath (SS1 = 0).
+struct scansar {
+  double samplingRate = 0.0;      // Hz
+  double carrierFrequency = 0.0;  // Hz
+  double firstLineTime = 0.0;     // sec85: first echo of the first burst of the first fired sub-swath
+  double cycleTime = 0.0;         // s
+  int32_t bursts = 0;             // bursts per sub-swath
+  std::array<double, kSwaths> prf{}, nearTime{}, farTime{}, burstOffset{}, pulseLength{}, chirpBandwidth{};
+  std::array<int32_t, kSwaths> rank{}, spacing{}, echoes{}, samples{}, spread{}, fftLength{};
+  std::array<int32_t, kSwaths> order{};      // firing list: position k fires sub-swath order[k]
+  std::array<int32_t, kSwaths> successor{};  // sub-swath fired after sub-swath s
+  std::array<double, kSwaths> lookBandwidth{};  // Hz, range look band for a ground resolution
+};
+
+/// Processing choices (section "Focusing_parameters") and the running state of a run.
+struct wsparm {
+  std::array<int32_t, kSwaths> swathsToProcess{1, 1, 1, 1, 1};
+  int32_t firstBurst = 1, lastBurst = 0;  // 1-based; lastBurst 0: all
+  double azimuthStep = 0.0006;            // s, spacing of output lines
+  double rangeHamming = 0.75;             // Rg_win_hamm; 1: no weight
+  int32_t rangeFilterLength = 8;          // Rg_win_len
+  double azimuthHamming = 0.75;           // Az_burst_hamm_win; 1: no weight
+  double windowWidth1 = 0.5, windowWidth2 = 0.5;  // in burst cycles
+  double groundResolution = 150.0;        // m
+  int32_t compensateAntenna = 1;          // de-scalloping
+  bool normalisedSinc = false;            // the pattern's sinc as sin(pi y)/(pi y): wrong, kept to show it
+  int32_t burstPadding = 3;               // a burst is focused in genpow(burstPadding x echoes) lines
+  int32_t samplesInBlock = 512;           // range sub-block of the omega-K kernel
+  int32_t rangeOverlap = 32;              // full overlap of range sub-blocks
+  double antennaLength = 10.0;            // m
+  double centroidReference = -1e10;       // Hz; above -1e9 the ambiguity is taken from it
+  // Running results per sub-swath.
+  std::array<double, kSwaths> earliestTime{}, latestTime{};
+  std::array<int32_t, kSwaths> firstLine{}, lastLine{};
+  std::array<int32_t, kSwaths> linesPerBurst{};
+};
+
+/// Fills `scan` from the five channels (index = sub-swath) the extraction gave. Returns 0, or 10
+/// with a report for channels that do not describe a wide swath acquisition (not five, no PRF,
+/// no echoes, a firing list that is not a permutation, bursts that disagree).
+int derive_geometry(std::span<const sarpar> channels, scansar& scan);
+
+/// Burst selection against the product; lastBurst 0 becomes the burst count. Returns 0, or 1
+/// with "Wrong number of bursts to focus chosen".
+int check_bursts(const scansar& scan, wsparm& par);
+
+/// Correlation sums of adjacent echoes over all bursts of a sub-swath, per output column:
+/// sum of z[i] conj(z[i-1]), the pairs' mean power (|z[i]|^2 + |z[i-1]|^2) / 2, and the count of
+/// pairs.
+struct CorrelationSums {
+  std::vector<std::complex<double>> sum;
+  std::vector<double> power;
+  int64_t pairs = 0;
+};
+
+/// What range focusing gives per sub-swath.
+struct RangeFocused {
+  int32_t width = 0;         // samples of a focused echo
+  int32_t firstValid = 0;    // columns before it hold the alignment's zeros
+  int32_t validColumns = 0;  // columns that every echo fills whole
+  double nearTime = 0.0;     // two-way time of column 0
+};
+
+/// Range focusing of sub-swath s from `channel.raw_file` into `D/rgfoc_ss<s+1>`, with the
+/// nominal replica `replica` (centred). Returns 0, or 10 for a line file that does not hold the
+/// bursts, or the file I/O code.
+int burst_range_focus(const std::string& dir, int s, const sarpar& channel, const scansar& scan, const wsparm& par,
+                      std::span<const fcomplex> replica, RangeFocused& out, CorrelationSums& sums);
+
+/// Centroid and rate of every sub-swath, as polynomials in two-way range time about refTime
+/// (the near range of SS1): c0 + c1 x + c2 x^2 + c3 x^3 + c4 x^4.
+struct DopplerEstimate {
+  double refTime = 0.0;
+  std::array<std::array<double, 5>, kSwaths> centroid{};
+  std::array<std::array<double, 5>, kSwaths> rate{};
+  std::array<double, kSwaths> fractional{};  // Hz, the data's centroid at mid swath, within one PRF
+  std::array<int32_t, kSwaths> ambiguity{};
+  std::array<double, kSwaths> geometric{};   // Hz, the orbit's centroid at mid swath
+  double satelliteSpeed = 0.0;               // |V|, Earth-fixed, m/s
+  std::array<double, kSwaths> incidence{};   // degrees, mid swath
+  std::array<std::array<double, 5>, kSwaths> slantToGround{};  // ground range (m) in range time about each near time
+  bool ambiguityDoubtful = false;
+  bool geometricApplied = false;  // the data disagreed with the orbit by more than half a PRF
+};
+
+/// Geometric centroid (Hz) at azimuth time t and range time tau: the orbit in `refs` and the
+/// antenna's attitude, here the zero-Doppler steering of ENVISAT. The callable lets a test or a
+/// job give another law.
+using GeometricCentroid = std::function<double(const metadata::SceneReferences& refs, double t, double tau, double wavelength)>;
+double zero_doppler_centroid(const metadata::SceneReferences& refs, double t, double tau, double wavelength);
+
+/// Burst Doppler estimation of the selected sub-swaths. `sums` may be empty for a sub-swath
+/// (the geometric centroid is then used). Returns 0, or 10 when the orbit gives no geometry.
+int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneReferences& refs,
+                  std::span<const RangeFocused> focused, std::span<const CorrelationSums> sums,
+                  DopplerEstimate& est, const GeometricCentroid& geometric = zero_doppler_centroid);
+
+/// The estimate to and from `D/doppler.par`. Return 0, or 1 when the file is missing or short.
+int save_doppler(const std::string& path, const DopplerEstimate& est, std::span<const RangeFocused> focused);
+int load_doppler(const std::string& path, DopplerEstimate& est, std::array<RangeFocused, kSwaths>& focused);
+
+/// The antenna's two-way power pattern against the Doppler of a line, as de-scalloping uses it.
+struct ScallopModel {
+  double lengthOverWavelength = 0.0;  // L / lambda
+  double halfWavelengthOverSpeed = 0.0;  // lambda / (2 |V|)
+  bool normalisedSinc = false;
+  /// Two-way power gain of Doppler f for a beam centred on centroid fdc.
+  double gain(double f, double fdc) const;
+  /// The factor a line of Doppler f is multiplied by: 1 / (sqrt(G(f) + G(f + prf) + G(f - prf)) + 1e-4).
+  double scale(double f, double fdc, double prf) const;
+};
+
+/// Azimuth focusing of sub-swath s from `D/rgfoc_ss<s+1>` into `D/SS<s+1>.out`. Returns 0, or
+/// 10 for inputs that cannot be focused, or the failing step's status.
+int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wsparm& par,
+                        const DopplerEstimate& est, const RangeFocused& focused);
+
+/// Half the azimuth window of a burst's output, seconds.
+double half_window(const scansar& scan, const wsparm& par);
+
+/// Output line number of time t (sec85) on the common grid, and the time of a line.
+double line_time(const scansar& scan, const wsparm& par, int64_t line);
+
+/// Header of a focused sub-swath, `D/SS<s+1>.out.hdr`. Returns 0, or the profile's status.
+int write_WShdr(const std::string& path, int s, const scansar& scan, const wsparm& par, const DopplerEstimate& est,
+                const RangeFocused& focused, bool ascending);
+
+/// Stages of a run. A run that skips range and Doppler reads their results back from
+/// `D/doppler.par` and the range focused files; one that skips azimuth stops after writing them.
+struct WsStages {
+  bool rangeDoppler = true;
+  bool azimuth = true;
+  bool deleteTemporary = true;  // the range focused files go once azimuth focusing is done
+};
+
+/// The wide swath processor: from the five extracted sub-swaths (`channels`, index = sub-swath,
+/// their line files named in raw_file) and the scene's orbit and nominal replica (`refs`), the
+/// focused sub-swaths `D/SS<s>.out` with their headers, for the sub-swaths par.swathsToProcess
+/// selects. Returns 0, 1 for a burst selection outside the product, 10 for inputs that do not
+/// describe a wide swath acquisition, or the failing stage's status.
+int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const metadata::SceneReferences& refs,
+                wsparm& par, const WsStages& stages, bool ascending,
+                const GeometricCentroid& geometric = zero_doppler_centroid);
+
+/// A 17-byte line prefix.
+void encode_line_prefix(double sec85, int32_t line, unsigned char* out17);
+double decode_line_prefix(const unsigned char* in17, int32_t& line);
+
+}  // namespace sar::scansar
