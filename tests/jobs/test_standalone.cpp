@@ -101,11 +101,6 @@ TEST(Standalone, BadInputsGiveOneClearLineAndWriteNothing) {
   }
   {
     auto r = base;
-    r.mode = "ap";
-    cases.push_back({"mode still to come", r, "mode 'ap' is not available"});
-  }
-  {
-    auto r = base;
     r.orbit = kReal.string();
     cases.push_back({"no covering orbit", r, "covers the product's sensing start 29-MAR-2012 07:11:34"});
   }
