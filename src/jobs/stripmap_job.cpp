@@ -89,10 +89,12 @@ void check_aux_type(const std::string& path, bool ok, std::string_view detail) {
   if (!ok) base::fatal(base::ec::kBadArguments, {std::string(detail), path, "not of that product type"});
 }
 
+}  // namespace
+
 // An input that fails inside the chain: an orbit that does not reach over the image is a stage
 // that cannot run (the record tells the image's times beside the file's span); any other fault
 // keeps the code its reader gave it.
-[[noreturn]] void fail_on_input(const base::InputError& e, const std::string& processorDetail, const sarpar& par) {
+void fail_on_input(const base::InputError& e, const std::string& processorDetail, const sarpar& par) {
   base::report(base::kReportError, e.what());
   int32_t code = e.host_code();
   std::string text = e.what();
@@ -108,8 +110,6 @@ void check_aux_type(const std::string& path, bool ok, std::string_view detail) {
   }
   base::fatal(code, {processorDetail, failed_stage(), text});
 }
-
-}  // namespace
 
 std::string directory_of(const std::string& path) {
   const auto cut = path.find_last_of("/\\");

@@ -12,6 +12,7 @@
 #include <string_view>
 #include <vector>
 
+#include "base/errors.hpp"
 #include "jobs/annotation.hpp"
 #include "jobs/stage_chain.hpp"
 #include "jobs/stages.hpp"
@@ -66,6 +67,11 @@ StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviau
 /// writer's status with the failed stage noted.
 int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
                     const procparm& proc);
+/// An input error thrown while a channel is processed, into the host's error record: an orbit
+/// that does not reach over the channel's lines is a stage that cannot run (130560, with the
+/// scene's times and the file's span); any other fault keeps the code its reader gave it.
+[[noreturn]] void fail_on_input(const base::InputError& e, const std::string& processorDetail, const sarpar& par);
+
 /// Directory part of a path: up to the last '/' or '\', "." when there is none.
 std::string directory_of(const std::string& path);
 

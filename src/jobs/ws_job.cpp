@@ -139,12 +139,12 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   extra.extract_kind = envisat::kExtractEchoes;
   {
     const auto start = std::chrono::steady_clock::now();
-    base::Frame frame("envi_extract");
-    const int st = envisat::envi_extract(args[0], ins, xch, channels, extra, envisat::timeline_table_builder());
-    if (st != 0) {
-      note_failed_stage("envi_extract");
-      base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_extract"});
-    }
+    // The shared extraction stage: it also refuses a product shorter than its header says.
+    envisat::enviauxfiles files;
+    files.level0 = args[0];
+    files.ins = ins;
+    files.extracted = xch;
+    if (envi_extract(files, channels, extra) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_extract"});
     base::LogPrintf("Stage time %-14s %9.2f s\n", "extraction",
                     std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count());
   }
@@ -157,9 +157,16 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   scansar::scansar scan;
   if (scansar::derive_geometry(channels, scan) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "geometry"});
   whole.lines = std::max(1, static_cast<int>(std::lround(scan.bursts * scan.cycleTime * whole.prf)));
-  if (envisat::envi_orbit(args[1], whole, refs) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_orbit"});
+  try {
+    if (envisat::envi_orbit(args[1], whole, refs) != 0)
+      base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_orbit"});
+  } catch (const base::InputError& e) {
+    note_failed_stage("envi_orbit");
+    fail_on_input(e, "WSprocessor()", whole);
+  }
   if (envisat::envi_syntchirp(whole, refs) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_syntchirp"});
-  const bool ascending = false;
+  // The pass direction from the Earth-fixed z velocity at the scene's middle state vector.
+  const bool ascending = refs.orbitVelocities[3 * 2 + 2] > 0.0;
 
   const std::string orbitPath = args[1];
   const scansar::GeometricCentroid geometric = [orbitPath](const metadata::SceneReferences&, double t, double tau,

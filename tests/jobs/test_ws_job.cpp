@@ -149,6 +149,14 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          return j.layout(a, "WS");
        },
        ec::kFileIo, nullptr, nullptr},
+      {"an orbit that ends before the scene",
+       [](ScratchJob& j, const auto& ws, const auto&) {
+         auto a = ws_args(j, ws);
+         // A real preliminary orbit of April 2008, a month after the simulated scene.
+         a[1] = real("DOR_POR_AX", "DOR_POR_AXVF-P20080404_014700_20080401_215527_20080403_002327");
+         return j.layout(a, "WS");
+       },
+       ec::kStageFailed, "WSprocessor()", "outside the orbit interval"},
       {"an ASA_XCA given as ASA_XCH",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
