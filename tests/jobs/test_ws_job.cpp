@@ -17,6 +17,7 @@
 #include "base/convert.hpp"
 #include "base/errors.hpp"
 #include "job_harness.hpp"
+#include "test_standalone_support.hpp"
 #include "simulator/simulator.hpp"
 
 using namespace sar::test;
@@ -222,6 +223,32 @@ TEST_F(WsJob, GroundRangeImageWithItsQuickLook) {
   const Image image = read_image(out / "scene_gr", true);
   EXPECT_NEAR(image.rangeSpacing, 75.0, 1e-9);
   check_targets(image, *ws_);
+}
+
+// sarfocus ws: the multilooked image and its annotation in the output folder, the work files
+// gone; a second run with --skip-complete finds the outputs complete.
+TEST_F(WsJob, SarfocusLeavesTheMultilookedProduct) {
+  ScratchJob job("ws_sarfocus");
+  const fs::path aux = job.dir() / "aux", out = job.dir() / "out";
+  fs::create_directories(aux);
+  for (const std::string& f : {ws_->ins_path, ws_->xca_path, kXch}) fs::copy_file(f, aux / fs::path(f).filename());
+  const std::vector<std::string> args = {"ws", ws_->level0_path, "--orbit", ws_->orbit_path, "--aux", aux.string(),
+                                         "--out", out.string(), "--ground-range", "--no-quicklook"};
+  const CliResult r = sarfocus(args);
+  ASSERT_EQ(r.status, 0) << r.err;
+  const std::string stem = sar::jobs::product_stem(ws_->level0_path);
+  std::vector<std::string> names;
+  for (const auto& e : fs::directory_iterator(out))
+    if (e.is_regular_file()) names.push_back(e.path().filename().string());
+  std::sort(names.begin(), names.end());
+  const std::vector<std::string> expected = {stem + "_gr",     stem + "_gr.hdr", stem + "_gr.sml",
+                                             stem + "_gr.vrt", stem + "_gr_hdr"};
+  EXPECT_EQ(names, expected);
+  auto withSkip = args;
+  withSkip.push_back("--skip-complete");
+  const CliResult again = sarfocus(withSkip);
+  EXPECT_EQ(again.status, 0) << again.err;
+  EXPECT_NE((again.out + again.err).find("skipped"), std::string::npos) << again.out << again.err;
 }
 
 struct BadCase {
