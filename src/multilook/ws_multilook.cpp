@@ -180,6 +180,15 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   const double outStep = decimation / fs;
   res.slantStep = outStep;
   res.nearTime = sw[0].nearTime;
+  // Each sub-swath starts at a whole column of the common grid; the fraction of a column its
+  // near range lies off that grid is taken out by a delay in the range spectrum, so that targets
+  // of every sub-swath stand where their range puts them.
+  std::array<int, 5> firstColumn{};
+  std::array<double, 5> delay{};
+  for (std::size_t s = 0; s < 5; ++s) {
+    firstColumn[s] = round_half_away((sw[s].nearTime - sw[0].nearTime) / outStep);
+    delay[s] = (sw[s].nearTime - sw[0].nearTime) - firstColumn[s] * outStep;
+  }
 
   // Per sub-swath: weighted, detected, decimated looks summed over bursts.
   std::array<std::vector<float>, 5> power;
@@ -197,6 +206,13 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     // Looks are cut square: their resolution is the ground resolution asked for.
     const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks);
     dsp::cvector spectrum(static_cast<std::size_t>(n)), small(static_cast<std::size_t>(k));
+    // x(t - delay): the spectrum times exp(-j 2 pi f delay), f the bin's frequency.
+    std::vector<io::fcomplex> shift(static_cast<std::size_t>(n));
+    for (int b = 0; b < n; ++b) {
+      const double f = (b <= n / 2 ? b : b - n) * fs / n;
+      shift[static_cast<std::size_t>(b)] =
+          std::polar(1.0f, static_cast<float>(-2.0 * std::numbers::pi * f * delay[s]));
+    }
     dsp::fft_plan forward, backward;
     if (dsp::fft_makep_c(forward, n, n, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(backward, k, k, 1, 1, -2, 0, 1) != 0)
       return fail(res, 1, "no transform plan");
@@ -224,6 +240,7 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
         std::fill(spectrum.begin(), spectrum.end(), io::fcomplex{});
         std::copy(row.begin(), row.end(), spectrum.begin());
         dsp::pfft_c(forward, spectrum);
+        for (int b = 0; b < n; ++b) spectrum[static_cast<std::size_t>(b)] *= shift[static_cast<std::size_t>(b)];
         std::fill(acc.begin(), acc.end(), 0.0);
         for (double f : plan.centres) {
           const int centreBin = round_half_away(f / fs * n);
@@ -246,11 +263,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
 
   // Join the sub-swaths: each keeps its columns up to the middle of its overlap with the next.
   // Sub-swaths that do not meet (a short sampling window) leave the columns between them at 0.
-  std::array<int, 5> firstColumn{}, endColumn{}, from{}, to{};
-  for (std::size_t s = 0; s < 5; ++s) {
-    firstColumn[s] = round_half_away((sw[s].nearTime - sw[0].nearTime) / outStep);
-    endColumn[s] = firstColumn[s] + outSamples[s];
-  }
+  std::array<int, 5> endColumn{}, from{}, to{};
+  for (std::size_t s = 0; s < 5; ++s) endColumn[s] = firstColumn[s] + outSamples[s];
   for (std::size_t s = 0; s < 5; ++s) {
     from[s] = s == 0 ? firstColumn[0] : std::max(to[s - 1], firstColumn[s]);
     const int middle = s == 4 ? endColumn[4] : firstColumn[s + 1] + (endColumn[s] - firstColumn[s + 1]) / 2;
