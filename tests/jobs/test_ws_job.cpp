@@ -258,6 +258,7 @@ struct BadCase {
   int ec;
   const char* detail;
   const char* inLog;  // or null
+  bool focused;       // failed after the burst chain: its sub-swath files stay, as after any failure
 };
 
 TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
@@ -268,7 +269,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[0] = im.level0_path;
          return j.layout(a, "WS");
        },
-       ec::kBadArguments, "ASA_WS0", nullptr},
+       ec::kBadArguments, "ASA_WS0", nullptr, false},
       {"bursts outside the product",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -276,7 +277,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[9] = "40";
          return j.layout(a, "WS");
        },
-       ec::kStageFailed, "WSprocessor()", "Wrong number of bursts to focus chosen"},
+       ec::kStageFailed, "WSprocessor()", "Wrong number of bursts to focus chosen", false},
       {"no ASA_XCH in the index",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -288,7 +289,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          fs::copy_file(ws.xca_path, archive / fs::path(ws.xca_path).filename());
          return j.layout(a, "WS", {archive.string()});
        },
-       ec::kStageFailed, "find_aux()", nullptr},
+       ec::kStageFailed, "find_aux()", nullptr, false},
       {"image mode packets under a wide swath header",
        [](ScratchJob& j, const auto& ws, const auto& im) {
          // The main header says wide swath; the packets' beam codes are image mode's.
@@ -307,7 +308,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[0] = product.string();
          return j.layout(a, "WS");
        },
-       ec::kFileIo, nullptr, nullptr},
+       ec::kFileIo, nullptr, nullptr, false},
       {"an orbit that ends before the scene",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -315,14 +316,21 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[1] = real("DOR_POR_AX", "DOR_POR_AXVF-P20080404_014700_20080401_215527_20080403_002327");
          return j.layout(a, "WS");
        },
-       ec::kStageFailed, "WSprocessor()", "outside the orbit interval"},
+       ec::kStageFailed, "WSprocessor()", "outside the orbit interval", false},
       {"an ASA_XCA given as ASA_XCH",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
          a[7] = ws.xca_path;
          return j.layout(a, "WS");
        },
-       ec::kBadArguments, "ASA_XCH", nullptr},
+       ec::kBadArguments, "ASA_XCH", nullptr, false},
+      {"burst weights that do not add up to one",
+       [](ScratchJob& j, const auto& ws, const auto&) {
+         const std::string list = j.layout(ws_args(j, ws), "WS");
+         set_parameters(j.dir() / "des" / "parameters_multilook.hdr", {{"W1", "0.2"}});
+         return list;
+       },
+       ec::kStageFailed, "run()", "2 W1 + W2 must be a whole number", true},
   };
   for (const BadCase& c : cases) {
     SCOPED_TRACE(c.name);
@@ -342,7 +350,10 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
     if (c.inLog) {
       EXPECT_NE(job.log().find(c.inLog), std::string::npos) << job.log();
     }
-    for (int s = 1; s <= 5; ++s) EXPECT_FALSE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")));
+    for (int s = 1; s <= 5; ++s)
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")), c.focused) << s;
+    for (const char* image : {"scene_pwr", "scene_pwr.part", "scene_pwr_hdr", "scene_gr"})
+      EXPECT_FALSE(fs::exists(job.dir() / "out" / image)) << image;
   }
 }
 
