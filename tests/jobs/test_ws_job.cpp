@@ -84,7 +84,7 @@ struct Image {
   double firstTime = 0.0, lineStep = 0.0;  // sec85, s
   double nearTime = 0.0, slantStep = 0.0;  // slant range: two-way s of column 0 and between columns
   std::vector<double> groundCoeff;         // ground range: slant time of column j
-  double rangeSpacing = 0.0;
+  double rangeSpacing = 0.0, azimuthSpacing = 0.0;
   bool ground = false;
   // Two-way slant time of a (fractional) column.
   double column_time(double j) const {
@@ -110,6 +110,8 @@ Image read_image(const fs::path& raster, bool ground) {
   const auto step = doubles_of(a, "AzimuthTimeStep");
   const auto near = doubles_of(a, "FastTime");
   const auto spacing = doubles_of(a, "PixelSpacingRg");
+  const auto azimuthSpacing = doubles_of(a, "PixelSpacingAz");
+  if (!azimuthSpacing.empty()) im.azimuthSpacing = azimuthSpacing[0];
   EXPECT_EQ(step.size(), 1u);
   EXPECT_EQ(near.size(), 1u);
   EXPECT_EQ(spacing.size(), 1u);
@@ -169,6 +171,16 @@ void check_targets(const Image& im, const sim::SimulationTruth& truth) {
     ::testing::Test::RecordProperty("peak_offset_line_col", std::to_string(pl - line) + " " + std::to_string(pc - column));
   }
   ASSERT_EQ(energy.size(), 3u);
+  // Line spacing on the ground (the annotation's, from its corners): the outer targets' distance
+  // over their zero-Doppler times, the targets lying near enough along the track (their ranges
+  // differ by a few columns).
+  const auto& a = truth.targets[1];
+  const auto& b = truth.targets[2];
+  const double apart = (a.ecef - b.ecef).norm();
+  const double alongTrack = apart / std::fabs(a.zero_doppler_time - b.zero_doppler_time) * im.lineStep;
+  // 16.7 m against 16.9 m: the chord holds a little of the cross-track offset, and the annotation
+  // measures at near range.
+  EXPECT_NEAR(im.azimuthSpacing, alongTrack, 0.03 * alongTrack);
   const double spread = 10.0 * std::log10(*std::max_element(energy.begin(), energy.end()) /
                                           *std::min_element(energy.begin(), energy.end()));
   ::testing::Test::RecordProperty("target_energy_spread_db", std::to_string(spread));
