@@ -268,7 +268,8 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
     latest = std::max(latest, par.latestTime[s]);
   }
   multilook::SlcGrid orbit;
-  if (multilook::orbit_geometry(args[1], 0.5 * (earliest + latest), scan.carrierFrequency > 0.0 ? scan.carrierFrequency : kCarrier, orbit, error) != 0) {
+  const double carrier = scan.carrierFrequency > 0.0 ? scan.carrierFrequency : kCarrier;
+  if (multilook::orbit_geometry(args[1], 0.5 * (earliest + latest), carrier, orbit, error) != 0) {
     base::report(base::kReportError, error);
     note_failed_stage("mlook::run");
     base::fatal(base::ec::kStageFailed, {"run()", error});
