@@ -281,6 +281,7 @@ std::vector<std::string> job_arguments(const ModeRow& mode, const std::string& p
     a[5] = w;
     a[6] = h;
     if (m == "WS") a[8] = a[9] = "0";
+    if (m == "WS" && req.groundRange) a[11] = "OK";
   }
   a[12] = req.quickLook ? "OK" : "NotOK";
   a[13] = "1.0";
@@ -357,8 +358,8 @@ std::optional<StandaloneOutcome> prepare(const StandaloneRequest& req, Prepared&
   if (!p.mode) return bad_request("unknown mode '" + req.mode + "' (" + mode_names() + ")");
   if (!req.multilook.empty() && req.mode != "im" && req.mode != "ap")
     return bad_request("--multilook is for the stripmap modes im and ap");
-  if (req.multilook.empty() && req.mode != "wss" && (req.groundRange || req.groundStep > 0.0))
-    return bad_request("--ground-range and --ground-step go with --multilook (or mode wss)");
+  if (req.multilook.empty() && req.mode != "wss" && req.mode != "ws" && (req.groundRange || req.groundStep > 0.0))
+    return bad_request("--ground-range and --ground-step go with --multilook (or modes ws and wss)");
   std::error_code ec;
   if (req.product.empty() || !(p.mode->setup == std::string("RS") ? fs::exists(req.product, ec)
                                                                     : fs::is_regular_file(req.product, ec)))
@@ -515,8 +516,8 @@ bool outputs_complete(const StandaloneRequest& req) {
     if (req.quickLook) required.push_back(image + "_slc.tif");
     if (!req.multilook.empty() && req.mode == "ap") required.push_back(looked_product_name(image, req.groundRange));
   }
-  if (req.mode == "wss") {
-    // The level 1 job leaves a multilooked image only.
+  if (req.mode == "wss" || req.mode == "ws") {
+    // The wide swath jobs leave a multilooked image only.
     const std::string image = looked_product_name(stem, req.groundRange);
     required = {image, image + "_hdr"};
     if (req.quickLook) required.push_back(image + ".tif");
@@ -770,7 +771,7 @@ void add_standalone_options(CLI::App& app, StandaloneRequest& req) {
            "AZxRG");
   app.add_flag("--ground-range", req.groundRange,
                "the multilooked image in ground range (<product>_gr, else _pwr);\n"
-               "wss: its image in ground range");
+               "ws and wss: their image in ground range");
   shown_as(app.add_option_function<int>(
                    "--ground-step", [&req](int step) { req.groundStep = step; },
                    "its ground step in metres (default: the looked slant cells' mean)")

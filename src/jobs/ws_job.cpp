@@ -1,6 +1,11 @@
 // The wide swath job: a level 0 ASA_WS product through extraction and the burst chain to five
 // focused sub-swath images with their headers, D/SS<s>.out and D/SS<s>.out.hdr beside the
-// output root. Joining them into one image is the multilooker's step, which comes after.
+// output root, then joined by the wide swath multilooker into one detected image R_pwr (slant
+// range) or R_gr (ground range, argument 11 "OK") with its annotation and quick-look.
+#include <algorithm>
+#include <array>
+#include <bit>
+#include <cerrno>
 #include <chrono>
 #include <cmath>
 #include <cstdlib>
@@ -18,11 +23,15 @@
 #include "envisat/replica_pattern.hpp"
 #include "envisat/table_builder.hpp"
 #include "geometry/doppler_geometry.hpp"
+#include "jobs/annotation.hpp"
 #include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 #include "jobs/im_job.hpp"
 #include "jobs/job_common.hpp"
 #include "jobs/stages.hpp"
+#include "jobs/ws_product.hpp"
+#include "multilook/ws_multilook.hpp"
+#include "multilook/wss_input.hpp"
 #include "scansar/wide_swath.hpp"
 
 namespace sar::jobs {
@@ -33,7 +42,7 @@ constexpr std::string_view kWsBanner =
     "\nINPUT ASA_WS : [ %s ]\nINPUT DORIS : [ %s ]\nINPUT ASA_INS : [ %s ]\nINPUT ASA_XCA : [ %s ]\nINPUT "
     "ASA_XCH : [ %s ]\nOUTPUT ROOT NAME : [ %s ]";
 constexpr std::string_view kWsParameterFile = "parameters_WS.hdr";
-constexpr double kSpeedOfLight = 299792458.0;
+constexpr double kCarrier = 5.331e9;
 // Yaw-steering law of the platform for the orbit's centroid: p, q, r, s (degrees).
 constexpr double kLaw[4] = {3.912987, -0.167074, 0.050233, 23.0};
 
@@ -53,6 +62,51 @@ std::string auxiliary(const std::string& arg, const std::string& product, const 
   require_existing(arg);
   if (!(envisat::EnvisatTypes(arg).*is)()) base::fatal(base::ec::kBadArguments, {kind});
   return arg;
+}
+
+// One focused sub-swath as the multilooker reads it, from the header the burst chain wrote
+// beside it. False with `error` when the header or the image does not hold together.
+bool focused_sub_swath(const std::string& dir, int s, multilook::WsSubSwath& out, std::string& error) {
+  const std::string image = dir + "/SS" + std::to_string(s) + ".out", header = image + ".hdr";
+  int32_t samples[1] = {0}, prefix[1] = {0};
+  double near[1] = {0.0}, incidence[1] = {0.0};
+  std::array<double, 5> toGround{}, rate{};
+  if (base::GetMyProfileIntArray("Image", "Samples", samples, header) != base::kProfileOk ||
+      base::GetMyProfileIntArray("Image", "LinePrefixBytes", prefix, header) != base::kProfileOk ||
+      base::GetProfileDoubleArray("Image", "NearRangeTime", near, header) != base::kProfileOk ||
+      base::GetProfileDoubleArray("Doppler", "Incidence", incidence, header) != base::kProfileOk) {
+    error = "the header " + header + " of the focused sub-swath SS" + std::to_string(s) + " is missing or incomplete";
+    return false;
+  }
+  base::GetProfileDoubleArray("Doppler", "SlantToGround", toGround, header);
+  base::GetProfileDoubleArray("Doppler", "Rate", rate, header);
+  base::FreeProfile(header);
+  std::error_code ec;
+  const auto bytes = std::filesystem::file_size(image, ec);
+  const int64_t pitch = prefix[0] + 8 * static_cast<int64_t>(samples[0]);
+  if (ec || samples[0] < 1 || bytes == 0 || bytes % static_cast<uint64_t>(pitch) != 0) {
+    error = "the focused sub-swath " + image + " does not hold whole lines of its header's " +
+            std::to_string(samples[0]) + " samples";
+    return false;
+  }
+  out.path = image;
+  out.offset = 0;
+  out.records = static_cast<int64_t>(bytes / static_cast<uint64_t>(pitch));
+  out.rowPrefix = prefix[0];
+  out.samples = samples[0];
+  out.cellType = io::kFloatComplex;
+  out.byteOrder = std::endian::native == std::endian::big ? io::kBigEndian : io::kLittleEndian;
+  out.nearTime = near[0];
+  // Near range incidence from the slope of ground range against two-way time, (c/2) / sin(theta):
+  // the looks must reach the ground resolution there, where a slant cell is widest on the ground.
+  out.incidence = incidence[0];
+  if (toGround[1] > 149896229.0) out.incidence = std::asin(149896229.0 / toGround[1]) * 180.0 / 3.14159265358979323846;
+  // The burst chain already placed each burst's lines around its beam centre, so the burst's
+  // middle line is its centre: no centroid shift is to be added.
+  out.centroid = 0.0;
+  if (rate[0] < 0.0) out.rate = rate[0];
+  errno = 0;
+  return true;
 }
 
 int optional_ints(const char* section, const char* key, std::span<int32_t> out, const std::string& file) {
@@ -185,7 +239,65 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
     if (par.swathsToProcess[static_cast<std::size_t>(s)])
       base::LogPrintf("SS%d: %s/SS%d.out, lines %d to %d\n", s + 1, dir.c_str(), s + 1, par.firstLine[static_cast<std::size_t>(s)],
                       par.lastLine[static_cast<std::size_t>(s)]);
-  (void)kSpeedOfLight;
+
+  // The five sub-swaths joined into one detected image.
+  multilook::WsMultilookConfig cfg;
+  const int deleteTemporary = read_ws_multilook_config(desDir + "parameters_multilook.hdr", cfg);
+  if (args[11] == "OK") cfg.groundRange = 1;
+  cfg.lineStep = par.azimuthStep;
+  cfg.samplingRate = scan.samplingRate;
+  // One range band for all: the narrowest chirp, which every sub-swath's spectrum covers.
+  cfg.rangeBand = *std::min_element(scan.chirpBandwidth.begin(), scan.chirpBandwidth.end());
+  std::array<multilook::WsSubSwath, scansar::kSwaths> swaths;
+  std::string error;
+  for (int s = 0; s < scansar::kSwaths && error.empty(); ++s) {
+    if (!par.swathsToProcess[static_cast<std::size_t>(s)])
+      error = "the multilook joins all five sub-swaths; SS" + std::to_string(s + 1) + " was not focused";
+    else
+      focused_sub_swath(dir, s + 1, swaths[static_cast<std::size_t>(s)], error);
+  }
+  if (!error.empty()) {
+    base::report(base::kReportError, error);
+    note_failed_stage("mlook::readimages");
+    base::fatal(base::ec::kStageFailed, {"readimages()", error});
+  }
+  const std::string output = args[4] + (cfg.groundRange ? "_gr" : "_pwr");
+  double earliest = 1e300, latest = -1e300;
+  for (std::size_t s = 0; s < scansar::kSwaths; ++s) {
+    earliest = std::min(earliest, par.earliestTime[s]);
+    latest = std::max(latest, par.latestTime[s]);
+  }
+  multilook::SlcGrid orbit;
+  const double carrier = scan.carrierFrequency > 0.0 ? scan.carrierFrequency : kCarrier;
+  if (multilook::orbit_geometry(args[1], 0.5 * (earliest + latest), carrier, orbit, error) != 0) {
+    base::report(base::kReportError, error);
+    note_failed_stage("mlook::run");
+    base::fatal(base::ec::kStageFailed, {"run()", error});
+  }
+  multilook::WsMultilookResult res;
+  base::SetActivityLabel("WS Multilooking ...");
+  if (multilook::run_ws_multilook(swaths, cfg, orbit, output, res) != 0) {
+    note_failed_stage("mlook::run");
+    base::fatal(base::ec::kStageFailed, {"run()", res.error});
+  }
+  base::LogPrintf("Multilooked %s: %d samples, %d lines, %d range looks\n", output.c_str(), res.samples, res.lines,
+                  res.rangeLooks);
+
+  WsProductInfo info;
+  info.origin = "ENVISAT_WS";
+  info.polarisation = std::string(polarisation_text(channels[0].polarization_type));
+  info.farTime = swaths[4].nearTime + swaths[4].samples / scan.samplingRate;
+  info.quickLook = args[12] == "OK";
+  info.quickLookScale = std::atof(args[13].c_str());
+  finish_ws_product(output, res, orbit, cfg.groundRange != 0, info);
+
+  // The sub-swath work files, once the joined image stands.
+  if (deleteTemporary) {
+    for (int s = 1; s <= scansar::kSwaths; ++s)
+      for (const std::string suffix : {"", ".out", ".out.hdr"})
+        base::DeleteProductFile(dir + "/SS" + std::to_string(s) + suffix, false);
+  }
+  errno = 0;
   return 0;
 }
 

@@ -37,7 +37,7 @@ int round_half_away(double x) { return static_cast<int>(x >= 0.0 ? std::floor(x 
 bool read_times(const WsSubSwath& s, std::vector<double>& times) {
   std::ifstream in(s.path, std::ios::binary);
   if (!in) return false;
-  const int64_t pitch = s.rowPrefix + 4 * static_cast<int64_t>(s.samples);
+  const int64_t pitch = s.rowPrefix + io::cell_size(s.cellType) * static_cast<int64_t>(s.samples);
   times.resize(static_cast<std::size_t>(s.records));
   unsigned char mjd[12];
   for (int64_t r = 0; r < s.records; ++r) {
@@ -121,7 +121,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   std::size_t available = SIZE_MAX;
   for (std::size_t s = 0; s < 5; ++s) {
     std::vector<double> times;
-    if (sw[s].samples < 1 || sw[s].records < 1 || !read_times(sw[s], times))
+    if (sw[s].samples < 1 || sw[s].records < 1 || (sw[s].cellType != io::kShortComplex && sw[s].cellType != io::kFloatComplex) ||
+        !read_times(sw[s], times))
       return fail(res, 1, "cannot read the records of sub-swath " + std::to_string(s + 1));
     bursts[s] = find_bursts(times, dt);
     available = std::min(available, bursts[s].size());
@@ -179,6 +180,15 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   const double outStep = decimation / fs;
   res.slantStep = outStep;
   res.nearTime = sw[0].nearTime;
+  // Each sub-swath starts at a whole column of the common grid; the fraction of a column its
+  // near range lies off that grid is taken out by a delay in the range spectrum, so that targets
+  // of every sub-swath stand where their range puts them.
+  std::array<int, 5> firstColumn{};
+  std::array<double, 5> delay{};
+  for (std::size_t s = 0; s < 5; ++s) {
+    firstColumn[s] = round_half_away((sw[s].nearTime - sw[0].nearTime) / outStep);
+    delay[s] = (sw[s].nearTime - sw[0].nearTime) - firstColumn[s] * outStep;
+  }
 
   // Per sub-swath: weighted, detected, decimated looks summed over bursts.
   std::array<std::vector<float>, 5> power;
@@ -196,6 +206,13 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     // Looks are cut square: their resolution is the ground resolution asked for.
     const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks);
     dsp::cvector spectrum(static_cast<std::size_t>(n)), small(static_cast<std::size_t>(k));
+    // x(t - delay): the spectrum times exp(-j 2 pi f delay), f the bin's frequency.
+    std::vector<io::fcomplex> shift(static_cast<std::size_t>(n));
+    for (int b = 0; b < n; ++b) {
+      const double f = (b <= n / 2 ? b : b - n) * fs / n;
+      shift[static_cast<std::size_t>(b)] =
+          std::polar(1.0f, static_cast<float>(-2.0 * std::numbers::pi * f * delay[s]));
+    }
     dsp::fft_plan forward, backward;
     if (dsp::fft_makep_c(forward, n, n, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(backward, k, k, 1, 1, -2, 0, 1) != 0)
       return fail(res, 1, "no transform plan");
@@ -205,8 +222,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     in.rowPrefix = sw[s].rowPrefix;
     in.pixels = sw[s].samples;
     in.lines = static_cast<int32_t>(sw[s].records);
-    in.cellType = io::kShortComplex;
-    in.byteOrder = io::kBigEndian;
+    in.cellType = sw[s].cellType;
+    in.byteOrder = sw[s].byteOrder;
     if (in.open(0) != 0) return fail(res, 1, "cannot read sub-swath " + std::to_string(s + 1));
     std::vector<io::fcomplex> row(static_cast<std::size_t>(sw[s].samples));
     std::vector<double> acc(static_cast<std::size_t>(outSamples[s]));
@@ -223,6 +240,7 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
         std::fill(spectrum.begin(), spectrum.end(), io::fcomplex{});
         std::copy(row.begin(), row.end(), spectrum.begin());
         dsp::pfft_c(forward, spectrum);
+        for (int b = 0; b < n; ++b) spectrum[static_cast<std::size_t>(b)] *= shift[static_cast<std::size_t>(b)];
         std::fill(acc.begin(), acc.end(), 0.0);
         for (double f : plan.centres) {
           const int centreBin = round_half_away(f / fs * n);
@@ -244,15 +262,17 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   }
 
   // Join the sub-swaths: each keeps its columns up to the middle of its overlap with the next.
-  std::array<int, 5> firstColumn{}, endColumn{}, from{}, to{};
+  // Sub-swaths that do not meet (a short sampling window) leave the columns between them at 0.
+  std::array<int, 5> endColumn{}, from{}, to{};
+  for (std::size_t s = 0; s < 5; ++s) endColumn[s] = firstColumn[s] + outSamples[s];
   for (std::size_t s = 0; s < 5; ++s) {
-    firstColumn[s] = round_half_away((sw[s].nearTime - sw[0].nearTime) / outStep);
-    endColumn[s] = firstColumn[s] + outSamples[s];
+    from[s] = s == 0 ? firstColumn[0] : std::max(to[s - 1], firstColumn[s]);
+    const int middle = s == 4 ? endColumn[4] : firstColumn[s + 1] + (endColumn[s] - firstColumn[s + 1]) / 2;
+    to[s] = std::max(from[s], std::min(middle, endColumn[s]));
   }
-  for (std::size_t s = 0; s < 5; ++s) {
-    from[s] = s == 0 ? firstColumn[0] : to[s - 1];
-    to[s] = s == 4 ? endColumn[4] : std::max(from[s], firstColumn[s + 1] + (endColumn[s] - firstColumn[s + 1]) / 2);
-  }
+  if (*std::min_element(firstColumn.begin(), firstColumn.end()) < 0 ||
+      *std::max_element(endColumn.begin(), endColumn.end()) != endColumn[4])
+    return fail(res, kRejected, "the sub-swaths are not in order of range");
   const int slantWidth = endColumn[4];
   std::vector<double> spreading(static_cast<std::size_t>(slantWidth));
   const double refTime = sw[0].nearTime + 0.5 * slantWidth * outStep;

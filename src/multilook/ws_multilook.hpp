@@ -21,18 +21,22 @@
 #include <string>
 #include <vector>
 
+#include "io/cell_types.hpp"
 #include "multilook/strip_multilook.hpp"
 
 namespace sar::multilook {
 
 /// One sub-swath's bursts in a raster of records: a row prefix with the line's zero-Doppler time
-/// (MJD2000, big-endian) and complex int16 samples.
+/// (MJD2000, big-endian), then the samples: complex int16 big-endian in a level 1 product,
+/// complex float32 in the host's order in the burst chain's own focused sub-swaths.
 struct WsSubSwath {
   std::string path;
   int64_t offset = 0;      // of the first record
   int64_t records = 0;
   int32_t rowPrefix = 17;
   int samples = 0;
+  int32_t cellType = io::kShortComplex;
+  int32_t byteOrder = io::kBigEndian;
   double nearTime = 0.0;   // two-way s of sample 0
   double incidence = 0.0;  // deg, at near range
   double centroid = 0.0;   // Hz

@@ -1,15 +1,23 @@
 // The wide swath job on a small simulated product: five focused sub-swath images with their
-// headers, and the inputs that must stop it with their codes and nothing half-written.
+// headers joined into one multilooked image, slant or ground range, with its annotation and each
+// target where its zero-Doppler time and range put it; and the inputs that must stop it with
+// their codes and nothing half-written.
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <cmath>
+#include <cstring>
 #include <fstream>
 #include <functional>
 #include <regex>
 #include <string>
 #include <vector>
 
+#include "annotation_keys.hpp"
+#include "base/convert.hpp"
 #include "base/errors.hpp"
 #include "job_harness.hpp"
+#include "test_standalone_support.hpp"
 #include "simulator/simulator.hpp"
 
 using namespace sar::test;
@@ -31,7 +39,9 @@ class WsJob : public ::testing::Test {
     c.samples = 640;
     c.lines = 525 + 4 * 360;
     c.noise_db = 0.0;
-    c.targets = {{{45.0, 10.0, 0.0}, 30.0}};
+    // Three targets a third of a burst cycle apart along the track: each sits elsewhere in the
+    // bursts' weights.
+    c.targets = {{{45.0, 10.0, 0.0}, 30.0}, {{45.004, 10.0, 0.0}, 30.0}, {{44.996, 10.0, 0.0}, 30.0}};
     c.ins_template = kInsTemplate;
     c.xca_template = kXcaTemplate;
     ws_ = new sim::SimulationTruth(sim::run_simulation(c));
@@ -39,7 +49,7 @@ class WsJob : public ::testing::Test {
     im.out_dir = (root() / "im").string();
     im.lines = 600;
     im.samples = 600;
-    im.targets = c.targets;
+    im.targets = {c.targets.front()};
     im.ins_template = kInsTemplate;
     im.xca_template = kXcaTemplate;
     im_ = new sim::SimulationTruth(sim::run_simulation(im));
@@ -67,9 +77,121 @@ class WsJob : public ::testing::Test {
 sim::SimulationTruth* WsJob::ws_ = nullptr;
 sim::SimulationTruth* WsJob::im_ = nullptr;
 
+// The multilooked image and the grid its annotation gives.
+struct Image {
+  int lines = 0, samples = 0;
+  std::vector<float> amplitude;
+  double firstTime = 0.0, lineStep = 0.0;  // sec85, s
+  double nearTime = 0.0, slantStep = 0.0;  // slant range: two-way s of column 0 and between columns
+  std::vector<double> groundCoeff;         // ground range: slant time of column j
+  double rangeSpacing = 0.0, azimuthSpacing = 0.0;
+  bool ground = false;
+  // Two-way slant time of a (fractional) column.
+  double column_time(double j) const {
+    if (!ground) return nearTime + j * slantStep;
+    double tau = 0.0;
+    for (int k = 4; k >= 0; --k) tau = tau * j + groundCoeff[static_cast<std::size_t>(k)];
+    return tau;
+  }
+  float at(int l, int c) const { return amplitude[static_cast<std::size_t>(l) * samples + c]; }
+};
+
+Image read_image(const fs::path& raster, bool ground) {
+  Image im;
+  im.ground = ground;
+  for (const char* suffix : {"", ".hdr", ".vrt", "_hdr", ".sml"})
+    EXPECT_TRUE(fs::exists(raster.string() + suffix)) << raster << suffix;
+  const fs::path a = raster.string() + "_hdr";
+  im.lines = key_int(a, "NrOfLinesPerImage");
+  im.samples = key_int(a, "NrOfPixelsPerLine");
+  EXPECT_EQ(text_of(a, "DataUnits"), "AMPLITUDE");
+  EXPECT_GT(key_int(a, "NRangeLooks"), 1);
+  im.firstTime = sar::base::ascii2sec85(text_of(a, "AzimuthStartTime"));
+  const auto step = doubles_of(a, "AzimuthTimeStep");
+  const auto near = doubles_of(a, "FastTime");
+  const auto spacing = doubles_of(a, "PixelSpacingRg");
+  const auto azimuthSpacing = doubles_of(a, "PixelSpacingAz");
+  if (!azimuthSpacing.empty()) im.azimuthSpacing = azimuthSpacing[0];
+  EXPECT_EQ(step.size(), 1u);
+  EXPECT_EQ(near.size(), 1u);
+  EXPECT_EQ(spacing.size(), 1u);
+  if (step.empty() || near.empty() || spacing.empty()) return im;
+  im.lineStep = step[0];
+  im.nearTime = near[0];
+  im.rangeSpacing = spacing[0];
+  im.slantStep = spacing[0] / 149896229.0;
+  if (ground) {
+    im.groundCoeff = doubles_of(a, "GroundRangeSlantTimeCoeff");
+    EXPECT_EQ(im.groundCoeff.size(), 5u);
+  }
+  const std::string bytes = slurp(raster);
+  EXPECT_EQ(bytes.size(), static_cast<std::size_t>(im.lines) * im.samples * 4);
+  im.amplitude.resize(bytes.size() / 4);
+  std::memcpy(im.amplitude.data(), bytes.data(), im.amplitude.size() * 4);
+  return im;
+}
+
+// Each target at the line of its zero-Doppler time and the column of its range, within a quarter
+// of a pixel (the peak refined by a parabola through its neighbours; a sub-swath put on the
+// joined grid at the nearest whole column would be up to half a column off); and the same energy
+// wherever it stands in the bursts' weights (0.6 dB apart without de-scalloping).
+void check_targets(const Image& im, const sim::SimulationTruth& truth) {
+  ASSERT_EQ(im.amplitude.size(), static_cast<std::size_t>(im.lines) * im.samples);
+  ASSERT_GT(im.lineStep, 0.0);
+  std::vector<double> energy;
+  for (const auto& t : truth.targets) {
+    const double line = (t.zero_doppler_time - im.firstTime) / im.lineStep;
+    // The column whose slant time is the target's, by bisection (the times increase).
+    double lo = 0.0, hi = im.samples - 1.0;
+    for (int k = 0; k < 60; ++k) (im.column_time(0.5 * (lo + hi)) < t.range_time ? lo : hi) = 0.5 * (lo + hi);
+    const double column = 0.5 * (lo + hi);
+    SCOPED_TRACE("target at line " + std::to_string(line) + ", column " + std::to_string(column));
+    ASSERT_GT(column, 10.0);
+    ASSERT_LT(column, im.samples - 11.0);
+    const int l0 = static_cast<int>(std::lround(line)), c0 = static_cast<int>(std::lround(column));
+    ASSERT_GT(l0, 40);
+    ASSERT_LT(l0, im.lines - 41);
+    int bl = l0, bc = c0;
+    for (int l = l0 - 20; l <= l0 + 20; ++l)
+      for (int c = c0 - 8; c <= c0 + 8; ++c)
+        if (im.at(l, c) > im.at(bl, bc)) bl = l, bc = c;
+    auto vertex = [](double m, double z, double p) {
+      const double d = m - 2.0 * z + p;
+      return d < 0.0 ? 0.5 * (m - p) / d : 0.0;
+    };
+    const double pl = bl + vertex(im.at(bl - 1, bc), im.at(bl, bc), im.at(bl + 1, bc));
+    const double pc = bc + vertex(im.at(bl, bc - 1), im.at(bl, bc), im.at(bl, bc + 1));
+    EXPECT_LT(std::fabs(pl - line), 0.25) << "peak line " << pl;
+    EXPECT_LT(std::fabs(pc - column), 0.25) << "peak column " << pc;
+    double e = 0.0;
+    // Over the main lobe, short of the next target 26 lines away.
+    for (int l = bl - 8; l <= bl + 8; ++l)
+      for (int c = bc - 4; c <= bc + 4; ++c) e += static_cast<double>(im.at(l, c)) * im.at(l, c);
+    energy.push_back(e);
+    ::testing::Test::RecordProperty("peak_offset_line_col", std::to_string(pl - line) + " " + std::to_string(pc - column));
+  }
+  ASSERT_EQ(energy.size(), 3u);
+  // Line spacing on the ground (the annotation's, from its corners): the outer targets' distance
+  // over their zero-Doppler times, the targets lying near enough along the track (their ranges
+  // differ by a few columns).
+  const auto& a = truth.targets[1];
+  const auto& b = truth.targets[2];
+  const double apart = (a.ecef - b.ecef).norm();
+  const double alongTrack = apart / std::fabs(a.zero_doppler_time - b.zero_doppler_time) * im.lineStep;
+  // 16.7 m against 16.9 m: the chord holds a little of the cross-track offset, and the annotation
+  // measures at near range.
+  EXPECT_NEAR(im.azimuthSpacing, alongTrack, 0.03 * alongTrack);
+  const double spread = 10.0 * std::log10(*std::max_element(energy.begin(), energy.end()) /
+                                          *std::min_element(energy.begin(), energy.end()));
+  ::testing::Test::RecordProperty("target_energy_spread_db", std::to_string(spread));
+  EXPECT_LT(spread, 0.4);
+}
+
 TEST_F(WsJob, FocusesFiveSubSwathsWithTheirHeaders) {
   ScratchJob job("ws_good");
   const std::string list = job.layout(ws_args(job, *ws_), "WS");
+  // Keep the sub-swath work files to look at them.
+  set_parameters(job.dir() / "des" / "parameters_multilook.hdr", {{"DeleteTempFile", "0"}});
   const RunResult r = job.run("main_focussing_asar_WS#" + list);
   ASSERT_EQ(r.status, 0) << r.err << job.log();
   for (int s = 1; s <= 5; ++s) {
@@ -91,6 +213,55 @@ TEST_F(WsJob, FocusesFiveSubSwathsWithTheirHeaders) {
     EXPECT_FALSE(fs::exists(job.dir() / "out" / ("rgfoc_ss" + std::to_string(s))));
   }
   EXPECT_NE(job.log().find("Ending AZFOC"), std::string::npos);
+  const Image image = read_image(job.dir() / "out" / "scene_pwr", false);
+  check_targets(image, *ws_);
+}
+
+// Ground range (argument 11 "OK") with the quick-look; the sub-swath work files go at the end.
+TEST_F(WsJob, GroundRangeImageWithItsQuickLook) {
+  ScratchJob job("ws_ground");
+  auto a = ws_args(job, *ws_);
+  a[11] = "OK";
+  a[12] = "OK";
+  a[13] = "1.0";
+  const std::string list = job.layout(a, "WS");
+  const RunResult r = job.run("main_focussing_asar_WS#" + list);
+  ASSERT_EQ(r.status, 0) << r.err << job.log();
+  const fs::path out = job.dir() / "out";
+  EXPECT_TRUE(fs::exists(out / "scene_gr.tif"));
+  EXPECT_FALSE(fs::exists(out / "scene_pwr"));
+  for (int s = 1; s <= 5; ++s)
+    for (const char* suffix : {"", ".out", ".out.hdr"})
+      EXPECT_FALSE(fs::exists(out / ("SS" + std::to_string(s) + suffix))) << s << suffix;
+  const Image image = read_image(out / "scene_gr", true);
+  EXPECT_NEAR(image.rangeSpacing, 75.0, 1e-9);
+  check_targets(image, *ws_);
+}
+
+// sarfocus ws: the multilooked image and its annotation in the output folder, the work files
+// gone; a second run with --skip-complete finds the outputs complete.
+TEST_F(WsJob, SarfocusLeavesTheMultilookedProduct) {
+  ScratchJob job("ws_sarfocus");
+  const fs::path aux = job.dir() / "aux", out = job.dir() / "out";
+  fs::create_directories(aux);
+  for (const std::string& f : {ws_->ins_path, ws_->xca_path, kXch}) fs::copy_file(f, aux / fs::path(f).filename());
+  const std::vector<std::string> args = {"ws", ws_->level0_path, "--orbit", ws_->orbit_path, "--aux", aux.string(),
+                                         "--out", out.string(), "--ground-range", "--no-quicklook"};
+  const CliResult r = sarfocus(args);
+  ASSERT_EQ(r.status, 0) << r.err;
+  const std::string stem = sar::jobs::product_stem(ws_->level0_path);
+  std::vector<std::string> names;
+  for (const auto& e : fs::directory_iterator(out))
+    if (e.is_regular_file()) names.push_back(e.path().filename().string());
+  std::sort(names.begin(), names.end());
+  const std::vector<std::string> expected = {stem + "_gr",     stem + "_gr.hdr", stem + "_gr.sml",
+                                             stem + "_gr.vrt", stem + "_gr_hdr"};
+  EXPECT_EQ(names, expected);
+  auto withSkip = args;
+  withSkip.push_back("--skip-complete");
+  const CliResult again = sarfocus(withSkip);
+  EXPECT_EQ(again.status, 0) << again.err;
+  EXPECT_NE((again.out + again.err).find("skipped"), std::string::npos) << again.out << again.err;
 }
 
 struct BadCase {
@@ -99,6 +270,7 @@ struct BadCase {
   int ec;
   const char* detail;
   const char* inLog;  // or null
+  bool focused;       // failed after the burst chain: its sub-swath files stay, as after any failure
 };
 
 TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
@@ -109,7 +281,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[0] = im.level0_path;
          return j.layout(a, "WS");
        },
-       ec::kBadArguments, "ASA_WS0", nullptr},
+       ec::kBadArguments, "ASA_WS0", nullptr, false},
       {"bursts outside the product",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -117,7 +289,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[9] = "40";
          return j.layout(a, "WS");
        },
-       ec::kStageFailed, "WSprocessor()", "Wrong number of bursts to focus chosen"},
+       ec::kStageFailed, "WSprocessor()", "Wrong number of bursts to focus chosen", false},
       {"no ASA_XCH in the index",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -129,7 +301,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          fs::copy_file(ws.xca_path, archive / fs::path(ws.xca_path).filename());
          return j.layout(a, "WS", {archive.string()});
        },
-       ec::kStageFailed, "find_aux()", nullptr},
+       ec::kStageFailed, "find_aux()", nullptr, false},
       {"image mode packets under a wide swath header",
        [](ScratchJob& j, const auto& ws, const auto& im) {
          // The main header says wide swath; the packets' beam codes are image mode's.
@@ -148,7 +320,7 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[0] = product.string();
          return j.layout(a, "WS");
        },
-       ec::kFileIo, nullptr, nullptr},
+       ec::kFileIo, nullptr, nullptr, false},
       {"an orbit that ends before the scene",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
@@ -156,14 +328,21 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
          a[1] = real("DOR_POR_AX", "DOR_POR_AXVF-P20080404_014700_20080401_215527_20080403_002327");
          return j.layout(a, "WS");
        },
-       ec::kStageFailed, "WSprocessor()", "outside the orbit interval"},
+       ec::kStageFailed, "WSprocessor()", "outside the orbit interval", false},
       {"an ASA_XCA given as ASA_XCH",
        [](ScratchJob& j, const auto& ws, const auto&) {
          auto a = ws_args(j, ws);
          a[7] = ws.xca_path;
          return j.layout(a, "WS");
        },
-       ec::kBadArguments, "ASA_XCH", nullptr},
+       ec::kBadArguments, "ASA_XCH", nullptr, false},
+      {"burst weights that do not add up to one",
+       [](ScratchJob& j, const auto& ws, const auto&) {
+         const std::string list = j.layout(ws_args(j, ws), "WS");
+         set_parameters(j.dir() / "des" / "parameters_multilook.hdr", {{"W1", "0.2"}});
+         return list;
+       },
+       ec::kStageFailed, "run()", "2 W1 + W2 must be a whole number", true},
   };
   for (const BadCase& c : cases) {
     SCOPED_TRACE(c.name);
@@ -183,7 +362,10 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
     if (c.inLog) {
       EXPECT_NE(job.log().find(c.inLog), std::string::npos) << job.log();
     }
-    for (int s = 1; s <= 5; ++s) EXPECT_FALSE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")));
+    for (int s = 1; s <= 5; ++s)
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")), c.focused) << s;
+    for (const char* image : {"scene_pwr", "scene_pwr.part", "scene_pwr_hdr", "scene_gr"})
+      EXPECT_FALSE(fs::exists(job.dir() / "out" / image)) << image;
   }
 }
 

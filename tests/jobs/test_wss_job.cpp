@@ -11,6 +11,7 @@
 #include "geometry/geolocation.hpp"
 #include "jobs/multilook_step.hpp"
 #include "simulator/wss_product.hpp"
+#include "annotation_keys.hpp"
 #include "test_standalone_support.hpp"
 
 using namespace sar::test;
@@ -32,12 +33,6 @@ std::string simulate_wss(const fs::path& dir, int dropSwath = 0, bool truncated 
   c.truncate_mds = truncated;
   c.targets = {{3, 420.0, 200.0, 4000.0}};
   return sar::simulator::write_wss_product(c).path;
-}
-
-int key_int(const fs::path& annotation, const std::string& key) {
-  for (const auto& l : lines_of(annotation))
-    if (l.rfind(key + " = ", 0) == 0) return std::atoi(l.c_str() + key.size() + 3);
-  return -1;
 }
 
 }  // namespace
@@ -113,43 +108,6 @@ TEST(WssJob, WrongAndDamagedInputsStopWithTheirCode) {
   }
 }
 
-namespace {
-
-std::vector<double> doubles_of(const fs::path& annotation, const std::string& key) {
-  // A matrix goes on with one row a line, each line opening with blanks and '{'.
-  std::vector<double> v;
-  bool inKey = false;
-  for (const auto& l : lines_of(annotation)) {
-    std::string text;
-    if (l.rfind(key + " = ", 0) == 0) {
-      inKey = true;
-      text = l.substr(key.size() + 3);
-    } else if (inKey && l.find_first_not_of(" \t") != std::string::npos && l[l.find_first_not_of(" \t")] == '{' &&
-               (l[0] == ' ' || l[0] == '\t')) {
-      text = l;
-    } else {
-      inKey = false;
-      continue;
-    }
-    for (char& ch : text)
-      if (ch == '{' || ch == '}' || ch == ',') ch = ' ';
-    std::istringstream in(text);
-    for (double x; in >> x;) v.push_back(x);
-  }
-  return v;
-}
-
-std::string text_of(const fs::path& annotation, const std::string& key) {
-  for (const auto& l : lines_of(annotation))
-    if (l.rfind(key + " = ", 0) == 0) {
-      std::string t = l.substr(key.size() + 3);
-      if (!t.empty() && t.front() == '"') t = t.substr(1, t.find('"', 1) - 1);
-      return t;
-    }
-  return {};
-}
-
-}  // namespace
 
 // The ground range image located through its annotation alone: columns 75 m apart on the
 // ellipsoid in all five sub-swaths, and each target where the simulator put it.

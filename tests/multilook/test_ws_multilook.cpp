@@ -5,6 +5,7 @@
 
 #include <cmath>
 #include <filesystem>
+#include <functional>
 #include <numeric>
 
 #include "envisat/level1.hpp"
@@ -48,12 +49,14 @@ const simulator::WssProduct& uniform_product() {
   return product;
 }
 
-WsRun multilook(const std::string& product, WsMultilookConfig cfg) {
+WsRun multilook(const std::string& product, WsMultilookConfig cfg,
+                const std::function<void(std::array<WsSubSwath, 5>&)>& edit = {}) {
   WsRun r;
   envisat::Level1Product p;
   std::string error;
   EXPECT_EQ(envisat::read_level1(product, p, error), 0) << error;
   EXPECT_EQ(wss_sub_swaths(p, r.swaths, error), 0) << error;
+  if (edit) edit(r.swaths);
   SlcGrid orbit;
   EXPECT_EQ(orbit_geometry(kOrbit, p.firstLineTime, 5.331e9, orbit, error), 0) << error;
   cfg.lineStep = p.lineTimeInterval;
@@ -263,6 +266,37 @@ TEST(WsMultilook, TargetInAnOverlapAppearsOnceAtItsPosition) {
     EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].first, line, 1.0);
     EXPECT_NEAR(peaks[static_cast<std::size_t>(k)].second, expected[k], 1.0);
   }
+}
+
+// Sub-swaths that do not meet (short sampling windows, as in a small level 0 simulation): each
+// keeps all its columns, those between them stay empty, and the far ones keep their level.
+TEST(WsMultilook, SubSwathsThatDoNotMeetLeaveAnEmptyGap) {
+  const auto& product = uniform_product();
+  const WsRun joined = multilook(product.path, WsMultilookConfig{});
+  ASSERT_EQ(joined.status, 0) << joined.result.error;
+  const double step = joined.result.slantStep;
+  const double gap = 200 * step;  // columns of the joined grid
+  const WsRun r = multilook(product.path, WsMultilookConfig{}, [&](std::array<WsSubSwath, 5>& sw) {
+    for (std::size_t s = 2; s < 5; ++s) sw[s].nearTime += gap;
+  });
+  ASSERT_EQ(r.status, 0) << r.result.error;
+  ASSERT_EQ(r.samples, joined.samples + 200);
+  const int d = r.result.decimation;
+  const int end1 = static_cast<int>(std::lround((r.swaths[1].nearTime - r.swaths[0].nearTime) / step)) +
+                   r.swaths[1].samples / d;
+  const int start2 = static_cast<int>(std::lround((r.swaths[2].nearTime - r.swaths[0].nearTime) / step));
+  ASSERT_GT(start2, end1);
+  double near = 0.0, far = 0.0, inGap = 0.0;
+  for (int l = 400; l < r.lines - 400; ++l) {
+    const float* row = r.amplitude.data() + static_cast<std::size_t>(l) * r.samples;
+    for (int c = end1; c < start2; ++c) inGap += row[c];
+    for (int c = end1 - 40; c < end1; ++c) near += static_cast<double>(row[c]) * row[c];
+    for (int c = start2; c < start2 + 40; ++c) far += static_cast<double>(row[c]) * row[c];
+  }
+  EXPECT_EQ(inGap, 0.0);
+  // The last columns of SS2 and the first of SS3, whole on each side (no half-overlap cut).
+  EXPECT_GT(near, 0.0);
+  EXPECT_LT(std::fabs(10.0 * std::log10(far / near)), 0.5);
 }
 
 }  // namespace
