@@ -17,6 +17,7 @@
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
 #include "geometry/geolocation.hpp"
+#include "hostlib/footprint.hpp"
 #include "jobs/annotation.hpp"
 #include "jobs/job_common.hpp"
 #include "jobs/stages.hpp"
@@ -200,6 +201,10 @@ void finish_ws_product(const std::string& output, const multilook::WsMultilookRe
     note_failed_stage("WSwritepars_kelvor");
     base::fatal(base::ec::kStageFailed, {"WSwritepars_kelvor()", failed_stage()});
   }
+  // Where the swath lies, for map tools, from the corners of the description; an image without
+  // it is still a product, so a failure is reported and the job goes on.
+  hostlib::write_footprint(output, hostlib::kFootprintAllFiles);
+  errno = 0;
 
   if (!info.quickLook) return;
   base::SetActivityLabel("Tiff generation ...");

@@ -99,7 +99,8 @@ struct Image {
 Image read_image(const fs::path& raster, bool ground) {
   Image im;
   im.ground = ground;
-  for (const char* suffix : {"", ".hdr", ".vrt", "_hdr", ".sml"})
+  // The image, its headers and description, and its footprint for map tools.
+  for (const char* suffix : {"", ".hdr", ".vrt", "_hdr", ".sml", ".kml", ".shp", ".xml"})
     EXPECT_TRUE(fs::exists(raster.string() + suffix)) << raster << suffix;
   const fs::path a = raster.string() + "_hdr";
   im.lines = key_int(a, "NrOfLinesPerImage");
@@ -254,8 +255,9 @@ TEST_F(WsJob, SarfocusLeavesTheMultilookedProduct) {
   for (const auto& e : fs::directory_iterator(out))
     if (e.is_regular_file()) names.push_back(e.path().filename().string());
   std::sort(names.begin(), names.end());
-  const std::vector<std::string> expected = {stem + "_gr",     stem + "_gr.hdr", stem + "_gr.sml",
-                                             stem + "_gr.vrt", stem + "_gr_hdr"};
+  const std::vector<std::string> expected = {stem + "_gr",     stem + "_gr.dbf", stem + "_gr.hdr", stem + "_gr.kml",
+                                             stem + "_gr.prj", stem + "_gr.shp", stem + "_gr.shx", stem + "_gr.sml",
+                                             stem + "_gr.vrt", stem + "_gr.xml", stem + "_gr_hdr"};
   EXPECT_EQ(names, expected);
   auto withSkip = args;
   withSkip.push_back("--skip-complete");
