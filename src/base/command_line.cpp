@@ -2,6 +2,7 @@
 
 #include <charconv>
 #include <cmath>
+#include <cstdio>
 #include <iomanip>
 #include <sstream>
 
@@ -165,6 +166,19 @@ Parsed parse(CLI::App& app, const std::vector<std::string>& args) {
 
 Parsed parse(CLI::App& app, int argc, const char* const* argv) {
   return parse(app, std::vector<std::string>(argv + 1, argv + argc));
+}
+
+std::optional<int> parse_main(CLI::App& app, int argc, const char* const* argv, const std::string& program) {
+  const Parsed parsed = parse(app, argc, argv);
+  if (parsed.help) {
+    std::fputs(app.help().c_str(), stdout);
+    return 0;
+  }
+  if (!parsed.error.empty()) {
+    std::fprintf(stderr, "%s: %s; see %s --help\n", program.c_str(), parsed.error.c_str(), program.c_str());
+    return 2;
+  }
+  return std::nullopt;
 }
 
 }  // namespace sar::base::cli

@@ -3,6 +3,7 @@
 // analyser) on CLI11, in one style: help texts laid out alike from the options themselves, and a
 // refusal as one line "<program>: <option> <problem>; see <program> --help".
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -53,5 +54,9 @@ Parsed parse(CLI::App& app, const std::vector<std::string>& args);
 
 /// Same over main's arguments.
 Parsed parse(CLI::App& app, int argc, const char* const* argv);
+
+/// A tool's main: parses, prints the help (status 0) or the refusal "program: <error>; see
+/// program --help" (status 2) and returns that status; nothing when the line was accepted.
+std::optional<int> parse_main(CLI::App& app, int argc, const char* const* argv, const std::string& program);
 
 }  // namespace sar::base::cli

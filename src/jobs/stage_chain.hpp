@@ -9,7 +9,6 @@
 // exit); the chain does not catch, so that the driver alone decides what the host is told.
 // Consecutive stages of one phase ("extraction", "range", "Doppler", "azimuth") are timed
 // together, into the log, so an operator sees where a slow run spent its time.
-#include <chrono>
 #include <functional>
 #include <optional>
 #include <string>
@@ -17,36 +16,17 @@
 #include <vector>
 
 #include "base/diagnostics.hpp"
-#include "base/run_services.hpp"
+#include "base/stage_clock.hpp"
 #include "jobs/stages.hpp"
 #include "stripmap/raster_files.hpp"
 
 namespace sar::jobs {
 
-/// Wall time of one phase into the log. A phase that is itself writing reports its whole
-/// time; others report the raster writes they made apart from their own work.
-class StageClock {
+/// The phase clock of the jobs: raster writes apart from the phase's own work.
+class StageClock : public base::StageClock {
  public:
   explicit StageClock(std::string phase, bool writing = false)
-      : phase_(std::move(phase)), writingPhase_(writing), writing_(stripmap::output_write_seconds()) {}
-  StageClock(const StageClock&) = delete;
-  StageClock& operator=(const StageClock&) = delete;
-  ~StageClock() {
-    const double total = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
-    const double writing = stripmap::output_write_seconds() - writing_;
-    if (writing > 0.0 && !writingPhase_) {
-      base::LogPrintf("Stage time %-14s %9.2f s\n", phase_.c_str(), total - writing);
-      base::LogPrintf("Stage time %-14s %9.2f s\n", "raster writes", writing);
-    } else {
-      base::LogPrintf("Stage time %-14s %9.2f s\n", phase_.c_str(), total);
-    }
-  }
-
- private:
-  std::string phase_;
-  bool writingPhase_;
-  double writing_;
-  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
+      : base::StageClock(std::move(phase), &stripmap::output_write_seconds, writing) {}
 };
 
 template <class Channel>

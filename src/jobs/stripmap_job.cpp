@@ -13,6 +13,7 @@
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
 #include "envisat/product_types.hpp"
+#include "geometry/doppler_geometry.hpp"
 #include "hostlib/footprint.hpp"
 #include "hostlib/quicklook.hpp"
 #include "jobs/aux_lookup.hpp"
@@ -24,8 +25,8 @@ namespace {
 
 constexpr double kSpeedOfLight = 299792458.0;
 constexpr double kWantedPolyPoints = 6900.0;
-// Attitude law terms of the geometric Doppler prediction.
-constexpr double kAttitude[7] = {1.0, 10.0, 0.0 /* wavelength */, 3.912987, -0.167074, 0.050233, 23.0};
+// The two terms the geometric Doppler prediction carries before the wavelength.
+constexpr double kCarriedTerms[2] = {1.0, 10.0};
 
 void remove_work_file(const std::string& path) {
   std::error_code ec;
@@ -44,8 +45,9 @@ int doppler_geometry(const std::string& orbitPath, StripmapChannel& c) {
   const double wavelength = kSpeedOfLight / par.carrierFrequency;
   const double midTime = par.azimuthStartTime + par.lines / (2.0 * par.prf);
   const double midRange = 0.5 * par.samples / par.samplingRate + par.nearRangeTime;
-  if (int st = EstDopplerENVI(orbitPath, midTime, midRange, kAttitude[0], kAttitude[1], wavelength, kAttitude[3],
-                              kAttitude[4], kAttitude[5], kAttitude[6], 0.0, c.dc.geometricCentroid))
+  const geometry::PointingLaw law;  // the platform's yaw-steering law
+  if (int st = EstDopplerENVI(orbitPath, midTime, midRange, kCarriedTerms[0], kCarriedTerms[1], wavelength, law.p_deg,
+                              law.q_deg, law.r_deg, law.s_deg, law.a_rad, c.dc.geometricCentroid))
     return st;
   centroid_slope_band(orbitPath, midTime, par, c.proc, c.dc);
   c.dc.inputPath = par.rgfPath;

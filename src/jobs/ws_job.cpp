@@ -6,7 +6,6 @@
 #include <array>
 #include <bit>
 #include <cerrno>
-#include <chrono>
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
@@ -43,8 +42,6 @@ constexpr std::string_view kWsBanner =
     "ASA_XCH : [ %s ]\nOUTPUT ROOT NAME : [ %s ]";
 constexpr std::string_view kWsParameterFile = "parameters_WS.hdr";
 constexpr double kCarrier = 5.331e9;
-// Yaw-steering law of the platform for the orbit's centroid: p, q, r, s (degrees).
-constexpr double kLaw[4] = {3.912987, -0.167074, 0.050233, 23.0};
 
 // An auxiliary product: given and of its kind, or looked up in the index; the job cannot go on
 // without any of the three.
@@ -192,15 +189,13 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   extra.extract_percent = 100;
   extra.extract_kind = envisat::kExtractEchoes;
   {
-    const auto start = std::chrono::steady_clock::now();
+    const StageClock clock("extraction");
     // The shared extraction stage: it also refuses a product shorter than its header says.
     envisat::enviauxfiles files;
     files.level0 = args[0];
     files.ins = ins;
     files.extracted = xch;
     if (envi_extract(files, channels, extra) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_extract"});
-    base::LogPrintf("Stage time %-14s %9.2f s\n", "extraction",
-                    std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count());
   }
   // Each sub-swath file holds its own bursts' echoes.
   for (envisat::sarpar& c : channels) c.lines = c.burst_count * c.burst_echoes;
@@ -226,7 +221,9 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   const scansar::GeometricCentroid geometric = [orbitPath](const metadata::SceneReferences&, double t, double tau,
                                                            double wavelength) {
     double fdc = 0.0;
-    if (geometry::EstDopplerENVI(orbitPath, t, tau, 1.0, 10.0, wavelength, kLaw[0], kLaw[1], kLaw[2], kLaw[3], 0.0, fdc) != 0)
+    const geometry::PointingLaw law;
+    if (geometry::EstDopplerENVI(orbitPath, t, tau, 1.0, 10.0, wavelength, law.p_deg, law.q_deg, law.r_deg, law.s_deg,
+                                 law.a_rad, fdc) != 0)
       return 0.0;
     return fdc;
   };

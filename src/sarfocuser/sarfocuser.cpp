@@ -9,6 +9,7 @@
 #include "base/diagnostics.hpp"
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
+#include "base/stage_clock.hpp"
 #include "doppler/dcest.hpp"
 #include "geometry/orbit_interp.hpp"
 #include "stripmap/azimuth_focus.hpp"
@@ -35,21 +36,7 @@ double getDouble(const char* section, const char* key, const std::string& file) 
   return base::GetCheckMyProfileDouble(section, key, file);
 }
 
-// Wall time of one stage into the log, so that an operator sees where a slow run spent it.
-class StageClock {
- public:
-  explicit StageClock(const char* stage) : stage_(stage) {}
-  StageClock(const StageClock&) = delete;
-  StageClock& operator=(const StageClock&) = delete;
-  ~StageClock() {
-    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
-    base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, s);
-  }
-
- private:
-  const char* stage_;
-  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
-};
+using base::StageClock;
 
 bool exists(const std::string& path) {
   const base::ErrnoGuard keep;

@@ -1,30 +1,14 @@
 // The wide swath processor: the burst chain over the selected sub-swaths, stage by stage.
-#include <chrono>
 #include <filesystem>
 #include <string>
 
 #include "base/diagnostics.hpp"
 #include "base/run_services.hpp"
+#include "base/stage_clock.hpp"
 #include "scansar/wide_swath.hpp"
 
 namespace sar::scansar {
-namespace {
-// Wall time of a stage into the log, so that an operator sees where a run spent it.
-class StageClock {
- public:
-  explicit StageClock(const char* stage) : stage_(stage) {}
-  StageClock(const StageClock&) = delete;
-  StageClock& operator=(const StageClock&) = delete;
-  ~StageClock() {
-    const double s = std::chrono::duration<double>(std::chrono::steady_clock::now() - start_).count();
-    base::LogPrintf("Stage time %-14s %9.2f s\n", stage_, s);
-  }
-
- private:
-  const char* stage_;
-  std::chrono::steady_clock::time_point start_ = std::chrono::steady_clock::now();
-};
-}  // namespace
+using base::StageClock;
 
 int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const metadata::SceneReferences& refs,
                 wsparm& par, const WsStages& stages, bool ascending, const GeometricCentroid& geometric) {

@@ -141,15 +141,7 @@ int main(int argc, char** argv) {
                     ->check(cli::one_of({"low", "high"})),
                 "low|high");
 
-  const cli::Parsed parsed = cli::parse(*app, argc, argv);
-  if (parsed.help) {
-    std::fputs(app->help().c_str(), stdout);
-    return 0;
-  }
-  if (!parsed.error.empty()) {
-    std::fprintf(stderr, "sarsim: %s; see sarsim --help\n", parsed.error.c_str());
-    return 2;
-  }
+  if (const auto status = cli::parse_main(*app, argc, argv, "sarsim")) return *status;
   try {
     config.mode = sar::simulator::mode_from_name(mode);
     for (const auto& f : faults) config.faults.push_back(sar::simulator::fault_from_name(f));

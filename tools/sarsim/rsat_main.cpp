@@ -114,15 +114,7 @@ int main(int argc, char** argv) {
                     ->check(cli::one_of({"low", "high"})),
                 "low|high");
 
-  const cli::Parsed parsed = cli::parse(*app, argc, argv);
-  if (parsed.help) {
-    std::fputs(app->help().c_str(), stdout);
-    return 0;
-  }
-  if (!parsed.error.empty()) {
-    std::fprintf(stderr, "sarsim-rs: %s; see sarsim-rs --help\n", parsed.error.c_str());
-    return 2;
-  }
+  if (const auto status = cli::parse_main(*app, argc, argv, "sarsim-rs")) return *status;
   try {
     for (const auto& t : targets) {
       const std::vector<double> v = cli::numbers_of(t);

@@ -243,13 +243,8 @@ PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int
 }
 
 PlanKey Stage::turned_key(int threads) const {
-  PlanKey k;
-  k.shape = BatchShape{shape_.n, 1, 1, shape_.n, shape_.sign};
-  k.inPlace = true;
-  k.alignIn = k.alignOut = 0;  // the turning buffer is the kit's own, 64-byte aligned
-  k.threads = planner_threads_for(threads);
-  k.flags = planner_flags();
-  return k;
+  // The turning buffer is the kit's own, 64-byte aligned: one row in place.
+  return row_key(true, 0, 0, threads);
 }
 
 PlanKey Stage::row_key(bool inPlace, int alignIn, int alignOut, int threads) const {
