@@ -12,12 +12,13 @@
 #include "doppler/dcest.hpp"
 #include "dsp/fft.hpp"
 #include "dsp/fitting.hpp"
+#include "base/constants.hpp"
 
 namespace sar::doppler {
 namespace {
 
-constexpr double kPi = std::numbers::pi;
-constexpr double kTwoPi = 2.0 * kPi;
+using base::kPi;
+using base::kTwoPi;
 constexpr double kSixteenPi2 = 157.91367041742973;
 
 /// Trapezoidal refinement of the integral of g over [0, 1]: each round doubles the points,

@@ -24,6 +24,7 @@
 #include "doppler/dcest.hpp"
 #include "dsp/czt.hpp"
 #include "dsp/filters.hpp"
+#include "base/constants.hpp"
 
 namespace sar::doppler {
 
@@ -40,7 +41,7 @@ struct MlbfState {
 }  // namespace detail
 
 namespace {
-constexpr double kPi = std::numbers::pi;
+using base::kPi;
 
 /// 1 when v is infinite or NaN.
 inline std::uint32_t exponent_all_set(float v) {

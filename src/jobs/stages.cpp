@@ -21,6 +21,7 @@
 #include "stripmap/progress.hpp"
 #include "stripmap/range_calibration.hpp"
 #include "stripmap/range_focus.hpp"
+#include "base/constants.hpp"
 
 namespace sar::jobs {
 namespace {
@@ -143,7 +144,7 @@ void centroid_slope_band(const std::string& orbitPath, double t, const sarpar& p
   int st = 10;
   try {
     const geometry::OrbitData orbit = geometry::read_orbit(orbitPath);
-    st = geometry::centroid_slope(orbit, t, nearTau, farTau, 299792458.0 / par.carrierFrequency, geometry::PointingLaw{},
+    st = geometry::centroid_slope(orbit, t, nearTau, farTau, base::kSpeedOfLight / par.carrierFrequency, geometry::PointingLaw{},
                                   conf.AttitudeErrorBound, band);
   } catch (const geometry::OrbitError& e) {
     st = e.status();

@@ -19,11 +19,12 @@
 #include "jobs/aux_lookup.hpp"
 #include "jobs/drivers.hpp"
 #include "jobs/job_common.hpp"
+#include "base/constants.hpp"
 
 namespace sar::jobs {
 namespace {
 
-constexpr double kSpeedOfLight = 299792458.0;
+using base::kSpeedOfLight;
 constexpr double kWantedPolyPoints = 6900.0;
 // The two terms the geometric Doppler prediction carries before the wavelength.
 constexpr double kCarriedTerms[2] = {1.0, 10.0};

@@ -27,6 +27,7 @@
 #include "jobs/ws_product.hpp"
 #include "multilook/wss_input.hpp"
 #include "multilook/ws_multilook.hpp"
+#include "base/constants.hpp"
 
 namespace sar::jobs {
 
@@ -34,7 +35,7 @@ namespace {
 
 constexpr const char* kWssParameterFile = "parameters_multilook.hdr";
 constexpr double kCarrier = 5.331e9;
-constexpr double kLightSpeed = 299792458.0;
+constexpr double kLightSpeed = base::kSpeedOfLight;
 }  // namespace
 
 int main_multilook_wss(const std::string& listPath) {

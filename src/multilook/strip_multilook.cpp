@@ -17,6 +17,7 @@
 #include "io/cell_types.hpp"
 #include "io/data_file.hpp"
 #include "multilook/strip_detect.hpp"
+#include "base/constants.hpp"
 
 namespace sar::multilook {
 
@@ -25,7 +26,7 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr int kRejected = 10;
-constexpr double kLightSpeed = 299792458.0;
+constexpr double kLightSpeed = base::kSpeedOfLight;
 constexpr double kHalfLightSpeed = 149896229.0;
 constexpr std::size_t kTextSize = 512;
 

@@ -4,6 +4,7 @@
 
 #include "geometry/orbit_file.hpp"
 #include "geometry/orbit_interp.hpp"
+#include "base/constants.hpp"
 
 namespace sar::multilook {
 
@@ -20,7 +21,7 @@ int wss_sub_swaths(const envisat::Level1Product& p, std::array<WsSubSwath, 5>& s
     s.rowPrefix = static_cast<int32_t>(envisat::kMdsRowPrefix);
     s.samples = static_cast<int>((mds->recordSize - envisat::kMdsRowPrefix) / 4);
     // The tie point's sample number counts from 1.
-    s.nearTime = geo->firstSlantTime - (static_cast<double>(geo->firstSample) - 1.0) * 2.0 * p.mpp[static_cast<std::size_t>(d - 1)].rangeSpacing / 299792458.0;
+    s.nearTime = geo->firstSlantTime - (static_cast<double>(geo->firstSample) - 1.0) * 2.0 * p.mpp[static_cast<std::size_t>(d - 1)].rangeSpacing / base::kSpeedOfLight;
     s.incidence = geo->firstIncidence;
     if (static_cast<std::size_t>(d - 1) < p.dcc.size()) s.centroid = p.dcc[static_cast<std::size_t>(d - 1)].coefficients[0];
     if (s.samples < 1 || !(s.incidence > 0.0 && s.incidence < 90.0)) {

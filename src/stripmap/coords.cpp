@@ -4,6 +4,7 @@
 
 #include "base/diagnostics.hpp"
 #include "geometry/geolocation.hpp"
+#include "base/constants.hpp"
 
 namespace sar::stripmap {
 
@@ -16,7 +17,7 @@ int get_coords(procparm& proc, const metadata::sarpar& par) {
                                                       proc.orbitPositions[static_cast<std::size_t>(3 * i + 2)]};
   rec.t0 = proc.orbitStartTime;
   rec.dt = proc.orbitSpacing;
-  rec.wavelength = 299792458.0 / par.carrierFrequency;
+  rec.wavelength = base::kSpeedOfLight / par.carrierFrequency;
   rec.side = 1.0;
   rec.height = 0.0;
   rec.fdc = 0.0;

@@ -8,13 +8,14 @@
 #include "base/diagnostics.hpp"
 #include "dsp/fitting.hpp"
 #include "geometry/geolocation.hpp"
+#include "base/constants.hpp"
 
 namespace sar::stripmap {
 
 namespace {
 
 constexpr int kRejected = 10;
-constexpr double kSpeedOfLight = 299792458.0;
+using base::kSpeedOfLight;
 constexpr int kRateDegree = 2;
 constexpr int kAngleDegree = 4;
 

@@ -9,12 +9,13 @@
 #include <stdexcept>
 
 #include "base/profile.hpp"
+#include "base/constants.hpp"
 
 namespace sar::analyser {
 
 namespace {
 
-constexpr double kSpeedOfLight = 299792458.0;
+using sar::base::kSpeedOfLight;
 
 std::vector<std::string> fields_of(std::string_view text) {
   std::vector<std::string> out;
