@@ -9,6 +9,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
+#include <numbers>
 #include <span>
 #include <string>
 #include <vector>
@@ -216,6 +217,21 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   if (envisat::envi_syntchirp(whole, refs) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_syntchirp"});
   // The pass direction from the Earth-fixed z velocity at the scene's middle state vector.
   const bool ascending = refs.orbitVelocities[3 * 2 + 2] > 0.0;
+
+  // The two-way elevation pattern of each sub-swath, from its beam slot.
+  try {
+    for (int s = 0; s < scansar::kSwaths; ++s) {
+      scansar::ElevationPattern& e = par.elevation[static_cast<std::size_t>(s)];
+      double reference = 0.0;
+      if (envisat::envi_slot_pattern(xca, ins, scansar::kBeamSlot[static_cast<std::size_t>(s)],
+                                     channels[0].polarization_type, e.amplitude, reference) != 0)
+        base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_beam_corr"});
+      e.reference = reference * std::numbers::pi / 180.0;
+    }
+  } catch (const base::InputError& e) {
+    note_failed_stage("envi_beam_corr");
+    fail_on_input(e, "WSprocessor()", whole);
+  }
 
   const std::string orbitPath = args[1];
   const scansar::GeometricCentroid geometric = [orbitPath](const metadata::SceneReferences&, double t, double tau,

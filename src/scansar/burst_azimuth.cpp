@@ -104,6 +104,19 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     for (int32_t k = 0; k < N; ++k) weight[static_cast<std::size_t>(k)] = static_cast<float>(w[static_cast<std::size_t>(k)] / norm);
   }
 
+  // Elevation antenna correction, one gain per range column of the block.
+  std::vector<float> rangeGain(static_cast<std::size_t>(M), 1.0f);
+  if (!par.elevation[i].amplitude.empty()) {
+    envi_beam_corr(par.elevation[i], est.slantToElevation[i], 0.0, fs, rangeGain);
+    float lo = rangeGain[static_cast<std::size_t>(c0)], hi = lo;
+    for (int32_t j = c0; j < c0 + focused.validColumns && j < M; ++j) {
+      lo = std::min(lo, rangeGain[static_cast<std::size_t>(j)]);
+      hi = std::max(hi, rangeGain[static_cast<std::size_t>(j)]);
+    }
+    base::LogPrintf("SS%d: elevation correction %.2f to %.2f dB across the valid columns\n", s + 1,
+                    20.0 * std::log10(lo), 20.0 * std::log10(hi));
+  }
+
   ScallopModel scallop;
   scallop.lengthOverWavelength = par.antennaLength * scan.carrierFrequency / kC;
   scallop.halfWavelengthOverSpeed = 0.5 * (kC / scan.carrierFrequency) / est.satelliteSpeed;
@@ -153,7 +166,8 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     std::fill(block.begin(), block.end(), fcomplex{});
     for (int32_t k = 0; k < N; ++k)
       for (int32_t j = 0; j < M; ++j)
-        block[static_cast<std::size_t>(k) * M + j] = rows[static_cast<std::size_t>(k) * M + j] * weight[static_cast<std::size_t>(k)];
+        block[static_cast<std::size_t>(k) * M + j] =
+            rows[static_cast<std::size_t>(k) * M + j] * (weight[static_cast<std::size_t>(k)] * rangeGain[static_cast<std::size_t>(j)]);
     wk.lines = Nf;
     wk.samples = M;
     wk.nearTime = focused.nearTime;

@@ -94,13 +94,14 @@ int orbit_geometry(const scansar& scan, int s, const metadata::SceneReferences& 
   proc.dopplerCentroid = {centroidMid, 0, 0, 0, 0, 0, 0, f.nearTime, 0};
   if (const int st = stripmap::getgeopoly(p, proc); st != 0) return st;
   constexpr int kPoints = 10;
-  std::vector<double> x(kPoints), rate(kPoints), inc(kPoints), ground(kPoints);
+  std::vector<double> x(kPoints), rate(kPoints), inc(kPoints), ground(kPoints), look(kPoints);
   double g = 0.0;
   for (int k = 0; k < kPoints; ++k) {
     const double tau = f.nearTime + k * (p.samples - 1.0) / (kPoints - 1) / scan.samplingRate;
     x[static_cast<std::size_t>(k)] = tau - refTime;
     rate[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.dopplerRate, tau, 0.0);
     inc[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.incidenceAngle, tau, 0.0);
+    look[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.lookAngle, tau, 0.0) * kPi / 180.0;
     if (k > 0) {
       const double sinMid = std::sin(0.5 * (inc[static_cast<std::size_t>(k)] + inc[static_cast<std::size_t>(k - 1)]) * kPi / 180.0);
       g += (kC / 2.0) * (x[static_cast<std::size_t>(k)] - x[static_cast<std::size_t>(k - 1)]) / sinMid;
@@ -116,6 +117,15 @@ int orbit_geometry(const scansar& scan, int s, const metadata::SceneReferences& 
   std::array<double, 4> gr{};
   if (const int st = stripmap::polfit(xs, ground, gr, 3); st != 0) return st;
   est.slantToGround[i] = {gr[0], gr[1], gr[2], gr[3], 0.0};
+  // The look angle, degree 4, fitted in tenths of a millisecond so that the normal equations
+  // stay well conditioned, then scaled back to seconds.
+  constexpr double kUnit = 1e4;
+  std::vector<double> xu(kPoints);
+  for (int k = 0; k < kPoints; ++k) xu[static_cast<std::size_t>(k)] = xs[static_cast<std::size_t>(k)] * kUnit;
+  std::array<double, 5> el{};
+  if (const int st = stripmap::polfit(xu, look, el, 4); st != 0) return st;
+  double scale = 1.0;
+  for (std::size_t k = 0; k < el.size(); ++k, scale *= kUnit) est.slantToElevation[i][k] = el[k] * scale;
   return 0;
 }
 
@@ -229,6 +239,7 @@ int save_doppler(const std::string& path, const DopplerEstimate& est, std::span<
     WriteMyProfileDouble(kCentroidSection, key("Fraction_", s), est.fractional[i], path);
     WriteProfileDoubleArray(kRateSection, key("Doppler_rate_coefs0_", s), est.rate[i], path);
     WriteProfileDoubleArray(kRateSection, key("Slant_to_ground_", s), est.slantToGround[i], path);
+    WriteProfileDoubleArray(kRateSection, key("Slant_to_elevangle_", s), est.slantToElevation[i], path);
     WriteMyProfileDouble(kRateSection, key("Incidence_", s), est.incidence[i], path);
     const std::array<int32_t, 3> cols{focused[i].width, focused[i].firstValid, focused[i].validColumns};
     WriteMyProfileIntArray(kRateSection, key("Range_columns_", s), cols, path);
@@ -254,6 +265,7 @@ int load_doppler(const std::string& path, DopplerEstimate& est, std::array<Range
     if (GetProfileDoubleArray(kCentroidSection, key("Doppler_cent_coefs0_", s), est.centroid[i], path) != 0) ++bad;
     if (GetProfileDoubleArray(kRateSection, key("Doppler_rate_coefs0_", s), est.rate[i], path) != 0) ++bad;
     if (GetProfileDoubleArray(kRateSection, key("Slant_to_ground_", s), est.slantToGround[i], path) != 0) ++bad;
+    if (GetProfileDoubleArray(kRateSection, key("Slant_to_elevangle_", s), est.slantToElevation[i], path) != 0) ++bad;
     d(kRateSection, key("Incidence_", s), est.incidence[i]);
     d(kRateSection, key("Near_time_", s), focused[i].nearTime);
     std::array<int32_t, 3> cols{};

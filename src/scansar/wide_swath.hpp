@@ -62,6 +62,15 @@ struct scansar {
   std::array<double, kSwaths> lookBandwidth{};  // Hz, range look band for a ground resolution
 };
 
+/// Two-way elevation antenna pattern of a sub-swath: linear amplitudes of the 201 table entries,
+/// the middle one at look angle `reference` (rad from the geocentric vertical at the
+/// satellite), 0.05 degrees apart (0.072 degrees for a negative reference). Empty: no correction.
+struct ElevationPattern {
+  std::vector<float> amplitude;
+  double reference = 0.0;
+  double step() const;
+};
+
 /// Processing choices (section "Focusing_parameters") and the running state of a run.
 struct wsparm {
   std::array<int32_t, kSwaths> swathsToProcess{1, 1, 1, 1, 1};
@@ -79,6 +88,7 @@ struct wsparm {
   int32_t rangeOverlap = 32;              // full overlap of range sub-blocks
   double antennaLength = 10.0;            // m
   double centroidReference = -1e10;       // Hz; above -1e9 the ambiguity is taken from it
+  std::array<ElevationPattern, kSwaths> elevation{};  // per sub-swath; empty: not corrected
   // Running results per sub-swath.
   std::array<double, kSwaths> earliestTime{}, latestTime{};
   std::array<int32_t, kSwaths> firstLine{}, lastLine{};
@@ -129,6 +139,7 @@ struct DopplerEstimate {
   double satelliteSpeed = 0.0;               // |V|, Earth-fixed, m/s
   std::array<double, kSwaths> incidence{};   // degrees, mid swath
   std::array<std::array<double, 5>, kSwaths> slantToGround{};  // ground range (m) in range time about each near time
+  std::array<std::array<double, 5>, kSwaths> slantToElevation{};  // look angle (rad) in range time about each near time
   bool ambiguityDoubtful = false;
   bool geometricApplied = false;  // the data disagreed with the orbit by more than half a PRF
 };
@@ -159,6 +170,13 @@ struct ScallopModel {
   /// The factor a line of Doppler f is multiplied by: 1 / (sqrt(G(f) + G(f + prf) + G(f - prf)) + 1e-4).
   double scale(double f, double fdc, double prf) const;
 };
+
+/// Range gain of the elevation antenna correction: gain[j] = 1 / P(theta_j), P the pattern
+/// linear between entries, theta_j the look angle of column j, slantToElevation evaluated at
+/// x0 + j / fs. Columns whose look angle falls outside the table keep gain 1 and are reported
+/// once, "out of antenna beam range". Returns the count of such columns.
+int envi_beam_corr(const ElevationPattern& pattern, const std::array<double, 5>& slantToElevation, double x0, double fs,
+                   std::span<float> gain);
 
 /// Azimuth focusing of sub-swath s from `D/rgfoc_ss<s+1>` into `D/SS<s+1>.out`. Returns 0, or
 /// 10 for inputs that cannot be focused, or the failing step's status.
