@@ -16,7 +16,10 @@
 //
 // De-scalloping: a target's level in a burst is the two-way antenna pattern at the Doppler it
 // had there; each output line is divided by the pattern's amplitude at its Doppler (with the
-// two PRF-aliased lobes, which also add power in a distributed scene).
+// two PRF-aliased lobes, which also add power in a distributed scene). The gain's slope across
+// a response would move its peak; the line is read where that move is undone. (A burst's
+// time-bandwidth product is about 2, so its azimuth spectrum does not map the echo times to
+// Doppler one to one, and the same gain applied bin by bin to the spectrum moves peaks alike.)
 #include <algorithm>
 #include <cmath>
 #include <cstring>
@@ -103,6 +106,18 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     const double norm = std::sqrt(sum / N);
     for (int32_t k = 0; k < N; ++k) weight[static_cast<std::size_t>(k)] = static_cast<float>(w[static_cast<std::size_t>(k)] / norm);
   }
+  // Spread of the weight over the burst, echoes^2: the curvature of a response's peak,
+  // |h(tau)|^2 ~ 1 - (2 pi Ka tau / PRF)^2 windowSpread, follows from it.
+  double windowSpread = 0.0;
+  {
+    double sw = 0.0;
+    for (int32_t k = 0; k < N; ++k) {
+      const double dk = k - (N - 1) / 2.0;
+      sw += weight[static_cast<std::size_t>(k)];
+      windowSpread += weight[static_cast<std::size_t>(k)] * dk * dk;
+    }
+    windowSpread /= sw;
+  }
 
   // Elevation antenna correction, one gain per range column of the block.
   std::vector<float> rangeGain(static_cast<std::size_t>(M), 1.0f);
@@ -148,7 +163,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   std::vector<fcomplex> image(static_cast<std::size_t>(Lpb) * W);
   std::vector<unsigned char> line(17 + 8 * static_cast<std::size_t>(W));
   dsp::cvector z;
-  std::vector<float> scaleTable;
+  std::vector<float> scaleTable, warpTable;
   par.firstLine[i] = 1000000;
   par.lastLine[i] = -1000000;
   par.earliestTime[i] = 1e20;
@@ -242,13 +257,25 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     const int32_t nodes = (W + kScaleNode - 1) / kScaleNode;
     const auto lines = static_cast<int32_t>(L1 - L0 + 1);
     scaleTable.assign(static_cast<std::size_t>(nodes) * lines, 1.0f);
+    warpTable.assign(static_cast<std::size_t>(nodes) * lines, 0.0f);
     if (par.compensateAntenna) {
+      // A gain that changes across a response moves its peak: by kappa sigma^2, kappa the
+      // gain's logarithmic slope and sigma^2 = (PRF / (2 pi Ka))^2 / windowSpread the peak's
+      // curvature. Each line is therefore read delta = kappa sigma^2 later, so that the peak
+      // of every target stays at its time; the gain is taken at the time read.
 #pragma omp parallel for schedule(static)
       for (int32_t n = 0; n < nodes; ++n) {
         const auto c = static_cast<std::size_t>(std::min(W - 1, n * kScaleNode + kScaleNode / 2));
+        const double k = ka[c];
+        const double sigma2 = p * p / (4.0 * kPi * kPi * k * k * windowSpread);
+        constexpr double kStep = 1e-3;  // s
         for (int32_t l = 0; l < lines; ++l) {
           const double d = (L0 + l) * a - tc;
-          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(scallop.scale(-d * ka[c], fdc[c], p));
+          const double kappa = (std::log(scallop.scale(-(d + kStep) * k, fdc[c], p)) -
+                                std::log(scallop.scale(-(d - kStep) * k, fdc[c], p))) / (2.0 * kStep);
+          const double delta = kappa * sigma2;
+          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(scallop.scale(-(d + delta) * k, fdc[c], p));
+          warpTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(delta);
         }
       }
     }
@@ -259,15 +286,17 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
       const double centre = tc - fdc[static_cast<std::size_t>(c)] / k;
       const fcomplex* row = z.data() + static_cast<std::ptrdiff_t>(c) * len;
       const float* scale = scaleTable.data() + static_cast<std::size_t>(c / kScaleNode) * lines;
+      const float* warp = warpTable.data() + static_cast<std::size_t>(c / kScaleNode) * lines;
       for (int32_t l = 0; l < lines; ++l) {
         const double T = (L0 + l) * a;
         if (std::abs(T - centre) > h) continue;
-        const double u = (T - tb) * p - static_cast<double>(m0);
+        const double Tr = T + warp[l];  // the time read
+        const double u = (Tr - tb) * p - static_cast<double>(m0);
         const auto qi = static_cast<int64_t>(std::floor(u));
         if (qi < 0 || qi + 1 >= span) continue;
         const double frac = u - static_cast<double>(qi);
         const std::complex<double> v = (1.0 - frac) * std::complex<double>(row[qi]) + frac * std::complex<double>(row[qi + 1]);
-        const double d = T - tc;
+        const double d = Tr - tc;
         const std::complex<double> o = v * std::polar(static_cast<double>(scale[l]), -kPi * k * d * d);
         image[static_cast<std::size_t>(l) * W + c] = fcomplex(static_cast<float>(o.real()), static_cast<float>(o.imag()));
       }
