@@ -132,6 +132,10 @@ int WSreadpars(const std::string& file, scansar::wsparm& par) {
   int32_t compensate = 0;
   if (optional_ints(s, "CompensateAzimuthAntenna", std::span<int32_t>(&compensate, 1), file) == base::kProfileOk)
     par.compensateAntenna = compensate;
+  // A Doppler granule holds half the bursts DC_Granule_Length gives.
+  int32_t granule = 0;
+  if (optional_ints(s, "DC_Granule_Length", std::span<int32_t>(&granule, 1), file) == base::kProfileOk && granule > 1)
+    par.granuleLength = granule / 2;
   std::array<int32_t, 5> swaths{};
   if (optional_ints(s, "SwathsToProcess", swaths, file) == base::kProfileOk &&
       (swaths[0] | swaths[1] | swaths[2] | swaths[3] | swaths[4]) != 0)

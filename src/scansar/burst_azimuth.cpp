@@ -71,25 +71,44 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   const int32_t Nf = dsp::genpow(std::max(par.burstPadding, 2) * N, 1);
   const double h = half_window(scan, par);
 
-  // Column geometry and the spread of the window centres across range.
+  // Column geometry of a Doppler granule, and the spread of the window centres across range
+  // over every granule, which sets the lines a burst gives.
+  const std::size_t granules = std::max<std::size_t>(1, std::min(est.granuleCentroid.size(), est.granuleRate.size()));
+  auto centroidOf = [&](std::size_t g) { return est.granuleCentroid.size() > g ? est.granuleCentroid[g][i] : est.centroid[i]; };
+  auto rateOf = [&](std::size_t g) { return est.granuleRate.size() > g ? est.granuleRate[g][i] : est.rate[i]; };
   std::vector<double> fdc(static_cast<std::size_t>(W)), ka(static_cast<std::size_t>(W));
-  for (int32_t c = 0; c < W; ++c) {
-    const double x = outNear + c / fs - est.refTime;
-    fdc[static_cast<std::size_t>(c)] = poly(est.centroid[i], x);
-    ka[static_cast<std::size_t>(c)] = poly(est.rate[i], x);
-    if (!(ka[static_cast<std::size_t>(c)] < 0.0)) {
+  const auto mid = static_cast<std::size_t>(W / 2);
+  double xMid = 0.0;
+  auto columns = [&](std::size_t g) {
+    const auto dc = centroidOf(g), rate = rateOf(g);
+    for (int32_t c = 0; c < W; ++c) {
+      const double x = outNear + c / fs - est.refTime;
+      fdc[static_cast<std::size_t>(c)] = poly(dc, x);
+      ka[static_cast<std::size_t>(c)] = poly(rate, x);
+      if (!(ka[static_cast<std::size_t>(c)] < 0.0)) return false;
+    }
+    xMid = fdc[mid] / ka[mid];
+    return true;
+  };
+  double lower = 0.0, upper = 0.0;
+  for (std::size_t g = 0; g < granules; ++g) {
+    if (!columns(g)) {
       base::report(base::kReportError, "Azimuth focusing SS" + std::to_string(s + 1) + ": Doppler rate not negative");
       return frame.check(kRejected);
     }
+    for (std::size_t c = 0; c < fdc.size(); ++c) {
+      const double d = -fdc[c] / ka[c] + xMid;
+      lower = std::min(lower, d);
+      upper = std::max(upper, d);
+    }
   }
-  const auto mid = static_cast<std::size_t>(W / 2);
-  const double xMid = fdc[mid] / ka[mid];
-  double lower = 0.0, upper = 0.0;
-  for (std::size_t c = 0; c < fdc.size(); ++c) {
-    const double d = -fdc[c] / ka[c] + xMid;
-    lower = std::min(lower, d);
-    upper = std::max(upper, d);
-  }
+  GranuleLayout layout;
+  layout.count = static_cast<int32_t>(granules);
+  layout.referenceTime = est.granuleReference;
+  layout.step = est.granuleStep;
+  layout.length = std::max(1, par.granuleLength);
+  std::size_t granule = 0;
+  columns(granule);
   par.linesPerBurst[i] = static_cast<int32_t>(std::ceil((2.0 * h - lower + upper) / a)) + 1;
   const int32_t Lpb = par.linesPerBurst[i];
 
@@ -150,12 +169,11 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   wk.fs = fs;
   wk.prf = p;
   wk.rangePadding = 1.0;
-  wk.rate = {est.rate[i][0], est.rate[i][1], est.rate[i][2]};
+  wk.rate = {rateOf(granule)[0], rateOf(granule)[1], rateOf(granule)[2]};
   wk.rateReference = est.refTime;
   wk.AntennaLength = par.antennaLength;
   wk.chirpBandwidth = scan.chirpBandwidth[i];
-  const double dcPoly[5] = {est.centroid[i][0], est.centroid[i][1], est.centroid[i][2], est.centroid[i][3],
-                            est.centroid[i][4]};
+  std::array<double, 5> dcPoly = centroidOf(granule);
   const int32_t Sb = std::max(dsp::genpow(std::min(M, par.samplesInBlock), 1), ov + 2);
 
   dsp::cvector block(static_cast<std::size_t>(Nf) * M);
@@ -166,6 +184,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   std::vector<float> scaleTable, warpTable;
   par.firstLine[i] = 1000000;
   par.lastLine[i] = -1000000;
+  par.statistics[i] = ImageStatistics{};
   par.earliestTime[i] = 1e20;
   par.latestTime[i] = 0.0;
   for (int32_t b = 0; b < scan.bursts; ++b) {
@@ -178,6 +197,13 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     in.read(&near, 8);
     in.read(rows.data(), 8 * static_cast<int64_t>(rows.size()));
     base::LogPrintf("Azimuth focusing burst %d in sub-swath %d.\n", b + 1, s + 1);
+    // The Doppler granule of the burst: its centroid and rate across range, the kernel's plane.
+    if (const auto g = static_cast<std::size_t>(granule_of_burst(layout, scan, s, b)); g != granule) {
+      granule = g;
+      columns(granule);
+      dcPoly = centroidOf(granule);
+      wk.rate = {rateOf(granule)[0], rateOf(granule)[1], rateOf(granule)[2]};
+    }
     std::fill(block.begin(), block.end(), fcomplex{});
     for (int32_t k = 0; k < N; ++k)
       for (int32_t j = 0; j < M; ++j)
@@ -191,7 +217,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     wk.rangeShift = 0.0;
     wk.spectrumCentreFd = 0.0;
     stripmap::focazwk_result result;
-    if (const int st = stripmap::multirg(wk, result, Sb, ov, dcPoly, est.refTime); st != 0) return frame.check(st);
+    if (const int st = stripmap::multirg(wk, result, Sb, ov, dcPoly.data(), est.refTime); st != 0) return frame.check(st);
 
     // Burst timing relative to the scene's first line.
     const double tb = b * scan.cycleTime + scan.burstOffset[i];
@@ -305,6 +331,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
       const double t = line_time(scan, par, l);
       encode_line_prefix(t, static_cast<int32_t>(l), line.data());
       std::memcpy(line.data() + 17, image.data() + static_cast<std::size_t>(l - L0) * W, 8 * static_cast<std::size_t>(W));
+      par.statistics[i].add(std::span<const fcomplex>(image.data() + static_cast<std::size_t>(l - L0) * W, static_cast<std::size_t>(W)));
       out.write(line.data(), static_cast<int64_t>(line.size()));
       par.earliestTime[i] = std::min(par.earliestTime[i], t);
       par.latestTime[i] = std::max(par.latestTime[i], t);
