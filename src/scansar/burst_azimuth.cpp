@@ -294,13 +294,18 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
         const auto c = static_cast<std::size_t>(std::min(W - 1, n * kScaleNode + kScaleNode / 2));
         const double k = ka[c];
         const double sigma2 = p * p / (4.0 * kPi * kPi * k * k * windowSpread);
-        constexpr double kStep = 1e-3;  // s
-        for (int32_t l = 0; l < lines; ++l) {
+        // The log gain on the line grid and one line beyond each end; its slope by central
+        // differences, its value at the time read by the slope.
+        std::vector<double> lg(static_cast<std::size_t>(lines) + 2);
+        for (int32_t l = -1; l <= lines; ++l) {
           const double d = (L0 + l) * a - tc;
-          const double kappa = (std::log(scallop.scale(-(d + kStep) * k, fdc[c], p)) -
-                                std::log(scallop.scale(-(d - kStep) * k, fdc[c], p))) / (2.0 * kStep);
+          lg[static_cast<std::size_t>(l + 1)] = std::log(scallop.scale(-d * k, fdc[c], p));
+        }
+        for (int32_t l = 0; l < lines; ++l) {
+          const auto q = static_cast<std::size_t>(l + 1);
+          const double kappa = (lg[q + 1] - lg[q - 1]) / (2.0 * a);
           const double delta = kappa * sigma2;
-          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(scallop.scale(-(d + delta) * k, fdc[c], p));
+          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(std::exp(lg[q] + kappa * delta));
           warpTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(delta);
         }
       }
