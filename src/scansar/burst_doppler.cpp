@@ -227,7 +227,9 @@ int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneR
   est.granuleRate.assign(static_cast<std::size_t>(layout.count), est.rate);
   for (int32_t k = 1; k + 1 < layout.count; ++k) {
     const auto g = static_cast<std::size_t>(k);
-    const double tk = scan.firstLineTime + layout.referenceTime + k * layout.step;
+    // An odd granule length lays the last granules past the scene's end; their rate is the
+    // orbit's at the end.
+    const double tk = scan.firstLineTime + std::clamp(layout.referenceTime + k * layout.step, 0.0, scan.bursts * scan.cycleTime);
     for (int s = 0; s < kSwaths; ++s) {
       const auto i = static_cast<std::size_t>(s);
       if (!par.swathsToProcess[i] || i >= focused.size()) continue;

@@ -396,6 +396,56 @@ TEST_F(WsStagesRun, RangeAndDopplerThenAzimuthInASecondRunGiveTheSameImages) {
   }
 }
 
+// Each burst is focused with its own granule's centroid: a granule moved by 100 Hz moves the
+// output window of the bursts that use it, by the time that Doppler takes at the rate, and no
+// other burst's.
+TEST_F(WsStagesRun, EachBurstIsFocusedWithItsGranule) {
+  ASSERT_NE(x_, nullptr);
+  scansar scan;
+  ASSERT_EQ(derive_geometry(x_->channels, scan), 0);
+  wsparm par;
+  par.granuleLength = 2;
+  ASSERT_EQ(check_bursts(scan, par), 0);
+  const int s = 2;
+  const auto i = static_cast<std::size_t>(s);
+  std::array<RangeFocused, kSwaths> focused{};
+  std::array<CorrelationSums, kSwaths> sums{};
+  par.swathsToProcess = {0, 0, 1, 0, 0};
+  ASSERT_EQ(burst_range_focus(x_->dir, s, x_->channels[i], scan, par, x_->refs.replica, focused[i], sums[i]), 0);
+  DopplerEstimate est;
+  ASSERT_EQ(burst_doppler(scan, par, x_->refs, focused, sums, est), 0);
+  const GranuleLayout layout = granule_layout(scan.bursts, 2, scan.cycleTime);
+  ASSERT_EQ(layout.count, 5);
+  auto first_lines = [&](const DopplerEstimate& e) {
+    EXPECT_EQ(burst_azimuth_focus(x_->dir, s, scan, par, e, focused[i]), 0);
+    const int width = focused[i].validColumns - par.rangeOverlap;
+    const std::vector<char> bytes = slurp(x_->dir + "/SS3.out");
+    const std::size_t rec = 17 + 8 * static_cast<std::size_t>(width), lines = static_cast<std::size_t>(par.linesPerBurst[i]);
+    std::vector<int32_t> first;
+    for (std::size_t b = 0; b < static_cast<std::size_t>(scan.bursts); ++b) {
+      int32_t n = 0;
+      decode_line_prefix(reinterpret_cast<const unsigned char*>(bytes.data()) + b * lines * rec, n);
+      first.push_back(n);
+    }
+    return first;
+  };
+  const std::vector<int32_t> before = first_lines(est);
+  const int32_t moved = granule_of_burst(layout, scan, s, 1);
+  DopplerEstimate shifted = est;
+  shifted.granuleCentroid[static_cast<std::size_t>(moved)][i][0] += 100.0;
+  const std::vector<int32_t> after = first_lines(shifted);
+  const double x = focused[i].nearTime + (focused[i].firstValid + par.rangeOverlap / 2 + (focused[i].validColumns - par.rangeOverlap) / 2) /
+                                             scan.samplingRate - est.refTime;
+  const auto& r = est.granuleRate[static_cast<std::size_t>(moved)][i];
+  const double lines = -100.0 / (r[0] + x * (r[1] + x * r[2])) / par.azimuthStep;
+  for (int32_t b = 0; b < scan.bursts; ++b) {
+    if (granule_of_burst(layout, scan, s, b) == moved)
+      EXPECT_NEAR(after[static_cast<std::size_t>(b)] - before[static_cast<std::size_t>(b)], lines, 1.0) << "burst " << b;
+    else
+      EXPECT_EQ(after[static_cast<std::size_t>(b)], before[static_cast<std::size_t>(b)]) << "burst " << b;
+  }
+}
+
 TEST_F(WsStagesRun, BadInputGivesItsStatusAndLeavesNoProduct) {
   ASSERT_NE(x_, nullptr);
   struct Row {
