@@ -231,7 +231,7 @@ std::array<float, xca::kPatternLength> XcaRecord::elevation_gains(int beam, int 
   if (pol < 0 || pol > 3) throw std::out_of_range(fmt("polarisation %lld outside 0-3", pol));
   const std::int64_t first = 4 * (std::int64_t{xca::kPatternLength} * (4 * std::int64_t{beam} + pol)) - xca::kPatternBias;
   const std::int64_t end = first + 4 * xca::kPatternLength;
-  if (beam < 1 || beam > 7 || first < 0 || end > static_cast<std::int64_t>(kXcaRecordSize))
+  if (beam < 1 || beam > 8 || first < 0 || end > static_cast<std::int64_t>(kXcaRecordSize))
     throw std::out_of_range(fmt("beam %lld, polarisation %lld: no elevation pattern", beam, pol));
   std::array<float, xca::kPatternLength> gains{};
   for (std::size_t k = 0; k < gains.size(); ++k)

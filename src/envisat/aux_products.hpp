@@ -159,7 +159,8 @@ class InsRecord : public AuxProduct {
 class XcaRecord : public AuxProduct {
  public:
   static XcaRecord read(const std::string& path);
-  /// Elevation gains (dB) of a beam 1-7 (the swath number) and polarisation 0-3, 201 values.
+  /// Elevation gains (dB) of a beam slot 1-8 (IM and AP: the swath number; WS: see the wide swath
+  /// slots) and polarisation 0-3, 201 values.
   std::array<float, xca::kPatternLength> elevation_gains(int beam, int pol) const;
 };
 

@@ -44,6 +44,19 @@ int envi_rgpattern(const std::string& xcaPath, const std::string& insPath, sarpa
   return 0;
 }
 
+int envi_slot_pattern(const std::string& xcaPath, const std::string& insPath, int slot, int pol,
+                      std::vector<float>& amplitude, double& referenceDeg) {
+  base::Frame frame("envi_slot_pattern");
+  const XcaRecord xca = XcaRecord::read(xcaPath);
+  const InsRecord ins = InsRecord::read(insPath);
+  const auto gains = xca.elevation_gains(slot, pol);
+  amplitude.resize(kPatternLength);
+  for (int k = 0; k < kPatternLength; ++k)
+    amplitude[static_cast<std::size_t>(k)] = static_cast<float>(std::pow(10.0, 0.05 * gains[static_cast<std::size_t>(k)]));
+  referenceDeg = ins.pattern_reference_angle(slot);
+  return 0;
+}
+
 int envi_syntchirp(sarpar& par, metadata::SceneReferences& proc) {
   base::Frame frame("envi_syntchirp");
   return metadata::synthetic_chirp(par, proc);

@@ -9,6 +9,7 @@
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
+#include <numbers>
 #include <span>
 #include <string>
 #include <vector>
@@ -27,6 +28,7 @@
 #include "jobs/drivers.hpp"
 #include "jobs/im_job.hpp"
 #include "jobs/job_common.hpp"
+#include "jobs/stage_chain.hpp"
 #include "jobs/stages.hpp"
 #include "jobs/ws_product.hpp"
 #include "multilook/ws_multilook.hpp"
@@ -131,6 +133,10 @@ int WSreadpars(const std::string& file, scansar::wsparm& par) {
   int32_t compensate = 0;
   if (optional_ints(s, "CompensateAzimuthAntenna", std::span<int32_t>(&compensate, 1), file) == base::kProfileOk)
     par.compensateAntenna = compensate;
+  // A Doppler granule holds half the bursts DC_Granule_Length gives.
+  int32_t granule = 0;
+  if (optional_ints(s, "DC_Granule_Length", std::span<int32_t>(&granule, 1), file) == base::kProfileOk && granule > 1)
+    par.granuleLength = granule / 2;
   std::array<int32_t, 5> swaths{};
   if (optional_ints(s, "SwathsToProcess", swaths, file) == base::kProfileOk &&
       (swaths[0] | swaths[1] | swaths[2] | swaths[3] | swaths[4]) != 0)
@@ -142,6 +148,101 @@ int WSreadpars(const std::string& file, scansar::wsparm& par) {
   }
   return 0;
 }
+
+namespace {
+
+// The whole product runs through one chain: the Doppler estimate is joint over the sub-swaths,
+// so the five are one channel here.
+struct WsScene {
+  std::string dir, level0, orbit, ins, xca, xch;
+  std::vector<envisat::sarpar> channels;
+  envisat::sarpar whole;  // the scene as one channel: the orbit and replica are sampled on it
+  metadata::SceneReferences refs;
+  scansar::scansar scan;
+  scansar::wsparm par;
+  bool ascending = false;
+  bool extracted = false;
+};
+
+// Extraction: one line file a sub-swath, D/SS1 .. D/SS5, each holding its own bursts' echoes.
+int extract_sub_swaths(WsScene& c) {
+  c.channels.assign(scansar::kSwaths, envisat::sarpar{});
+  for (int s = 0; s < scansar::kSwaths; ++s) {
+    c.channels[static_cast<std::size_t>(s)].outputDir = c.dir;
+    c.channels[static_cast<std::size_t>(s)].raw_file = c.dir + "/SS" + std::to_string(s + 1);
+  }
+  envisat::extconf extra;
+  extra.skip_percent = 0;
+  extra.extract_percent = 100;
+  extra.extract_kind = envisat::kExtractEchoes;
+  // The shared extraction stage: it also refuses a product shorter than its header says.
+  envisat::enviauxfiles files;
+  files.level0 = c.level0;
+  files.ins = c.ins;
+  files.extracted = c.xch;
+  if (const int st = envi_extract(files, c.channels, extra); st != 0) return st;
+  for (envisat::sarpar& ch : c.channels) ch.lines = ch.burst_count * ch.burst_echoes;
+  c.extracted = true;
+  return 0;
+}
+
+// The orbit over the whole scene; the pass direction from the Earth-fixed z velocity at the
+// scene's middle state vector.
+int scene_orbit(WsScene& c) {
+  c.whole = c.channels[0];
+  c.whole.lines = std::max(1, static_cast<int>(std::lround(c.scan.bursts * c.scan.cycleTime * c.whole.prf)));
+  if (const int st = envisat::envi_orbit(c.orbit, c.whole, c.refs); st != 0) return st;
+  c.ascending = c.refs.orbitVelocities[3 * 2 + 2] > 0.0;
+  return 0;
+}
+
+// The two-way elevation pattern of each sub-swath, from its beam slot.
+int elevation_patterns(WsScene& c) {
+  for (int s = 0; s < scansar::kSwaths; ++s) {
+    scansar::ElevationPattern& e = c.par.elevation[static_cast<std::size_t>(s)];
+    double reference = 0.0;
+    if (const int st = envisat::envi_slot_pattern(c.xca, c.ins, scansar::kBeamSlot[static_cast<std::size_t>(s)],
+                                                  c.channels[0].polarization_type, e.amplitude, reference);
+        st != 0)
+      return st;
+    e.reference = reference * std::numbers::pi / 180.0;
+  }
+  return 0;
+}
+
+// The burst chain in two stages: range focusing with the Doppler estimate, whose results
+// D/doppler.par keeps, then azimuth focusing from them. The burst chain times its own phases.
+int burst_chain(WsScene& c, bool rangeDoppler) {
+  const std::string orbitPath = c.orbit;
+  const scansar::GeometricCentroid geometric = [orbitPath](const metadata::SceneReferences&, double t, double tau,
+                                                           double wavelength) {
+    double fdc = 0.0;
+    const geometry::PointingLaw law;
+    if (geometry::EstDopplerENVI(orbitPath, t, tau, 1.0, 10.0, wavelength, law.p_deg, law.q_deg, law.r_deg, law.s_deg,
+                                 law.a_rad, fdc) != 0)
+      return 0.0;
+    return fdc;
+  };
+  scansar::WsStages stages;
+  stages.rangeDoppler = rangeDoppler;
+  stages.azimuth = !rangeDoppler;
+  return scansar::WSprocessor(c.dir, c.channels, c.refs, c.par, stages, c.ascending, geometric);
+}
+
+StageChain<WsScene> ws_chain() {
+  using C = WsScene;
+  StageChain<C> chain;
+  chain.then("envi_extract", "extraction", extract_sub_swaths)
+      .then("geometry", "", [](C& c) { return scansar::derive_geometry(c.channels, c.scan); })
+      .then("envi_orbit", "references", scene_orbit)
+      .then("envi_syntchirp", "references", [](C& c) { return envisat::envi_syntchirp(c.whole, c.refs); })
+      .then("envi_beam_corr", "references", elevation_patterns)
+      .then("WSrangeFOC", "", [](C& c) { return burst_chain(c, true); })
+      .then("WSazFOC", "", [](C& c) { return burst_chain(c, false); });
+  return chain;
+}
+
+}  // namespace
 
 int main_focussing_asar_ws_v2(const std::string& listPath) {
   const std::vector<std::string> args = start_job(listPath, kWsTitle, kWsBanner, {0, 1, 2, 3, 7, 4});
@@ -178,60 +279,25 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   }
   connect_stage_progress();
 
-  // Extraction: one line file a sub-swath, D/SS1 .. D/SS5.
-  std::vector<envisat::sarpar> channels(scansar::kSwaths);
-  for (int s = 0; s < scansar::kSwaths; ++s) {
-    channels[static_cast<std::size_t>(s)].outputDir = dir;
-    channels[static_cast<std::size_t>(s)].raw_file = dir + "/SS" + std::to_string(s + 1);
-  }
-  envisat::extconf extra;
-  extra.skip_percent = 0;
-  extra.extract_percent = 100;
-  extra.extract_kind = envisat::kExtractEchoes;
-  {
-    const StageClock clock("extraction");
-    // The shared extraction stage: it also refuses a product shorter than its header says.
-    envisat::enviauxfiles files;
-    files.level0 = args[0];
-    files.ins = ins;
-    files.extracted = xch;
-    if (envi_extract(files, channels, extra) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_extract"});
-  }
-  // Each sub-swath file holds its own bursts' echoes.
-  for (envisat::sarpar& c : channels) c.lines = c.burst_count * c.burst_echoes;
-
-  // The orbit over the whole scene and the nominal replica (the five sub-swaths share the pulse).
-  metadata::SceneReferences refs;
-  envisat::sarpar whole = channels[0];
-  scansar::scansar scan;
-  if (scansar::derive_geometry(channels, scan) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "geometry"});
-  whole.lines = std::max(1, static_cast<int>(std::lround(scan.bursts * scan.cycleTime * whole.prf)));
+  WsScene scene;
+  scene.dir = dir;
+  scene.level0 = args[0];
+  scene.orbit = args[1];
+  scene.ins = ins;
+  scene.xca = xca;
+  scene.xch = xch;
+  scene.par = par;
+  const StageChain<WsScene> chain = ws_chain();
   try {
-    if (envisat::envi_orbit(args[1], whole, refs) != 0)
-      base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_orbit"});
+    if (chain.run(scene) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", failed_stage()});
   } catch (const base::InputError& e) {
-    note_failed_stage("envi_orbit");
-    fail_on_input(e, "WSprocessor()", whole);
+    // The extraction's own refusals go up as they are, as in every job.
+    if (!scene.extracted) throw;
+    fail_on_input(e, "WSprocessor()", scene.whole);
   }
-  if (envisat::envi_syntchirp(whole, refs) != 0) base::fatal(base::ec::kStageFailed, {"WSprocessor()", "envi_syntchirp"});
-  // The pass direction from the Earth-fixed z velocity at the scene's middle state vector.
-  const bool ascending = refs.orbitVelocities[3 * 2 + 2] > 0.0;
-
-  const std::string orbitPath = args[1];
-  const scansar::GeometricCentroid geometric = [orbitPath](const metadata::SceneReferences&, double t, double tau,
-                                                           double wavelength) {
-    double fdc = 0.0;
-    const geometry::PointingLaw law;
-    if (geometry::EstDopplerENVI(orbitPath, t, tau, 1.0, 10.0, wavelength, law.p_deg, law.q_deg, law.r_deg, law.s_deg,
-                                 law.a_rad, fdc) != 0)
-      return 0.0;
-    return fdc;
-  };
-  scansar::WsStages stages;
-  if (scansar::WSprocessor(dir, channels, refs, par, stages, ascending, geometric) != 0) {
-    if (failed_stage().empty()) note_failed_stage("WSprocessor");
-    base::fatal(base::ec::kStageFailed, {"WSprocessor()", failed_stage()});
-  }
+  par = scene.par;
+  const std::vector<envisat::sarpar>& channels = scene.channels;
+  const scansar::scansar& scan = scene.scan;
   for (int s = 0; s < scansar::kSwaths; ++s)
     if (par.swathsToProcess[static_cast<std::size_t>(s)])
       base::LogPrintf("SS%d: %s/SS%d.out, lines %d to %d\n", s + 1, dir.c_str(), s + 1, par.firstLine[static_cast<std::size_t>(s)],

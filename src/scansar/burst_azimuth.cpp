@@ -16,7 +16,10 @@
 //
 // De-scalloping: a target's level in a burst is the two-way antenna pattern at the Doppler it
 // had there; each output line is divided by the pattern's amplitude at its Doppler (with the
-// two PRF-aliased lobes, which also add power in a distributed scene).
+// two PRF-aliased lobes, which also add power in a distributed scene). The gain's slope across
+// a response would move its peak; the line is read where that move is undone. (A burst's
+// time-bandwidth product is about 2, so its azimuth spectrum does not map the echo times to
+// Doppler one to one, and the same gain applied bin by bin to the spectrum moves peaks alike.)
 #include <algorithm>
 #include <cmath>
 #include <cstring>
@@ -68,25 +71,44 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   const int32_t Nf = dsp::genpow(std::max(par.burstPadding, 2) * N, 1);
   const double h = half_window(scan, par);
 
-  // Column geometry and the spread of the window centres across range.
+  // Column geometry of a Doppler granule, and the spread of the window centres across range
+  // over every granule, which sets the lines a burst gives.
+  const std::size_t granules = std::max<std::size_t>(1, std::min(est.granuleCentroid.size(), est.granuleRate.size()));
+  auto centroidOf = [&](std::size_t g) { return est.granuleCentroid.size() > g ? est.granuleCentroid[g][i] : est.centroid[i]; };
+  auto rateOf = [&](std::size_t g) { return est.granuleRate.size() > g ? est.granuleRate[g][i] : est.rate[i]; };
   std::vector<double> fdc(static_cast<std::size_t>(W)), ka(static_cast<std::size_t>(W));
-  for (int32_t c = 0; c < W; ++c) {
-    const double x = outNear + c / fs - est.refTime;
-    fdc[static_cast<std::size_t>(c)] = poly(est.centroid[i], x);
-    ka[static_cast<std::size_t>(c)] = poly(est.rate[i], x);
-    if (!(ka[static_cast<std::size_t>(c)] < 0.0)) {
+  const auto mid = static_cast<std::size_t>(W / 2);
+  double xMid = 0.0;
+  auto columns = [&](std::size_t g) {
+    const auto dc = centroidOf(g), rate = rateOf(g);
+    for (int32_t c = 0; c < W; ++c) {
+      const double x = outNear + c / fs - est.refTime;
+      fdc[static_cast<std::size_t>(c)] = poly(dc, x);
+      ka[static_cast<std::size_t>(c)] = poly(rate, x);
+      if (!(ka[static_cast<std::size_t>(c)] < 0.0)) return false;
+    }
+    xMid = fdc[mid] / ka[mid];
+    return true;
+  };
+  double lower = 0.0, upper = 0.0;
+  for (std::size_t g = 0; g < granules; ++g) {
+    if (!columns(g)) {
       base::report(base::kReportError, "Azimuth focusing SS" + std::to_string(s + 1) + ": Doppler rate not negative");
       return frame.check(kRejected);
     }
+    for (std::size_t c = 0; c < fdc.size(); ++c) {
+      const double d = -fdc[c] / ka[c] + xMid;
+      lower = std::min(lower, d);
+      upper = std::max(upper, d);
+    }
   }
-  const auto mid = static_cast<std::size_t>(W / 2);
-  const double xMid = fdc[mid] / ka[mid];
-  double lower = 0.0, upper = 0.0;
-  for (std::size_t c = 0; c < fdc.size(); ++c) {
-    const double d = -fdc[c] / ka[c] + xMid;
-    lower = std::min(lower, d);
-    upper = std::max(upper, d);
-  }
+  GranuleLayout layout;
+  layout.count = static_cast<int32_t>(granules);
+  layout.referenceTime = est.granuleReference;
+  layout.step = est.granuleStep;
+  layout.length = std::max(1, par.granuleLength);
+  std::size_t granule = 0;
+  columns(granule);
   par.linesPerBurst[i] = static_cast<int32_t>(std::ceil((2.0 * h - lower + upper) / a)) + 1;
   const int32_t Lpb = par.linesPerBurst[i];
 
@@ -102,6 +124,31 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     }
     const double norm = std::sqrt(sum / N);
     for (int32_t k = 0; k < N; ++k) weight[static_cast<std::size_t>(k)] = static_cast<float>(w[static_cast<std::size_t>(k)] / norm);
+  }
+  // Spread of the weight over the burst, echoes^2: the curvature of a response's peak,
+  // |h(tau)|^2 ~ 1 - (2 pi Ka tau / PRF)^2 windowSpread, follows from it.
+  double windowSpread = 0.0;
+  {
+    double sw = 0.0;
+    for (int32_t k = 0; k < N; ++k) {
+      const double dk = k - (N - 1) / 2.0;
+      sw += weight[static_cast<std::size_t>(k)];
+      windowSpread += weight[static_cast<std::size_t>(k)] * dk * dk;
+    }
+    windowSpread /= sw;
+  }
+
+  // Elevation antenna correction, one gain per range column of the block.
+  std::vector<float> rangeGain(static_cast<std::size_t>(M), 1.0f);
+  if (!par.elevation[i].amplitude.empty()) {
+    envi_beam_corr(par.elevation[i], est.slantToElevation[i], 0.0, fs, rangeGain);
+    float lo = rangeGain[static_cast<std::size_t>(c0)], hi = lo;
+    for (int32_t j = c0; j < c0 + focused.validColumns && j < M; ++j) {
+      lo = std::min(lo, rangeGain[static_cast<std::size_t>(j)]);
+      hi = std::max(hi, rangeGain[static_cast<std::size_t>(j)]);
+    }
+    base::LogPrintf("SS%d: elevation correction %.2f to %.2f dB across the valid columns\n", s + 1,
+                    20.0 * std::log10(lo), 20.0 * std::log10(hi));
   }
 
   ScallopModel scallop;
@@ -122,12 +169,11 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   wk.fs = fs;
   wk.prf = p;
   wk.rangePadding = 1.0;
-  wk.rate = {est.rate[i][0], est.rate[i][1], est.rate[i][2]};
+  wk.rate = {rateOf(granule)[0], rateOf(granule)[1], rateOf(granule)[2]};
   wk.rateReference = est.refTime;
   wk.AntennaLength = par.antennaLength;
   wk.chirpBandwidth = scan.chirpBandwidth[i];
-  const double dcPoly[5] = {est.centroid[i][0], est.centroid[i][1], est.centroid[i][2], est.centroid[i][3],
-                            est.centroid[i][4]};
+  std::array<double, 5> dcPoly = centroidOf(granule);
   const int32_t Sb = std::max(dsp::genpow(std::min(M, par.samplesInBlock), 1), ov + 2);
 
   dsp::cvector block(static_cast<std::size_t>(Nf) * M);
@@ -135,9 +181,10 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   std::vector<fcomplex> image(static_cast<std::size_t>(Lpb) * W);
   std::vector<unsigned char> line(17 + 8 * static_cast<std::size_t>(W));
   dsp::cvector z;
-  std::vector<float> scaleTable;
+  std::vector<float> scaleTable, warpTable;
   par.firstLine[i] = 1000000;
   par.lastLine[i] = -1000000;
+  par.statistics[i] = ImageStatistics{};
   par.earliestTime[i] = 1e20;
   par.latestTime[i] = 0.0;
   for (int32_t b = 0; b < scan.bursts; ++b) {
@@ -150,10 +197,18 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     in.read(&near, 8);
     in.read(rows.data(), 8 * static_cast<int64_t>(rows.size()));
     base::LogPrintf("Azimuth focusing burst %d in sub-swath %d.\n", b + 1, s + 1);
+    // The Doppler granule of the burst: its centroid and rate across range, the kernel's plane.
+    if (const auto g = static_cast<std::size_t>(granule_of_burst(layout, scan, s, b)); g != granule) {
+      granule = g;
+      columns(granule);
+      dcPoly = centroidOf(granule);
+      wk.rate = {rateOf(granule)[0], rateOf(granule)[1], rateOf(granule)[2]};
+    }
     std::fill(block.begin(), block.end(), fcomplex{});
     for (int32_t k = 0; k < N; ++k)
       for (int32_t j = 0; j < M; ++j)
-        block[static_cast<std::size_t>(k) * M + j] = rows[static_cast<std::size_t>(k) * M + j] * weight[static_cast<std::size_t>(k)];
+        block[static_cast<std::size_t>(k) * M + j] =
+            rows[static_cast<std::size_t>(k) * M + j] * (weight[static_cast<std::size_t>(k)] * rangeGain[static_cast<std::size_t>(j)]);
     wk.lines = Nf;
     wk.samples = M;
     wk.nearTime = focused.nearTime;
@@ -162,7 +217,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     wk.rangeShift = 0.0;
     wk.spectrumCentreFd = 0.0;
     stripmap::focazwk_result result;
-    if (const int st = stripmap::multirg(wk, result, Sb, ov, dcPoly, est.refTime); st != 0) return frame.check(st);
+    if (const int st = stripmap::multirg(wk, result, Sb, ov, dcPoly.data(), est.refTime); st != 0) return frame.check(st);
 
     // Burst timing relative to the scene's first line.
     const double tb = b * scan.cycleTime + scan.burstOffset[i];
@@ -228,13 +283,30 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     const int32_t nodes = (W + kScaleNode - 1) / kScaleNode;
     const auto lines = static_cast<int32_t>(L1 - L0 + 1);
     scaleTable.assign(static_cast<std::size_t>(nodes) * lines, 1.0f);
+    warpTable.assign(static_cast<std::size_t>(nodes) * lines, 0.0f);
     if (par.compensateAntenna) {
+      // A gain that changes across a response moves its peak: by kappa sigma^2, kappa the
+      // gain's logarithmic slope and sigma^2 = (PRF / (2 pi Ka))^2 / windowSpread the peak's
+      // curvature. Each line is therefore read delta = kappa sigma^2 later, so that the peak
+      // of every target stays at its time; the gain is taken at the time read.
 #pragma omp parallel for schedule(static)
       for (int32_t n = 0; n < nodes; ++n) {
         const auto c = static_cast<std::size_t>(std::min(W - 1, n * kScaleNode + kScaleNode / 2));
-        for (int32_t l = 0; l < lines; ++l) {
+        const double k = ka[c];
+        const double sigma2 = p * p / (4.0 * kPi * kPi * k * k * windowSpread);
+        // The log gain on the line grid and one line beyond each end; its slope by central
+        // differences, its value at the time read by the slope.
+        std::vector<double> lg(static_cast<std::size_t>(lines) + 2);
+        for (int32_t l = -1; l <= lines; ++l) {
           const double d = (L0 + l) * a - tc;
-          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(scallop.scale(-d * ka[c], fdc[c], p));
+          lg[static_cast<std::size_t>(l + 1)] = std::log(scallop.scale(-d * k, fdc[c], p));
+        }
+        for (int32_t l = 0; l < lines; ++l) {
+          const auto q = static_cast<std::size_t>(l + 1);
+          const double kappa = (lg[q + 1] - lg[q - 1]) / (2.0 * a);
+          const double delta = kappa * sigma2;
+          scaleTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(std::exp(lg[q] + kappa * delta));
+          warpTable[static_cast<std::size_t>(n) * lines + l] = static_cast<float>(delta);
         }
       }
     }
@@ -245,15 +317,17 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
       const double centre = tc - fdc[static_cast<std::size_t>(c)] / k;
       const fcomplex* row = z.data() + static_cast<std::ptrdiff_t>(c) * len;
       const float* scale = scaleTable.data() + static_cast<std::size_t>(c / kScaleNode) * lines;
+      const float* warp = warpTable.data() + static_cast<std::size_t>(c / kScaleNode) * lines;
       for (int32_t l = 0; l < lines; ++l) {
         const double T = (L0 + l) * a;
         if (std::abs(T - centre) > h) continue;
-        const double u = (T - tb) * p - static_cast<double>(m0);
+        const double Tr = T + warp[l];  // the time read
+        const double u = (Tr - tb) * p - static_cast<double>(m0);
         const auto qi = static_cast<int64_t>(std::floor(u));
         if (qi < 0 || qi + 1 >= span) continue;
         const double frac = u - static_cast<double>(qi);
         const std::complex<double> v = (1.0 - frac) * std::complex<double>(row[qi]) + frac * std::complex<double>(row[qi + 1]);
-        const double d = T - tc;
+        const double d = Tr - tc;
         const std::complex<double> o = v * std::polar(static_cast<double>(scale[l]), -kPi * k * d * d);
         image[static_cast<std::size_t>(l) * W + c] = fcomplex(static_cast<float>(o.real()), static_cast<float>(o.imag()));
       }
@@ -262,6 +336,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
       const double t = line_time(scan, par, l);
       encode_line_prefix(t, static_cast<int32_t>(l), line.data());
       std::memcpy(line.data() + 17, image.data() + static_cast<std::size_t>(l - L0) * W, 8 * static_cast<std::size_t>(W));
+      par.statistics[i].add(std::span<const fcomplex>(image.data() + static_cast<std::size_t>(l - L0) * W, static_cast<std::size_t>(W)));
       out.write(line.data(), static_cast<int64_t>(line.size()));
       par.earliestTime[i] = std::min(par.earliestTime[i], t);
       par.latestTime[i] = std::max(par.latestTime[i], t);

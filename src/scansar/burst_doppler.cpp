@@ -79,7 +79,7 @@ bool fractional_centroid(const CorrelationSums& sums, const RangeFocused& f, dou
 
 // The orbit's Doppler rate and incidence across a sub-swath, fitted about refTime.
 int orbit_geometry(const scansar& scan, int s, const metadata::SceneReferences& refs, const RangeFocused& f,
-                   double centroidMid, double refTime, DopplerEstimate& est) {
+                   double centroidMid, double refTime, double tCentre, DopplerEstimate& est) {
   const auto i = static_cast<std::size_t>(s);
   metadata::sarpar p;
   p.prf = scan.prf[i];
@@ -88,19 +88,20 @@ int orbit_geometry(const scansar& scan, int s, const metadata::SceneReferences& 
   p.nearRangeTime = f.nearTime;
   p.samples = std::max(f.width, 16);
   p.lines = std::max(1, static_cast<int>(std::lround(scan.bursts * scan.cycleTime * scan.prf[i])));
-  p.azimuthStartTime = scan.firstLineTime;
+  p.azimuthStartTime = tCentre - 0.5 * p.lines / p.prf;
   stripmap::procparm proc;
   static_cast<metadata::SceneReferences&>(proc) = refs;
   proc.dopplerCentroid = {centroidMid, 0, 0, 0, 0, 0, 0, f.nearTime, 0};
   if (const int st = stripmap::getgeopoly(p, proc); st != 0) return st;
   constexpr int kPoints = 10;
-  std::vector<double> x(kPoints), rate(kPoints), inc(kPoints), ground(kPoints);
+  std::vector<double> x(kPoints), rate(kPoints), inc(kPoints), ground(kPoints), look(kPoints);
   double g = 0.0;
   for (int k = 0; k < kPoints; ++k) {
     const double tau = f.nearTime + k * (p.samples - 1.0) / (kPoints - 1) / scan.samplingRate;
     x[static_cast<std::size_t>(k)] = tau - refTime;
     rate[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.dopplerRate, tau, 0.0);
     inc[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.incidenceAngle, tau, 0.0);
+    look[static_cast<std::size_t>(k)] = stripmap::DCeval(proc.lookAngle, tau, 0.0) * kPi / 180.0;
     if (k > 0) {
       const double sinMid = std::sin(0.5 * (inc[static_cast<std::size_t>(k)] + inc[static_cast<std::size_t>(k - 1)]) * kPi / 180.0);
       g += (kC / 2.0) * (x[static_cast<std::size_t>(k)] - x[static_cast<std::size_t>(k - 1)]) / sinMid;
@@ -116,6 +117,15 @@ int orbit_geometry(const scansar& scan, int s, const metadata::SceneReferences& 
   std::array<double, 4> gr{};
   if (const int st = stripmap::polfit(xs, ground, gr, 3); st != 0) return st;
   est.slantToGround[i] = {gr[0], gr[1], gr[2], gr[3], 0.0};
+  // The look angle, degree 4, fitted in tenths of a millisecond so that the normal equations
+  // stay well conditioned, then scaled back to seconds.
+  constexpr double kUnit = 1e4;
+  std::vector<double> xu(kPoints);
+  for (int k = 0; k < kPoints; ++k) xu[static_cast<std::size_t>(k)] = xs[static_cast<std::size_t>(k)] * kUnit;
+  std::array<double, 5> el{};
+  if (const int st = stripmap::polfit(xu, look, el, 4); st != 0) return st;
+  double scale = 1.0;
+  for (std::size_t k = 0; k < el.size(); ++k, scale *= kUnit) est.slantToElevation[i][k] = el[k] * scale;
   return 0;
 }
 
@@ -198,7 +208,7 @@ int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneR
       est.centroid[i] = {est.geometric[i], 0.0, 0.0, 0.0, 0.0};
     }
     if (const int st = orbit_geometry(scan, s, refs, focused[i], poly(est.centroid[i], mid[i] - est.refTime),
-                                      est.refTime, est);
+                                      est.refTime, tMid, est);
         st != 0) {
       base::report(base::kReportError, "Burst Doppler: no rate from the orbit for SS" + std::to_string(s + 1));
       return frame.check(st);
@@ -207,7 +217,81 @@ int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneR
                     poly(est.centroid[i], mid[i] - est.refTime), est.fractional[i], est.ambiguity[i], est.geometric[i],
                     poly(est.rate[i], mid[i] - est.refTime));
   }
+
+  // Granules along the scene: each sub-swath's centroid from the granule's bursts alone, its
+  // ambiguity the one nearest the whole scene's; the rate from the orbit at the granule's time.
+  const GranuleLayout layout = granule_layout(scan.bursts, par.granuleLength, scan.cycleTime);
+  est.granuleReference = layout.referenceTime;
+  est.granuleStep = layout.step;
+  est.granuleCentroid.assign(static_cast<std::size_t>(layout.count), est.centroid);
+  est.granuleRate.assign(static_cast<std::size_t>(layout.count), est.rate);
+  for (int32_t k = 1; k + 1 < layout.count; ++k) {
+    const auto g = static_cast<std::size_t>(k);
+    // An odd granule length lays the last granules past the scene's end; their rate is the
+    // orbit's at the end.
+    const double tk = scan.firstLineTime + std::clamp(layout.referenceTime + k * layout.step, 0.0, scan.bursts * scan.cycleTime);
+    for (int s = 0; s < kSwaths; ++s) {
+      const auto i = static_cast<std::size_t>(s);
+      if (!par.swathsToProcess[i] || i >= focused.size()) continue;
+      auto& c = est.granuleCentroid[g][i];
+      c = est.granuleCentroid[g - 1][i];  // a granule that gives no centroid inherits its predecessor's
+      const double m = mid[i] - est.refTime;
+      double f0 = 0.0, f1 = 0.0;
+      if (i < sums.size() && g < sums[i].granules.size() &&
+          fractional_centroid(sums[i].granules[g], focused[i], scan.prf[i], scan.samplingRate, est.refTime, f0, f1)) {
+        const double whole = poly(est.centroid[i], m);
+        const double shift = std::round((whole - (f0 + f1 * m)) / scan.prf[i]) * scan.prf[i];
+        if (std::abs(f0 + shift + f1 * m - whole) <= 0.5 * scan.prf[i]) c = {f0 + shift, f1, 0.0, 0.0, 0.0};
+      }
+      DopplerEstimate at;
+      if (const int st = orbit_geometry(scan, s, refs, focused[i], poly(c, m), est.refTime, tk, at); st != 0) {
+        base::report(base::kReportError, "Burst Doppler: no rate from the orbit for SS" + std::to_string(s + 1));
+        return frame.check(st);
+      }
+      est.granuleRate[g][i] = at.rate[i];
+    }
+  }
+  if (layout.count > 1)
+    base::LogPrintf("Doppler granules: %d, %.3f s apart\n", layout.count, layout.step);
   return 0;
+}
+
+GranuleLayout granule_layout(int32_t bursts, int32_t length, double cycleTime) {
+  GranuleLayout g;
+  const int32_t G = std::max(1, length);
+  g.length = G;
+  const int32_t whole = bursts / G;
+  if (whole * 2 - 1 < 2) {
+    g.count = 1;
+    g.step = 0.0;
+    g.referenceTime = bursts * cycleTime * 0.5;
+    g.first = {0};
+    return g;
+  }
+  g.count = whole * 2 + 1;
+  const int32_t overlap = G / 2 - (bursts - whole * G) / (whole * 2 - 2);
+  g.step = (G - overlap) * cycleTime;
+  g.referenceTime = G * cycleTime * 0.5 - g.step;
+  g.first.assign(static_cast<std::size_t>(g.count), 0);
+  for (int32_t k = 1; k + 1 < g.count; ++k) g.first[static_cast<std::size_t>(k)] = (G - overlap) * (k - 1);
+  return g;
+}
+
+int32_t granule_of_burst(const GranuleLayout& g, const scansar& scan, int s, int32_t b) {
+  if (g.count <= 1 || !(g.step > 0.0)) return 0;
+  const auto i = static_cast<std::size_t>(s);
+  const int32_t b0 = (b / g.length) * g.length;
+  const double t = (g.length / 2 + b0) * scan.cycleTime + (scan.echoes[i] - 1) / (2.0 * scan.prf[i]) + scan.burstOffset[i];
+  const auto k = static_cast<int32_t>(std::lround((t - g.referenceTime) / g.step));
+  return std::clamp(k, 0, g.count - 1);
+}
+
+void CorrelationSums::add(const CorrelationSums& burst) {
+  if (sum.size() < burst.sum.size()) sum.resize(burst.sum.size());
+  if (power.size() < burst.power.size()) power.resize(burst.power.size());
+  for (std::size_t k = 0; k < burst.sum.size(); ++k) sum[k] += burst.sum[k];
+  for (std::size_t k = 0; k < burst.power.size(); ++k) power[k] += burst.power[k];
+  pairs += burst.pairs;
 }
 
 namespace {
@@ -222,6 +306,19 @@ int save_doppler(const std::string& path, const DopplerEstimate& est, std::span<
   WriteMyProfileDouble(kCentroidSection, "DC_reference_rg._time", est.refTime, path);
   WriteMyProfileDouble(kCentroidSection, "Satellite_speed", est.satelliteSpeed, path);
   WriteMyProfileInt(kCentroidSection, "Geometric_applied", est.geometricApplied ? 1 : 0, path);
+  // Granule g's polynomials under coefs<g>_<s>; granule 0 is the whole scene. Times in seconds
+  // from the scene's first line.
+  const std::size_t granules = std::max<std::size_t>(1, est.granuleCentroid.size());
+  WriteMyProfileInt(kCentroidSection, "No._Doppler_estimates", static_cast<int32_t>(granules), path);
+  WriteMyProfileDouble(kCentroidSection, "DC_reference_az._time", est.granuleReference, path);
+  WriteMyProfileDouble(kCentroidSection, "DC_az._time_step", est.granuleStep, path);
+  WriteMyProfileInt(kRateSection, "No._rate_estimates", static_cast<int32_t>(granules), path);
+  for (std::size_t g = 1; g < est.granuleCentroid.size() && g < est.granuleRate.size(); ++g)
+    for (int s = 0; s < kSwaths; ++s) {
+      const std::string gs = std::to_string(g) + "_" + std::to_string(s);
+      WriteProfileDoubleArray(kCentroidSection, "Doppler_cent_coefs" + gs, est.granuleCentroid[g][static_cast<std::size_t>(s)], path);
+      WriteProfileDoubleArray(kRateSection, "Doppler_rate_coefs" + gs, est.granuleRate[g][static_cast<std::size_t>(s)], path);
+    }
   for (int s = 0; s < kSwaths && s < static_cast<int>(focused.size()); ++s) {
     const auto i = static_cast<std::size_t>(s);
     WriteProfileDoubleArray(kCentroidSection, key("Doppler_cent_coefs0_", s), est.centroid[i], path);
@@ -229,6 +326,7 @@ int save_doppler(const std::string& path, const DopplerEstimate& est, std::span<
     WriteMyProfileDouble(kCentroidSection, key("Fraction_", s), est.fractional[i], path);
     WriteProfileDoubleArray(kRateSection, key("Doppler_rate_coefs0_", s), est.rate[i], path);
     WriteProfileDoubleArray(kRateSection, key("Slant_to_ground_", s), est.slantToGround[i], path);
+    WriteProfileDoubleArray(kRateSection, key("Slant_to_elevangle_", s), est.slantToElevation[i], path);
     WriteMyProfileDouble(kRateSection, key("Incidence_", s), est.incidence[i], path);
     const std::array<int32_t, 3> cols{focused[i].width, focused[i].firstValid, focused[i].validColumns};
     WriteMyProfileIntArray(kRateSection, key("Range_columns_", s), cols, path);
@@ -254,6 +352,7 @@ int load_doppler(const std::string& path, DopplerEstimate& est, std::array<Range
     if (GetProfileDoubleArray(kCentroidSection, key("Doppler_cent_coefs0_", s), est.centroid[i], path) != 0) ++bad;
     if (GetProfileDoubleArray(kRateSection, key("Doppler_rate_coefs0_", s), est.rate[i], path) != 0) ++bad;
     if (GetProfileDoubleArray(kRateSection, key("Slant_to_ground_", s), est.slantToGround[i], path) != 0) ++bad;
+    if (GetProfileDoubleArray(kRateSection, key("Slant_to_elevangle_", s), est.slantToElevation[i], path) != 0) ++bad;
     d(kRateSection, key("Incidence_", s), est.incidence[i]);
     d(kRateSection, key("Near_time_", s), focused[i].nearTime);
     std::array<int32_t, 3> cols{};
@@ -262,6 +361,20 @@ int load_doppler(const std::string& path, DopplerEstimate& est, std::array<Range
     focused[i].firstValid = cols[1];
     focused[i].validColumns = cols[2];
   }
+  std::array<int32_t, 1> count{1};
+  if (GetMyProfileIntArray(kCentroidSection, "No._Doppler_estimates", count, path) != 0) ++bad;
+  d(kCentroidSection, "DC_reference_az._time", est.granuleReference);
+  d(kCentroidSection, "DC_az._time_step", est.granuleStep);
+  if (count[0] < 1 || count[0] > 100000) ++bad;
+  const auto granules = static_cast<std::size_t>(std::clamp(count[0], 1, 100000));
+  est.granuleCentroid.assign(granules, est.centroid);
+  est.granuleRate.assign(granules, est.rate);
+  for (std::size_t g = 1; g < granules; ++g)
+    for (int s = 0; s < kSwaths; ++s) {
+      const std::string gs = std::to_string(g) + "_" + std::to_string(s);
+      if (GetProfileDoubleArray(kCentroidSection, "Doppler_cent_coefs" + gs, est.granuleCentroid[g][static_cast<std::size_t>(s)], path) != 0) ++bad;
+      if (GetProfileDoubleArray(kRateSection, "Doppler_rate_coefs" + gs, est.granuleRate[g][static_cast<std::size_t>(s)], path) != 0) ++bad;
+    }
   FreeProfile(path);
   if (bad != 0) {
     base::report(base::kReportError, "Doppler estimates incomplete in " + path);

@@ -75,6 +75,11 @@ int burst_range_focus(const std::string& dir, int s, const sarpar& channel, cons
   sums.sum.assign(static_cast<std::size_t>(out.width), {0.0, 0.0});
   sums.power.assign(static_cast<std::size_t>(out.width), 0.0);
   sums.pairs = 0;
+  // The same per Doppler granule: the first and the last take the whole scene, the others their
+  // own run of bursts.
+  const GranuleLayout layout = granule_layout(scan.bursts, par.granuleLength, scan.cycleTime);
+  sums.granules.assign(static_cast<std::size_t>(layout.count), CorrelationSums{});
+  CorrelationSums burst;
   ByteWriter file(dir + "/rgfoc_ss" + std::to_string(s + 1));
   std::vector<unsigned char> raw(static_cast<std::size_t>(record * N));
   dsp::cvector echoes(static_cast<std::size_t>(N) * samples), rows(static_cast<std::size_t>(N) * L);
@@ -108,16 +113,23 @@ int burst_range_focus(const std::string& dir, int s, const sarpar& channel, cons
     for (int32_t e = 0; e < N; ++e)
       std::copy_n(rows.data() + static_cast<std::ptrdiff_t>(e) * L, out.width,
                   focused.data() + static_cast<std::ptrdiff_t>(e) * out.width);
+    burst.sum.assign(static_cast<std::size_t>(out.width), {0.0, 0.0});
+    burst.power.assign(static_cast<std::size_t>(out.width), 0.0);
     for (int32_t e = 1; e < N; ++e) {
       const fcomplex* a = focused.data() + static_cast<std::ptrdiff_t>(e) * out.width;
       const fcomplex* p = a - out.width;
       for (int32_t k = 0; k < out.width; ++k) {
         const std::complex<double> x(a[k]), y(p[k]);
-        sums.sum[static_cast<std::size_t>(k)] += x * std::conj(y);
-        sums.power[static_cast<std::size_t>(k)] += 0.5 * (std::norm(x) + std::norm(y));
+        burst.sum[static_cast<std::size_t>(k)] += x * std::conj(y);
+        burst.power[static_cast<std::size_t>(k)] += 0.5 * (std::norm(x) + std::norm(y));
       }
     }
-    sums.pairs += N - 1;
+    burst.pairs = N - 1;
+    sums.add(burst);
+    for (int32_t g = 1; g + 1 < layout.count; ++g) {
+      const int32_t first = layout.first[static_cast<std::size_t>(g)];
+      if (b >= first && b < first + layout.length) sums.granules[static_cast<std::size_t>(g)].add(burst);
+    }
     const double t = near;
     file.write(&t, 8);
     file.write(focused.data(), 8 * static_cast<int64_t>(focused.size()));

@@ -5,10 +5,45 @@
 #include "base/diagnostics.hpp"
 #include "base/run_services.hpp"
 #include "base/stage_clock.hpp"
+#include "geometry/geolocation.hpp"
 #include "scansar/wide_swath.hpp"
 
 namespace sar::scansar {
 using base::StageClock;
+
+namespace {
+// Corners of a focused sub-swath: the zero-Doppler ground points of its earliest and latest
+// line at its near and far column, and of its middle.
+SceneCorners get_coords(const scansar& scan, const wsparm& par, const RangeFocused& f,
+                        const metadata::SceneReferences& refs, int s) {
+  const auto i = static_cast<std::size_t>(s);
+  SceneCorners out;
+  geometry::grpt_rec rec;
+  for (std::size_t k = 0; k < 5; ++k)
+    rec.state_vectors[k] = {refs.orbitPositions[3 * k], refs.orbitPositions[3 * k + 1], refs.orbitPositions[3 * k + 2]};
+  rec.t0 = refs.orbitStartTime;
+  rec.dt = refs.orbitSpacing;
+  rec.wavelength = 299792458.0 / scan.carrierFrequency;
+  rec.side = 1.0;
+  rec.height = 0.0;
+  rec.fdc = 0.0;
+  const int32_t ov = par.rangeOverlap;
+  const double near = f.nearTime + (f.firstValid + ov / 2) / scan.samplingRate;
+  const double far = near + (f.validColumns - ov - 1) / scan.samplingRate;
+  const double first = par.earliestTime[i], last = par.latestTime[i];
+  auto point = [&](double t, double tau, std::array<double, 2>& latLon) {
+    rec.azimuth_time = t;
+    rec.tau = tau;
+    if (geometry::gr_pt_lat_lon(rec) != 0) return false;
+    latLon = {rec.latitude, rec.longitude};
+    return true;
+  };
+  out.valid = refs.orbitSpacing > 0.0 && last >= first && point(first, near, out.firstNear) &&
+              point(first, far, out.firstFar) && point(last, near, out.lastNear) && point(last, far, out.lastFar) &&
+              point(0.5 * (first + last), 0.5 * (near + far), out.centre);
+  return out;
+}
+}  // namespace
 
 int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const metadata::SceneReferences& refs,
                 wsparm& par, const WsStages& stages, bool ascending, const GeometricCentroid& geometric) {
@@ -49,6 +84,8 @@ int WSprocessor(const std::string& dir, std::span<const sarpar> channels, const 
     const auto i = static_cast<std::size_t>(s);
     if (!par.swathsToProcess[i]) continue;
     if (const int st = burst_azimuth_focus(dir, s, scan, par, est, focused[i]); st != 0) return frame.check(st);
+    par.corners[i] = get_coords(scan, par, focused[i], refs, s);
+    if (!par.corners[i].valid) base::report(base::kReportWarning, "SS" + std::to_string(s + 1) + ": no corner coordinates from the orbit");
     const std::string out = dir + "/SS" + std::to_string(s + 1) + ".out";
     if (const int st = write_WShdr(out + ".hdr", s, scan, par, est, focused[i], ascending); st != 0)
       return frame.check(st);

@@ -62,6 +62,52 @@ struct scansar {
   std::array<double, kSwaths> lookBandwidth{};  // Hz, range look band for a ground resolution
 };
 
+/// Two-way elevation antenna pattern of a sub-swath: linear amplitudes of the 201 table entries,
+/// the middle one at look angle `reference` (rad from the geocentric vertical at the
+/// satellite), 0.05 degrees apart (0.072 degrees for a negative reference). Empty: no correction.
+struct ElevationPattern {
+  std::vector<float> amplitude;
+  double reference = 0.0;
+  double step() const;
+};
+
+/// Statistics of a focused sub-swath over its samples that are not both zero.
+struct ImageStatistics {
+  double sumRe = 0.0, sumIm = 0.0, sumRe2 = 0.0, sumIm2 = 0.0, sumAmplitude = 0.0, sumPower = 0.0;
+  double peakRe = 0.0, peakIm = 0.0;
+  int64_t count = 0;
+  void add(std::span<const std::complex<float>> samples);
+  void merge(const ImageStatistics& other);
+  double mean_re() const { return count ? sumRe / count : 0.0; }
+  double mean_im() const { return count ? sumIm / count : 0.0; }
+  double std_re() const;
+  double std_im() const;
+  double mean_amplitude() const { return count ? sumAmplitude / count : 0.0; }
+  double mean_power() const { return count ? sumPower / count : 0.0; }
+};
+
+/// Ground points (latitude, longitude, degrees) of a focused sub-swath's corners: earliest and
+/// latest line, near and far column, and its centre.
+struct SceneCorners {
+  bool valid = false;
+  std::array<double, 2> firstNear{}, firstFar{}, lastNear{}, lastFar{}, centre{};
+};
+
+/// Doppler granules along the scene, of `length` bursts: granule 0 and the last take the whole
+/// scene; granule k (1 .. count - 2) the bursts [first[k], first[k] + length). Granule g is
+/// centred at referenceTime + g step seconds from the scene's first line.
+struct GranuleLayout {
+  int32_t count = 1;
+  double referenceTime = 0.0;  // s from the scene's first line
+  double step = 0.0;           // s
+  std::vector<int32_t> first;  // first burst (0-based) of each granule
+  int32_t length = 0;          // bursts of a granule between the first and the last
+};
+GranuleLayout granule_layout(int32_t bursts, int32_t length, double cycleTime);
+/// The granule whose polynomials burst b uses: the one centred nearest the middle of the
+/// granule-long run of bursts that starts at the last multiple of the length at or before b.
+int32_t granule_of_burst(const GranuleLayout& g, const scansar& scan, int s, int32_t b);
+
 /// Processing choices (section "Focusing_parameters") and the running state of a run.
 struct wsparm {
   std::array<int32_t, kSwaths> swathsToProcess{1, 1, 1, 1, 1};
@@ -79,10 +125,14 @@ struct wsparm {
   int32_t rangeOverlap = 32;              // full overlap of range sub-blocks
   double antennaLength = 10.0;            // m
   double centroidReference = -1e10;       // Hz; above -1e9 the ambiguity is taken from it
+  std::array<ElevationPattern, kSwaths> elevation{};  // per sub-swath; empty: not corrected
+  int32_t granuleLength = 20;             // bursts of a Doppler granule (DC_Granule_Length / 2)
   // Running results per sub-swath.
   std::array<double, kSwaths> earliestTime{}, latestTime{};
   std::array<int32_t, kSwaths> firstLine{}, lastLine{};
   std::array<int32_t, kSwaths> linesPerBurst{};
+  std::array<ImageStatistics, kSwaths> statistics{};
+  std::array<SceneCorners, kSwaths> corners{};
 };
 
 /// Fills `scan` from the five channels (index = sub-swath) the extraction gave. Returns 0, or 10
@@ -101,6 +151,8 @@ struct CorrelationSums {
   std::vector<std::complex<double>> sum;
   std::vector<double> power;
   int64_t pairs = 0;
+  std::vector<CorrelationSums> granules;  // the same per Doppler granule (granule_layout)
+  void add(const CorrelationSums& burst);
 };
 
 /// What range focusing gives per sub-swath.
@@ -129,8 +181,13 @@ struct DopplerEstimate {
   double satelliteSpeed = 0.0;               // |V|, Earth-fixed, m/s
   std::array<double, kSwaths> incidence{};   // degrees, mid swath
   std::array<std::array<double, 5>, kSwaths> slantToGround{};  // ground range (m) in range time about each near time
+  std::array<std::array<double, 5>, kSwaths> slantToElevation{};  // look angle (rad) in range time about each near time
   bool ambiguityDoubtful = false;
   bool geometricApplied = false;  // the data disagreed with the orbit by more than half a PRF
+  // Per Doppler granule g (granule_layout; granule 0 is the whole scene, as centroid and rate
+  // above): centroid and rate polynomials of every sub-swath.
+  double granuleReference = 0.0, granuleStep = 0.0;  // s from the scene's first line
+  std::vector<std::array<std::array<double, 5>, kSwaths>> granuleCentroid, granuleRate;
 };
 
 /// Geometric centroid (Hz) at azimuth time t and range time tau: the orbit in `refs` and the
@@ -159,6 +216,13 @@ struct ScallopModel {
   /// The factor a line of Doppler f is multiplied by: 1 / (sqrt(G(f) + G(f + prf) + G(f - prf)) + 1e-4).
   double scale(double f, double fdc, double prf) const;
 };
+
+/// Range gain of the elevation antenna correction: gain[j] = 1 / P(theta_j), P the pattern
+/// linear between entries, theta_j the look angle of column j, slantToElevation evaluated at
+/// x0 + j / fs. Columns whose look angle falls outside the table keep gain 1 and are reported
+/// once, "out of antenna beam range". Returns the count of such columns.
+int envi_beam_corr(const ElevationPattern& pattern, const std::array<double, 5>& slantToElevation, double x0, double fs,
+                   std::span<float> gain);
 
 /// Azimuth focusing of sub-swath s from `D/rgfoc_ss<s+1>` into `D/SS<s+1>.out`. Returns 0, or
 /// 10 for inputs that cannot be focused, or the failing step's status.

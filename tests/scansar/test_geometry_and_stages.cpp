@@ -3,6 +3,8 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <complex>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -12,6 +14,7 @@
 #include <vector>
 
 #include "base/errors.hpp"
+#include "base/profile.hpp"
 #include "dsp/fft.hpp"
 #include "envisat/aux_products.hpp"
 #include "ws_fixture.hpp"
@@ -205,6 +208,111 @@ TEST_F(BurstDoppler, CentroidOfEverySubSwathWithItsAmbiguityOrTheOnesGiven) {
   }
 }
 
+// Doppler granules: the bursts each granule takes, and which granule a burst is focused with.
+TEST(DopplerGranules, LayoutAlongTheScene) {
+  struct Row {
+    int32_t bursts, length;
+    int32_t count;
+    double referenceCycles, stepCycles;
+    std::vector<int32_t> first;  // of the granules between the first and the last
+  };
+  const double c = 0.19;
+  for (const Row& r : {Row{100, 20, 11, 0.0, 10.0, {0, 10, 20, 30, 40, 50, 60, 70, 80}},
+                       // 45 = 2 x 20 + 5: the granules overlap by 8 bursts, 12 apart.
+                       Row{45, 20, 5, -2.0, 12.0, {0, 12, 24}}, Row{60, 20, 7, 0.0, 10.0, {0, 10, 20, 30, 40}},
+                       // Fewer than two granules' worth: one, the whole scene, at its middle.
+                       Row{39, 20, 1, 19.5, 0.0, {}}, Row{7, 20, 1, 3.5, 0.0, {}}}) {
+    SCOPED_TRACE(std::to_string(r.bursts) + " bursts, granules of " + std::to_string(r.length));
+    const GranuleLayout g = granule_layout(r.bursts, r.length, c);
+    ASSERT_EQ(g.count, r.count);
+    EXPECT_NEAR(g.referenceTime, r.referenceCycles * c, 1e-12);
+    EXPECT_NEAR(g.step, r.stepCycles * c, 1e-12);
+    for (std::size_t k = 0; k < r.first.size(); ++k) {
+      EXPECT_EQ(g.first[k + 1], r.first[k]);
+      // The middle of the granule's bursts is its reference time.
+      EXPECT_NEAR(g.referenceTime + static_cast<double>(k + 1) * g.step, (r.first[k] + 0.5 * r.length) * c, 1e-9);
+    }
+  }
+  // A burst is focused with the granule centred nearest the granule-long run it starts.
+  scansar scan;
+  scan.cycleTime = c;
+  scan.prf = {1686, 2058, 1656, 2064, 1670};
+  scan.echoes = {50, 65, 55, 71, 60};
+  scan.burstOffset = {0.0, 0.04, 0.08, 0.12, 0.16};
+  const GranuleLayout g = granule_layout(100, 20, c);
+  for (const auto& [b, expected] : std::vector<std::pair<int32_t, int32_t>>{{0, 1}, {19, 1}, {20, 3}, {57, 5}, {99, 9}})
+    for (int s = 0; s < 5; ++s) EXPECT_EQ(granule_of_burst(g, scan, s, b), expected) << "burst " << b << " SS" << s + 1;
+  EXPECT_EQ(granule_of_burst(granule_layout(39, 20, c), scan, 2, 30), 0);
+}
+
+// Granules of three bursts along the ten-burst product. Range focusing sums each granule's own
+// bursts. The product's targets lie within one cycle along the track, too few for a granule's
+// centroid of their own, so each granule is given the whole scene's sums turned by a Doppler of
+// 40 k Hz (granule k), which its centroid must follow; a granule whose sums are empty inherits
+// its predecessor's; the rate is the orbit's at each granule's time.
+TEST_F(BurstDoppler, GranulesFollowTheirOwnBursts) {
+  ASSERT_NE(x_, nullptr);
+  wsparm par = par_;
+  par.granuleLength = 3;
+  std::array<RangeFocused, kSwaths> focused{};
+  std::array<CorrelationSums, kSwaths> sums{};
+  for (int s = 0; s < 5; ++s)
+    ASSERT_EQ(burst_range_focus(x_->dir, s, x_->channels[static_cast<std::size_t>(s)], scan_, par, x_->refs.replica,
+                                focused[static_cast<std::size_t>(s)], sums[static_cast<std::size_t>(s)]),
+              0);
+  const GranuleLayout layout = granule_layout(scan_.bursts, 3, scan_.cycleTime);
+  ASSERT_EQ(layout.count, 7);
+  const int32_t empty = 4;
+  for (int s = 0; s < 5; ++s) {
+    CorrelationSums& whole = sums[static_cast<std::size_t>(s)];
+    auto& granules = whole.granules;
+    ASSERT_EQ(static_cast<int32_t>(granules.size()), layout.count);
+    for (int32_t k = 1; k + 1 < layout.count; ++k) {
+      auto& g = granules[static_cast<std::size_t>(k)];
+      const int32_t first = layout.first[static_cast<std::size_t>(k)];
+      EXPECT_EQ(g.pairs, (std::min(first + 3, scan_.bursts) - first) * (scan_.echoes[static_cast<std::size_t>(s)] - 1));
+      EXPECT_NE(g.sum, granules[static_cast<std::size_t>(k == 1 ? 2 : 1)].sum);  // bursts of its own
+      const std::complex<double> turn = std::polar(1.0, 2.0 * 3.14159265358979 * 40.0 * k / scan_.prf[static_cast<std::size_t>(s)]);
+      g.sum = whole.sum;
+      g.power = whole.power;
+      for (auto& v : g.sum) v = k == empty ? std::complex<double>{} : v * turn;
+    }
+  }
+  DopplerEstimate est;
+  ASSERT_EQ(burst_doppler(scan_, par, x_->refs, focused, sums, est, prediction(0.0)), 0);
+  ASSERT_EQ(static_cast<int32_t>(est.granuleCentroid.size()), layout.count);
+  EXPECT_NEAR(est.granuleStep, layout.step, 1e-12);
+  for (int s = 0; s < 5; ++s) {
+    const auto i = static_cast<std::size_t>(s);
+    const double x = focused[i].nearTime + 0.5 * focused[i].width / scan_.samplingRate - est.refTime;
+    auto at = [x](const std::array<double, 5>& c) { return c[0] + x * (c[1] + x * c[2]); };
+    const double whole = at(est.centroid[i]);
+    EXPECT_EQ(at(est.granuleCentroid[0][i]), whole);
+    EXPECT_EQ(at(est.granuleCentroid[static_cast<std::size_t>(layout.count - 1)][i]), whole);
+    for (int32_t k = 1; k + 1 < layout.count; ++k) {
+      const double got = at(est.granuleCentroid[static_cast<std::size_t>(k)][i]);
+      if (k == empty)
+        EXPECT_EQ(got, at(est.granuleCentroid[static_cast<std::size_t>(k - 1)][i])) << "SS" << s + 1;
+      else
+        EXPECT_NEAR(got - whole, 40.0 * k, 0.5) << "SS" << s + 1 << " granule " << k;
+      // The orbit's rate changes little along the scene: within a permille of the whole scene's.
+      EXPECT_NEAR(at(est.granuleRate[static_cast<std::size_t>(k)][i]), at(est.rate[i]), 1e-3 * std::abs(at(est.rate[i])));
+    }
+  }
+  // Written and read back whole.
+  const std::string path = x_->dir + "/granules.par";
+  ASSERT_EQ(save_doppler(path, est, focused), 0);
+  DopplerEstimate back;
+  std::array<RangeFocused, kSwaths> f{};
+  ASSERT_EQ(load_doppler(path, back, f), 0);
+  ASSERT_EQ(back.granuleCentroid.size(), est.granuleCentroid.size());
+  for (std::size_t k = 0; k < 3; ++k) {
+    EXPECT_NEAR(back.granuleCentroid[3][2][k], est.granuleCentroid[3][2][k], 1e-9 * std::abs(est.granuleCentroid[3][2][k]));
+    EXPECT_NEAR(back.granuleRate[5][4][k], est.granuleRate[5][4][k], 1e-9 * std::abs(est.granuleRate[5][4][k]));
+  }
+  EXPECT_NEAR(back.granuleStep, est.granuleStep, 1e-12);
+}
+
 // ---------------------------------------------------------------------------------------------
 // Resume and bad input on a small product.
 
@@ -248,6 +356,93 @@ TEST_F(WsStagesRun, RangeAndDopplerThenAzimuthInASecondRunGiveTheSameImages) {
     EXPECT_TRUE(a == b) << name;
     EXPECT_TRUE(std::filesystem::exists(two + name + ".hdr")) << name;
     EXPECT_FALSE(std::filesystem::exists(two + "/rgfoc_ss" + std::to_string(s))) << name;
+  }
+  // The header's image statistics are those of the samples written; its corners lie around the
+  // sub-swath's target.
+  for (int s = 1; s <= 5; ++s) {
+    SCOPED_TRACE("SS" + std::to_string(s));
+    const std::string hdr = one + "/SS" + std::to_string(s) + ".out.hdr";
+    std::array<double, 1> samples{}, power{}, amplitude{};
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Image", "Samples", samples, hdr), 0);
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Statistics", "MeanPower", power, hdr), 0);
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Statistics", "MeanAmplitude", amplitude, hdr), 0);
+    const std::vector<char> bytes = slurp(one + "/SS" + std::to_string(s) + ".out");
+    const std::size_t rec = 17 + 8 * static_cast<std::size_t>(samples[0]);
+    double sum = 0.0, sumA = 0.0;
+    long long count = 0;
+    for (std::size_t l = 0; l + rec <= bytes.size(); l += rec)
+      for (std::size_t k = 0; k < static_cast<std::size_t>(samples[0]); ++k) {
+        std::complex<float> z;
+        std::memcpy(&z, bytes.data() + l + 17 + 8 * k, 8);
+        if (z == std::complex<float>{}) continue;
+        sum += std::norm(z);
+        sumA += std::abs(z);
+        ++count;
+      }
+    ASSERT_GT(count, 0);
+    EXPECT_NEAR(power[0], sum / count, 1e-6 * sum / count);
+    EXPECT_NEAR(amplitude[0], sumA / count, 1e-6 * sumA / count);
+    const auto& target = truth_->targets[static_cast<std::size_t>(sar::test::target_of_swath(s - 1))].target.position;
+    std::array<double, 2> near{}, far{}, centre{};
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Corners", "FirstNear", near, hdr), 0);
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Corners", "LastFar", far, hdr), 0);
+    ASSERT_EQ(sar::base::GetProfileDoubleArray("Corners", "Centre", centre, hdr), 0);
+    // A few kilometres of swath and a second or two of track: within 0.2 degrees of the target.
+    for (const auto& p : {near, far, centre}) {
+      EXPECT_NEAR(p[0], target.lat_deg, 0.2);
+      EXPECT_NEAR(p[1], target.lon_deg, 0.2);
+    }
+    EXPECT_NE(near, far);
+  }
+}
+
+// Each burst is focused with its own granule's centroid: a granule moved by 100 Hz moves the
+// output window of the bursts that use it, by the time that Doppler takes at the rate, and no
+// other burst's.
+TEST_F(WsStagesRun, EachBurstIsFocusedWithItsGranule) {
+  ASSERT_NE(x_, nullptr);
+  scansar scan;
+  ASSERT_EQ(derive_geometry(x_->channels, scan), 0);
+  wsparm par;
+  par.granuleLength = 2;
+  ASSERT_EQ(check_bursts(scan, par), 0);
+  const int s = 2;
+  const auto i = static_cast<std::size_t>(s);
+  std::array<RangeFocused, kSwaths> focused{};
+  std::array<CorrelationSums, kSwaths> sums{};
+  par.swathsToProcess = {0, 0, 1, 0, 0};
+  ASSERT_EQ(burst_range_focus(x_->dir, s, x_->channels[i], scan, par, x_->refs.replica, focused[i], sums[i]), 0);
+  DopplerEstimate est;
+  ASSERT_EQ(burst_doppler(scan, par, x_->refs, focused, sums, est), 0);
+  const GranuleLayout layout = granule_layout(scan.bursts, 2, scan.cycleTime);
+  ASSERT_EQ(layout.count, 5);
+  auto first_lines = [&](const DopplerEstimate& e) {
+    EXPECT_EQ(burst_azimuth_focus(x_->dir, s, scan, par, e, focused[i]), 0);
+    const int width = focused[i].validColumns - par.rangeOverlap;
+    const std::vector<char> bytes = slurp(x_->dir + "/SS3.out");
+    const std::size_t rec = 17 + 8 * static_cast<std::size_t>(width), lines = static_cast<std::size_t>(par.linesPerBurst[i]);
+    std::vector<int32_t> first;
+    for (std::size_t b = 0; b < static_cast<std::size_t>(scan.bursts); ++b) {
+      int32_t n = 0;
+      decode_line_prefix(reinterpret_cast<const unsigned char*>(bytes.data()) + b * lines * rec, n);
+      first.push_back(n);
+    }
+    return first;
+  };
+  const std::vector<int32_t> before = first_lines(est);
+  const int32_t moved = granule_of_burst(layout, scan, s, 1);
+  DopplerEstimate shifted = est;
+  shifted.granuleCentroid[static_cast<std::size_t>(moved)][i][0] += 100.0;
+  const std::vector<int32_t> after = first_lines(shifted);
+  const double x = focused[i].nearTime + (focused[i].firstValid + par.rangeOverlap / 2 + (focused[i].validColumns - par.rangeOverlap) / 2) /
+                                             scan.samplingRate - est.refTime;
+  const auto& r = est.granuleRate[static_cast<std::size_t>(moved)][i];
+  const double lines = -100.0 / (r[0] + x * (r[1] + x * r[2])) / par.azimuthStep;
+  for (int32_t b = 0; b < scan.bursts; ++b) {
+    if (granule_of_burst(layout, scan, s, b) == moved)
+      EXPECT_NEAR(after[static_cast<std::size_t>(b)] - before[static_cast<std::size_t>(b)], lines, 1.0) << "burst " << b;
+    else
+      EXPECT_EQ(after[static_cast<std::size_t>(b)], before[static_cast<std::size_t>(b)]) << "burst " << b;
   }
 }
 

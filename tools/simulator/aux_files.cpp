@@ -1,5 +1,6 @@
 #include "simulator/aux_files.hpp"
 
+#include <algorithm>
 #include <bit>
 #include <cmath>
 #include <cstdint>
@@ -128,6 +129,48 @@ InsSwathRow read_ins_swath_row(const std::string& ins_path, InsTable table, int 
   row.echoes = get_u16(bytes, r + echoes);
   row.rank = get_u16(bytes, r + rank);
   return row;
+}
+
+namespace {
+constexpr std::size_t kXcaRecordBytes = 26552;
+constexpr std::size_t kInsPatternAngle = 161916;  // float, + 4 slot
+constexpr long long kXcaPatternBias = 2424;       // the slot's table at 4 (201 (4 slot + pol)) - bias
+
+float get_f32(const std::vector<uint8_t>& bytes, std::size_t pos) {
+  if (pos + 4 > bytes.size()) throw std::runtime_error("auxiliary record too short");
+  uint32_t v = 0;
+  for (std::size_t k = 0; k < 4; ++k) v = (v << 8) | bytes[pos + k];
+  return std::bit_cast<float>(v);
+}
+}  // namespace
+
+double ElevationPattern::amplitude(double look_deg) const {
+  const int n = static_cast<int>(gain_db.size());
+  const double g = std::clamp((look_deg - centre_deg) / step_deg + (n - 1) / 2, 0.0, n - 1.0);
+  const int k = std::min(static_cast<int>(g), n - 2);
+  const double db = gain_db[static_cast<std::size_t>(k)] +
+                    (g - k) * (gain_db[static_cast<std::size_t>(k + 1)] - gain_db[static_cast<std::size_t>(k)]);
+  return std::pow(10.0, db / 20.0);
+}
+
+ElevationPattern read_elevation_pattern(const std::string& xca_path, const std::string& ins_path, int slot, int pol) {
+  if (slot < 1 || slot > 8 || pol < 0 || pol > 3) throw std::invalid_argument("no elevation pattern slot");
+  ElevationPattern p;
+  {
+    const std::vector<uint8_t> bytes = read_all(xca_path);
+    expect_type(bytes, "ASA_XCA_AX", xca_path);
+    const std::size_t r = record_position(bytes, kXcaRecordBytes, xca_path);
+    const long long first = 4LL * 201 * (4LL * slot + pol) - kXcaPatternBias;
+    for (std::size_t k = 0; k < p.gain_db.size(); ++k)
+      p.gain_db[k] = get_f32(bytes, r + static_cast<std::size_t>(first) + 4 * k);
+  }
+  const std::vector<uint8_t> bytes = read_all(ins_path);
+  expect_type(bytes, "ASA_INS_AX", ins_path);
+  const std::size_t r = record_position(bytes, kInsRecordBytes, ins_path);
+  p.centre_deg = get_f32(bytes, r + kInsPatternAngle + 4 * static_cast<std::size_t>(slot));
+  // Tables of a negative reference angle are sampled more coarsely.
+  p.step_deg = p.centre_deg >= 0.0 ? 0.05 : 0.072;
+  return p;
 }
 
 AuxValidity aux_validity_around(double sensing_start) {

@@ -9,6 +9,7 @@
 // carrier and sampling frequencies, the range gate bias, the gain model, and the rows of the
 // swath tables (echoes per burst or block, rank) of the beams the acquisition used. The
 // template file itself is only read.
+#include <array>
 #include <span>
 #include <string>
 
@@ -46,6 +47,25 @@ InsSwathRow read_ins_swath_row(const std::string& ins_path, InsTable table, int 
 /// std::runtime_error when the template cannot be read or is no ASA_INS product.
 std::string write_ins_file(const std::string& template_path, const ImParameters& im, std::span<const InsSwathRow> rows,
                            const AuxValidity& validity, const std::string& out_dir);
+
+/// Two-way elevation pattern of one beam slot: 201 gains (dB) of ASA_XCA, `step_deg` apart,
+/// the middle one at the look angle ASA_INS gives the slot.
+struct ElevationPattern {
+  std::array<float, 201> gain_db{};
+  double centre_deg = 0.0;
+  double step_deg = 0.05;
+  /// Amplitude factor 10^(dB / 20) at a look angle (degrees from the geocentric vertical at the
+  /// satellite), linear between entries, the end entries held outside the table.
+  double amplitude(double look_deg) const;
+};
+
+/// Beam slots (1-based) of the wide swath sub-swaths SS1-SS5 in the ASA_INS and ASA_XCA
+/// pattern tables.
+inline constexpr std::array<int, 5> kWsPatternSlot = {8, 3, 4, 5, 6};
+
+/// The pattern of `slot` and polarisation `pol` (0 H/H, 1 V/V) from an ASA_XCA and an ASA_INS
+/// product. Throws std::runtime_error for files that are no such products.
+ElevationPattern read_elevation_pattern(const std::string& xca_path, const std::string& ins_path, int slot, int pol);
 
 /// Writes the ASA_XCA copy into `out_dir`; returns its path.
 std::string write_xca_file(const std::string& template_path, const AuxValidity& validity,

@@ -290,6 +290,8 @@ struct ChannelSetup {
   bool tx_v = false, rx_v = false;
   double tp = 0.0, rate = 0.0;  // pulse length, chirp rate
   std::vector<uint8_t> calibration;  // payload of its calibration pulses
+  // WS: the sub-swath's two-way elevation pattern, when ASA_XCA and ASA_INS templates are given.
+  std::optional<ElevationPattern> elevation;
 };
 
 }  // namespace
@@ -326,6 +328,8 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
       t.beam_code = kWsFirstBeam + static_cast<int>(k);
       t.pri_code = w.pri_code;
       t.burst_echoes = w.burst_echoes;
+      if (!c.xca_template.empty() && !c.ins_template.empty())
+        ch.elevation = read_elevation_pattern(c.xca_template, c.ins_template, kWsPatternSlot[k], c.ws.vertical ? 1 : 0);
       if (t.burst_echoes <= 0)
         t.burst_echoes = c.ins_template.empty() ? kWsBurstEchoes[k]
                                                 : read_ins_swath_row(c.ins_template, InsTable::kWs, t.beam_code).echoes;
@@ -689,7 +693,12 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
         const double x = im.antenna_length * std::sin(azimuth_off_boresight(beam, tt.ecef)) / lambda;
         if (std::abs(x) > 3.0) continue;
         const double polar = is_alternating(c.mode) ? tt.target.channel_gain[static_cast<std::size_t>(slot.channel & 1)] : 1.0;
-        const double amplitude = tt.target.amplitude * sinc(x) * sinc(x) * cht.target_gain * polar;
+        double amplitude = tt.target.amplitude * sinc(x) * sinc(x) * cht.target_gain * polar;
+        if (ch.elevation) {
+          // Look angle at the satellite against the geocentric vertical.
+          const double look = std::acos(std::clamp(s.position.unit().dot((d * -1.0).unit()), -1.0, 1.0)) / kDeg;
+          amplitude *= ch.elevation->amplitude(look);
+        }
         const double delay = 2.0 * r / kSpeedOfLight;
         const double carrier = -4.0 * kPi * r / lambda;
         const long long k0 = std::max(0LL, static_cast<long long>(std::ceil((delay - near) * fs)));
