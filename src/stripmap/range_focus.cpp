@@ -12,6 +12,7 @@
 #include "base/errors.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/raster_files.hpp"
+#include "io/line_store.hpp"
 #include "dsp/fft.hpp"
 
 namespace sar::stripmap {
@@ -74,6 +75,43 @@ int load_lines(RawLines& in, const sarpar& par, const procparm& proc, const Rang
     const float t = in.read(row);
     std::fill(row + z.rawSamples, row + z.padded, fcomplex{});
     if (int st = line_shift(par, proc, z, t, first + i, shifts[i])) return st;
+  }
+  return 0;
+}
+
+// The raw lines from the extraction's store into rows of pitch L of `matrix` (the tail of each
+// row zeroed). The shifts come first, so a broken line refuses the product before any copying;
+// the copies then run in parallel a store chunk at a time. The matrix grows by the chunk's rows
+// within its reserved room (so it never moves) and each chunk is freed once copied: the store
+// and the matrix never both hold the whole scene.
+int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, const RangeSizes& z, dsp::cvector& rows,
+               int32_t* shifts) {
+  const int32_t lines = par.lines;
+  const std::size_t sampleBytes = 8 * static_cast<std::size_t>(z.rawSamples);
+  if (store.line_bytes() != 4 + sampleBytes || store.lines() < lines) {
+    reject(base::format_text("Range focusing: the extracted lines in memory (%lld of %zu bytes) do not hold %d lines of %d samples",
+                             static_cast<long long>(store.lines()), store.line_bytes(), lines, z.rawSamples));
+    return kRejected;
+  }
+  for (int32_t i = 0; i < lines; ++i) {
+    float t = 0.0f;
+    std::memcpy(&t, store.line(i), sizeof t);
+    if (int st = line_shift(par, proc, z, t, i, shifts[i])) return st;
+  }
+  const auto step = static_cast<int32_t>(std::min<std::size_t>(store.lines_per_chunk(), static_cast<std::size_t>(lines)));
+  rows.clear();
+  rows.reserve(static_cast<std::size_t>(lines) * static_cast<std::size_t>(z.padded));
+  for (int32_t start = 0; start < lines; start += step) {
+    const int32_t stop = std::min(lines, start + step);
+    rows.resize(static_cast<std::size_t>(stop) * static_cast<std::size_t>(z.padded));
+    fcomplex* matrix = rows.data();
+#pragma omp parallel for schedule(static)
+    for (int32_t i = start; i < stop; ++i) {
+      fcomplex* row = matrix + static_cast<int64_t>(i) * z.padded;
+      std::memcpy(static_cast<void*>(row), store.line(i) + 4, sampleBytes);
+      std::fill(row + z.rawSamples, row + z.padded, fcomplex{});
+    }
+    store.release_below(stop);
   }
   return 0;
 }
@@ -221,9 +259,17 @@ int init_buffer(const sarpar& par, procparm& proc) {
   proc.rangeSamples = z.output;
   proc.lines = par.lines;
   proc.lineShifts.assign(static_cast<std::size_t>(par.lines), 0);
-  proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
-  RawLines in(raw_path(par), par.lines, par.samples);
-  if (int st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data())) {
+  int st = 0;
+  if (proc.rawLines) {
+    // The extraction kept the lines in memory: no line file exists.
+    st = load_store(*proc.rawLines, par, proc, z, proc.matrix, proc.lineShifts.data());
+    proc.rawLines.reset();
+  } else {
+    proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
+    RawLines in(raw_path(par), par.lines, par.samples);
+    st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data());
+  }
+  if (st != 0) {
     proc.matrix = dsp::cvector();
     proc.lineShifts.clear();
     return frame.check(st);
