@@ -116,6 +116,37 @@ int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, co
   return 0;
 }
 
+// Moves rows of pitch L to pitch V + W in place: row r gets `shift` zeros, its V valid lags,
+// then zeros. Row r's destination ends at (r + 1)(V + W) <= (r + 1) L, before the source of any
+// later row, so only the sources of earlier rows can lie under it. A run of rows [r, e) whose
+// destinations all end before the source of row r, e (V + W) <= r L, can therefore be copied in
+// parallel once the rows before r are done; the runs grow geometrically, so only the first
+// rows (about (V + W) / (L - V - W) of them) go one by one, through a copy of the line.
+void repack_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const int32_t* shifts) {
+  const auto place = [&](int32_t r, const fcomplex* valid) {
+    fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
+    const int32_t s = shifts ? shifts[r] : 0;
+    std::fill(dst, dst + s, fcomplex{});
+    std::copy(valid, valid + z.valid, dst + s);
+    std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
+  };
+  std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
+  for (int32_t r = 0; r < rows;) {
+    const int64_t end = static_cast<int64_t>(r) * z.padded / std::max(z.output, 1);
+    const int32_t e = static_cast<int32_t>(std::min<int64_t>(rows, end));
+    if (e - r < 2) {
+      const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
+      std::copy(src, src + z.valid, line.begin());
+      place(r, line.data());
+      ++r;
+      continue;
+    }
+#pragma omp parallel for schedule(static)
+    for (int32_t q = r; q < e; ++q) place(q, matrix + static_cast<int64_t>(q) * z.padded);
+    r = e;
+  }
+}
+
 // Correlates `rows` rows of pitch L with the replica and repacks them at the output pitch:
 // row i moves from i L to i (V + W), `shift` zeros first, then the V valid lags, then zeros.
 // The repacking runs in row order in place: row i's destination never reaches past its own
@@ -164,16 +195,7 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
     progress_update(100.0 * done / (static_cast<double>(blockCount) * std::max(blockLines, 1)));
   }
 
-  std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
-  for (int32_t r = 0; r < rows; ++r) {
-    const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
-    std::copy(src, src + z.valid, line.begin());
-    fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
-    const int32_t s = shifts ? shifts[r] : 0;
-    std::fill(dst, dst + s, fcomplex{});
-    std::copy(line.begin(), line.end(), dst + s);
-    std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
-  }
+  repack_rows(matrix, rows, z, shifts);
 }
 
 // Offset in samples of the replica's first sample from the leading edge of the pulse. The
