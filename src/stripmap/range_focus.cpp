@@ -6,6 +6,8 @@
 #include <cstring>
 #include <string>
 
+#include <omp.h>
+
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
 #include "base/parallel.hpp"
@@ -116,33 +118,35 @@ int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, co
   return 0;
 }
 
-// Moves rows of pitch L to pitch V + W in place: row r gets `shift` zeros, its V valid lags,
-// then zeros. Row r's destination ends at (r + 1)(V + W) <= (r + 1) L, before the source of any
-// later row, so only the sources of earlier rows can lie under it. A run of rows [r, e) whose
-// destinations all end before the source of row r, e (V + W) <= r L, can therefore be copied in
-// parallel once the rows before r are done; the runs grow geometrically, so only the first
-// rows (about (V + W) / (L - V - W) of them) go one by one, through a copy of the line.
-void repack_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const int32_t* shifts) {
-  const auto place = [&](int32_t r, const fcomplex* valid) {
-    fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
-    const int32_t s = shifts ? shifts[r] : 0;
-    std::fill(dst, dst + s, fcomplex{});
-    std::copy(valid, valid + z.valid, dst + s);
-    std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
-  };
+// Moves rows [from, to) of pitch L to pitch V + W in place, the rows before `from` being done:
+// row r gets `shift` zeros, its V valid lags, then zeros. Row r's destination ends at
+// (r + 1)(V + W) <= (r + 1) L, before the source of any later row, so only the sources of
+// earlier rows can lie under it. A run of rows [r, e) whose destinations all end before the
+// source of row r, e (V + W) <= r L, can therefore be copied in parallel once the rows before r
+// are done; the runs grow geometrically, so only the first rows (about (V + W) / (L - V - W)
+// of them) go one by one, through a copy of the line.
+void place_row(fcomplex* matrix, int32_t r, const fcomplex* valid, const RangeSizes& z, const int32_t* shifts) {
+  fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
+  const int32_t s = shifts ? shifts[r] : 0;
+  std::fill(dst, dst + s, fcomplex{});
+  std::copy(valid, valid + z.valid, dst + s);
+  std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
+}
+
+void repack_rows(fcomplex* matrix, int32_t from, int32_t to, const RangeSizes& z, const int32_t* shifts) {
   std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
-  for (int32_t r = 0; r < rows;) {
+  for (int32_t r = from; r < to;) {
     const int64_t end = static_cast<int64_t>(r) * z.padded / std::max(z.output, 1);
-    const int32_t e = static_cast<int32_t>(std::min<int64_t>(rows, end));
+    const int32_t e = static_cast<int32_t>(std::min<int64_t>(to, end));
     if (e - r < 2) {
       const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
       std::copy(src, src + z.valid, line.begin());
-      place(r, line.data());
+      place_row(matrix, r, line.data(), z, shifts);
       ++r;
       continue;
     }
 #pragma omp parallel for schedule(static)
-    for (int32_t q = r; q < e; ++q) place(q, matrix + static_cast<int64_t>(q) * z.padded);
+    for (int32_t q = r; q < e; ++q) place_row(matrix, q, matrix + static_cast<int64_t>(q) * z.padded, z, shifts);
     r = e;
   }
 }
@@ -167,35 +171,52 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
     dsp::fft_makep_c(backwardTail, z.padded, z.padded, tail, tail, -1, 0, 1);
   }
   const fcomplex* h = replicaSpectrum.data();
+  const auto correlate = [&](std::span<fcomplex> part, int32_t count) {
+    const bool full = count == kGroup;
+    dsp::pfft_c(full ? forward : forwardTail, part);
+    for (int32_t r = 0; r < count; ++r) {
+      fcomplex* x = part.data() + static_cast<int64_t>(r) * z.padded;
+      for (int32_t k = 0; k < z.padded; ++k) {
+        const double xr = x[k].real(), xi = x[k].imag();
+        const double hr = h[k].real(), hi = h[k].imag();
+        x[k] = fcomplex(static_cast<float>(xr * hr - xi * hi), static_cast<float>(xi * hr + xr * hi));
+      }
+    }
+    dsp::pfft_c(full ? backward : backwardTail, part);
+  };
+  // One aligned group of rows per thread: a row is transformed there and goes straight to its
+  // place at the output pitch, which saves the repacking pass over the matrix. That is safe for
+  // a window whose destinations all end before its first source (the windows before it being
+  // done); the first windows of a matrix are transformed in place and repacked.
+  std::vector<dsp::cvector> scratch(static_cast<std::size_t>(std::max(omp_get_max_threads(), 1)));
   base::ParallelFailure failure;
   constexpr int32_t kWindow = 64 * kGroup;  // lines between two progress reports
   for (int32_t start = 0; start < rows; start += kWindow) {
     const int32_t stop = std::min(rows, start + kWindow);
     const int32_t groups = (stop - start + kGroup - 1) / kGroup;
+    const bool direct = static_cast<int64_t>(stop) * z.output <= static_cast<int64_t>(start) * z.padded;
 #pragma omp parallel for schedule(static)
     for (int32_t g = 0; g < groups; ++g) failure.run([&] {
       const int32_t first = start + g * kGroup;
       const int32_t count = std::min(kGroup, stop - first);
-      const bool full = count == kGroup;
-      const std::span<fcomplex> part(matrix + static_cast<int64_t>(first) * z.padded,
-                                     static_cast<std::size_t>(count) * z.padded);
-      dsp::pfft_c(full ? forward : forwardTail, part);
-      for (int32_t r = 0; r < count; ++r) {
-        fcomplex* x = part.data() + static_cast<int64_t>(r) * z.padded;
-        for (int32_t k = 0; k < z.padded; ++k) {
-          const double xr = x[k].real(), xi = x[k].imag();
-          const double hr = h[k].real(), hi = h[k].imag();
-          x[k] = fcomplex(static_cast<float>(xr * hr - xi * hi), static_cast<float>(xi * hr + xr * hi));
-        }
+      const auto size = static_cast<std::size_t>(count) * z.padded;
+      fcomplex* source = matrix + static_cast<int64_t>(first) * z.padded;
+      if (!direct) {
+        correlate(std::span<fcomplex>(source, size), count);
+        return;
       }
-      dsp::pfft_c(full ? backward : backwardTail, part);
+      dsp::cvector& own = scratch[static_cast<std::size_t>(omp_get_thread_num())];
+      if (own.size() < static_cast<std::size_t>(kGroup) * z.padded) own.resize(static_cast<std::size_t>(kGroup) * z.padded);
+      std::copy(source, source + size, own.begin());
+      correlate(std::span<fcomplex>(own.data(), size), count);
+      for (int32_t r = 0; r < count; ++r)
+        place_row(matrix, first + r, own.data() + static_cast<int64_t>(r) * z.padded, z, shifts);
     });
     failure.rethrow();
+    if (!direct) repack_rows(matrix, start, stop, z, shifts);
     const double done = static_cast<double>(block) * blockLines + stop;
     progress_update(100.0 * done / (static_cast<double>(blockCount) * std::max(blockLines, 1)));
   }
-
-  repack_rows(matrix, rows, z, shifts);
 }
 
 // Offset in samples of the replica's first sample from the leading edge of the pulse. The
