@@ -22,49 +22,42 @@ OrtogState& ortog_state() {
   return state;
 }
 
-namespace {
-
-// Sums of one line's samples and of their squares and products, each over four interleaved
-// lanes added in a fixed order: the same bytes whatever thread computes them.
-struct Moments {
-  double i = 0.0, q = 0.0, ii = 0.0, qq = 0.0, iq = 0.0;
-};
-
-Moments line_moments(const std::complex<float>* x, int32_t samples) {
-  double a[5][4] = {};
-  int32_t k = 0;
-  for (; k + 4 <= samples; k += 4) {
-    for (int j = 0; j < 4; ++j) {
-      const double i = x[k + j].real(), q = x[k + j].imag();
-      a[0][j] += i;
-      a[1][j] += q;
-      a[2][j] += i * i;
-      a[3][j] += q * q;
-      a[4][j] += i * q;
-    }
+// The sums are in double precision; the vector reduction fixes its order of additions at
+// compile time, so a line gives the same sums whatever thread takes it.
+OrtogMoments ortog_moments(const std::complex<float>* x, int32_t samples) {
+  const float* f = reinterpret_cast<const float*>(x);
+  double si = 0.0, sq = 0.0, sii = 0.0, sqq = 0.0, siq = 0.0;
+#pragma omp simd reduction(+ : si, sq, sii, sqq, siq)
+  for (int32_t k = 0; k < samples; ++k) {
+    const double i = f[2 * k], q = f[2 * k + 1];
+    si += i;
+    sq += q;
+    sii += i * i;
+    sqq += q * q;
+    siq += i * q;
   }
-  for (int j = 0; k < samples; ++k, ++j) {
-    const double i = x[k].real(), q = x[k].imag();
-    a[0][j] += i;
-    a[1][j] += q;
-    a[2][j] += i * i;
-    a[3][j] += q * q;
-    a[4][j] += i * q;
-  }
-  const auto sum = [](const double* v) { return (v[0] + v[1]) + (v[2] + v[3]); };
-  return {sum(a[0]), sum(a[1]), sum(a[2]), sum(a[3]), sum(a[4])};
+  return {si, sq, sii, sqq, siq};
 }
 
-// What one line gets: its means taken off, Q scaled by `gain`, then Q' = (Q - I s) inv.
-struct Correction {
-  bool apply = false;
-  float meanI = 0.0f, meanQ = 0.0f;
-  double gain = 1.0;
-  bool rotate = false;
-  double s = 0.0, inv = 1.0;
-};
-
-}  // namespace
+void ortog_apply(std::complex<float>* line, int32_t samples, const OrtogCorrection& c) {
+  if (!c.apply) return;
+  float* x = reinterpret_cast<float*>(line);
+  if (c.rotate) {
+#pragma omp simd
+    for (int32_t k = 0; k < samples; ++k) {
+      const float i = x[2 * k] - c.meanI;
+      const auto q = static_cast<float>(static_cast<double>(x[2 * k + 1] - c.meanQ) * c.gain);
+      x[2 * k] = i;
+      x[2 * k + 1] = static_cast<float>((static_cast<double>(q) - static_cast<double>(i) * c.s) * c.inv);
+    }
+  } else {
+#pragma omp simd
+    for (int32_t k = 0; k < samples; ++k) {
+      x[2 * k] -= c.meanI;
+      x[2 * k + 1] = static_cast<float>(static_cast<double>(x[2 * k + 1] - c.meanQ) * c.gain);
+    }
+  }
+}
 
 // Per line: remove the DC bias of both channels, equalise Q's gain to I's, then take out the
 // angle between the channels by Gram-Schmidt (I kept, Q' = (Q - I sin a) / cos a). A pure
@@ -76,20 +69,19 @@ struct Correction {
 // operations a line), and the corrections are applied in parallel again. The energies and the
 // correlation of the corrected channels follow from the sums of the raw samples by expanding
 // the squares.
-int ortogN(std::span<std::complex<float>> matrix, int32_t pitch, int32_t samples, int32_t lines, int32_t block) {
+void ortog_corrections(std::span<const OrtogMoments> lines, int32_t samples, int32_t block,
+                       std::span<OrtogCorrection> out) {
   OrtogState& st = ortog_state();
   if (block == 0) st.first = true;
-  if (samples <= 0 || lines <= 0) return 0;
   const double n = samples;
-  const auto row = [&](int32_t l) { return matrix.data() + static_cast<std::ptrdiff_t>(l) * pitch; };
-  std::vector<Moments> moments(static_cast<std::size_t>(lines));
-#pragma omp parallel for schedule(static)
-  for (int32_t l = 0; l < lines; ++l) moments[static_cast<std::size_t>(l)] = line_moments(row(l), samples);
-
-  std::vector<Correction> corrections(static_cast<std::size_t>(lines));
-  for (int32_t l = 0; l < lines; ++l) {
-    const Moments& m = moments[static_cast<std::size_t>(l)];
-    Correction& c = corrections[static_cast<std::size_t>(l)];
+  for (std::size_t l = 0; l < lines.size() && l < out.size(); ++l) {
+    const OrtogMoments& sums = lines[l];
+    const struct {
+      double i, q, ii, qq, iq;
+    } m{sums[0], sums[1], sums[2], sums[3], sums[4]};
+    OrtogCorrection& c = out[l];
+    c = OrtogCorrection{};
+    if (samples <= 0) continue;
     if (st.first) st = OrtogState{};
     const double mI = m.i / n, mQ = m.q / n;
     if (mI == 0.0) continue;
@@ -126,19 +118,19 @@ int ortogN(std::span<std::complex<float>> matrix, int32_t pitch, int32_t samples
     }
     st.first = false;
   }
+}
 
+int ortogN(std::span<std::complex<float>> matrix, int32_t pitch, int32_t samples, int32_t lines, int32_t block) {
+  if (block == 0) ortog_state().first = true;
+  if (samples <= 0 || lines <= 0) return 0;
+  const auto row = [&](int32_t l) { return matrix.data() + static_cast<std::ptrdiff_t>(l) * pitch; };
+  std::vector<OrtogMoments> moments(static_cast<std::size_t>(lines));
 #pragma omp parallel for schedule(static)
-  for (int32_t l = 0; l < lines; ++l) {
-    const Correction& c = corrections[static_cast<std::size_t>(l)];
-    if (!c.apply) continue;
-    std::complex<float>* x = row(l);
-    for (int32_t k = 0; k < samples; ++k) {
-      const float i = x[k].real() - c.meanI;
-      float q = static_cast<float>(static_cast<double>(x[k].imag() - c.meanQ) * c.gain);
-      if (c.rotate) q = static_cast<float>((static_cast<double>(q) - static_cast<double>(i) * c.s) * c.inv);
-      x[k] = {i, q};
-    }
-  }
+  for (int32_t l = 0; l < lines; ++l) moments[static_cast<std::size_t>(l)] = ortog_moments(row(l), samples);
+  std::vector<OrtogCorrection> corrections(static_cast<std::size_t>(lines));
+  ortog_corrections(moments, samples, block, corrections);
+#pragma omp parallel for schedule(static)
+  for (int32_t l = 0; l < lines; ++l) ortog_apply(row(l), samples, corrections[static_cast<std::size_t>(l)]);
   return 0;
 }
 

@@ -87,7 +87,7 @@ int load_lines(RawLines& in, const sarpar& par, const procparm& proc, const Rang
 // within its reserved room (so it never moves) and each chunk is freed once copied: the store
 // and the matrix never both hold the whole scene.
 int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, const RangeSizes& z, dsp::cvector& rows,
-               int32_t* shifts) {
+               int32_t* shifts, OrtogMoments* sums) {
   const int32_t lines = par.lines;
   const std::size_t sampleBytes = 8 * static_cast<std::size_t>(z.rawSamples);
   if (store.line_bytes() != 4 + sampleBytes || store.lines() < lines) {
@@ -112,6 +112,7 @@ int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, co
       fcomplex* row = matrix + static_cast<int64_t>(i) * z.padded;
       std::memcpy(static_cast<void*>(row), store.line(i) + 4, sampleBytes);
       std::fill(row + z.rawSamples, row + z.padded, fcomplex{});
+      if (sums) sums[i] = ortog_moments(row, z.rawSamples);
     }
     store.release_below(stop);
   }
@@ -151,12 +152,29 @@ void repack_rows(fcomplex* matrix, int32_t from, int32_t to, const RangeSizes& z
   }
 }
 
+// The quadrature repair's corrections for `rows` raw rows of pitch L (block `block` of the
+// stage): their sums in parallel, then the running averages in order. The corrections are
+// applied by compress_rows.
+std::vector<OrtogCorrection> ortog_plan(const fcomplex* matrix, const RangeSizes& z, int32_t rows, int32_t block,
+                                        std::vector<OrtogMoments> moments = {}) {
+  if (moments.size() != static_cast<std::size_t>(rows)) {
+    moments.assign(static_cast<std::size_t>(rows), OrtogMoments{});
+#pragma omp parallel for schedule(static)
+    for (int32_t l = 0; l < rows; ++l)
+      moments[static_cast<std::size_t>(l)] = ortog_moments(matrix + static_cast<int64_t>(l) * z.padded, z.rawSamples);
+  }
+  std::vector<OrtogCorrection> corrections(static_cast<std::size_t>(rows));
+  ortog_corrections(moments, z.rawSamples, block, corrections);
+  return corrections;
+}
+
 // Correlates `rows` rows of pitch L with the replica and repacks them at the output pitch:
 // row i moves from i L to i (V + W), `shift` zeros first, then the V valid lags, then zeros.
 // The repacking runs in row order in place: row i's destination never reaches past its own
 // source, so each row is copied out before it can be overwritten.
 void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const dsp::cvector& replicaSpectrum,
-                   const int32_t* shifts, int32_t block, int32_t blockLines, int32_t blockCount) {
+                   const int32_t* shifts, const OrtogCorrection* corrections, int32_t block, int32_t blockLines,
+                   int32_t blockCount) {
   if (rows <= 0) return;
   // Forward transform, multiply and inverse run on a few rows at a time while they are in
   // cache, instead of three passes over the whole matrix. A row's bytes do not depend on the
@@ -171,8 +189,12 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
     dsp::fft_makep_c(backwardTail, z.padded, z.padded, tail, tail, -1, 0, 1);
   }
   const fcomplex* h = replicaSpectrum.data();
-  const auto correlate = [&](std::span<fcomplex> part, int32_t count) {
+  // The quadrature repair of each row rides on the transforms' pass, while the row is in cache.
+  const auto correlate = [&](std::span<fcomplex> part, int32_t first, int32_t count) {
     const bool full = count == kGroup;
+    if (corrections)
+      for (int32_t r = 0; r < count; ++r)
+        ortog_apply(part.data() + static_cast<int64_t>(r) * z.padded, z.rawSamples, corrections[first + r]);
     dsp::pfft_c(full ? forward : forwardTail, part);
     for (int32_t r = 0; r < count; ++r) {
       fcomplex* x = part.data() + static_cast<int64_t>(r) * z.padded;
@@ -202,13 +224,13 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
       const auto size = static_cast<std::size_t>(count) * z.padded;
       fcomplex* source = matrix + static_cast<int64_t>(first) * z.padded;
       if (!direct) {
-        correlate(std::span<fcomplex>(source, size), count);
+        correlate(std::span<fcomplex>(source, size), first, count);
         return;
       }
       dsp::cvector& own = scratch[static_cast<std::size_t>(omp_get_thread_num())];
       if (own.size() < static_cast<std::size_t>(kGroup) * z.padded) own.resize(static_cast<std::size_t>(kGroup) * z.padded);
       std::copy(source, source + size, own.begin());
-      correlate(std::span<fcomplex>(own.data(), size), count);
+      correlate(std::span<fcomplex>(own.data(), size), first, count);
       for (int32_t r = 0; r < count; ++r)
         place_row(matrix, first + r, own.data() + static_cast<int64_t>(r) * z.padded, z, shifts);
     });
@@ -305,7 +327,10 @@ int init_buffer(const sarpar& par, procparm& proc) {
   int st = 0;
   if (proc.rawLines) {
     // The extraction kept the lines in memory: no line file exists.
-    st = load_store(*proc.rawLines, par, proc, z, proc.matrix, proc.lineShifts.data());
+    // The sums of the quadrature repair are taken while each line is in cache.
+    proc.rawSums.assign(proc.Flag_ortog ? static_cast<std::size_t>(par.lines) : 0, OrtogMoments{});
+    st = load_store(*proc.rawLines, par, proc, z, proc.matrix, proc.lineShifts.data(),
+                    proc.Flag_ortog ? proc.rawSums.data() : nullptr);
     proc.rawLines.reset();
   } else {
     proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
@@ -351,10 +376,12 @@ int rangefoc(const sarpar& par, procparm& proc) {
   progress_open("Range Focusing");
 
   if (core) {
-    if (proc.Flag_ortog) {
-      if (int st = frame.check(ortogN(proc.matrix, z.padded, z.rawSamples, lines, 0))) return st;
-    }
-    compress_rows(proc.matrix.data(), lines, z, h, proc.lineShifts.data(), 0, lines, 1);
+    const std::vector<OrtogCorrection> repair =
+        proc.Flag_ortog ? ortog_plan(proc.matrix.data(), z, lines, 0, std::move(proc.rawSums))
+                        : std::vector<OrtogCorrection>();
+    proc.rawSums = {};
+    compress_rows(proc.matrix.data(), lines, z, h, proc.lineShifts.data(), proc.Flag_ortog ? repair.data() : nullptr,
+                  0, lines, 1);
     proc.matrix.resize(static_cast<std::size_t>(lines) * z.output);
     block_counters().current = 1;
     progress_update(100.0);
@@ -371,10 +398,10 @@ int rangefoc(const sarpar& par, procparm& proc) {
     block_counters().current = b + 1;
     if (n == 0) continue;
     if (int st = load_lines(in, par, proc, z, b * blockLines, n, matrix.data(), shifts.data())) return frame.check(st);
-    if (proc.Flag_ortog) {
-      if (int st = frame.check(ortogN(matrix, z.padded, z.rawSamples, n, b))) return st;
-    }
-    compress_rows(matrix.data(), n, z, h, shifts.data(), b, blockLines, shownBlocks);
+    const std::vector<OrtogCorrection> repair =
+        proc.Flag_ortog ? ortog_plan(matrix.data(), z, n, b) : std::vector<OrtogCorrection>();
+    compress_rows(matrix.data(), n, z, h, shifts.data(), proc.Flag_ortog ? repair.data() : nullptr, b, blockLines,
+                  shownBlocks);
     out.write(matrix.data(), static_cast<int64_t>(n) * z.output);
   }
   out.commit();
