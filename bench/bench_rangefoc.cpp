@@ -39,6 +39,7 @@ void setup(sar::stripmap::sarpar& par, sar::stripmap::procparm& proc, int lines)
   proc.replicaLength = kReplica;
   proc.Flag_incore = 1;
   proc.Flag_swstal = 1;
+  proc.Flag_ortog = 1;  // as the IM job runs it
 }
 
 void BM_RangeCompression(benchmark::State& state) {

@@ -41,45 +41,60 @@ if [ -z "${SAR_BENCH_NO_BOUND:-}" ] && [ -x "$bound_sh" ]; then
   bound_1T=$(printf '%s\n' "$bound_out" | awk '/^bound 1T:/ {print $3}')
 fi
 
-input="$work/input_${lines}x${samples}"
-if ! ls "$input"/ASA_IM__0*.N1 >/dev/null 2>&1; then
-  rm -rf "$input"
-  mkdir -p "$input"
-  echo "== simulating ${lines} x ${samples} (clutter and point targets)"
-  "$build/tools/sarsim" --out "$input" --lines "$lines" --samples "$samples" --noise 0 --clutter-db 25 \
-    --clutter-contrast low --yaw-steering on --target 45.000,10.000,0,40 --target 45.010,10.030,0,40 \
-    --target 44.992,9.985,100,35 >/dev/null
-fi
-product=$(ls "$input"/ASA_IM__0*.N1)
-orbit=$(ls "$input"/DOR_VOR_AX*)
-ins=$(ls "$input"/ASA_INS_AX*)
-xca=$(ls "$input"/ASA_XCA_AX*)
+# Simulates a scene of $1 lines once (kept for later runs) and sets product, orbit, ins, xca.
+simulate() {
+  local n="$1"
+  local input="$work/input_${n}x${samples}"
+  if ! ls "$input"/ASA_IM__0*.N1 >/dev/null 2>&1; then
+    rm -rf "$input"
+    mkdir -p "$input"
+    echo "== simulating ${n} x ${samples} (clutter and point targets)"
+    "$build/tools/sarsim" --out "$input" --lines "$n" --samples "$samples" --noise 0 --clutter-db 25 \
+      --clutter-contrast low --yaw-steering on --target 45.000,10.000,0,40 --target 45.010,10.030,0,40 \
+      --target 44.992,9.985,100,35 >/dev/null
+  fi
+  product=$(ls "$input"/ASA_IM__0*.N1)
+  orbit=$(ls "$input"/DOR_VOR_AX*)
+  ins=$(ls "$input"/ASA_INS_AX*)
+  xca=$(ls "$input"/ASA_XCA_AX*)
+}
 
 job="$work/job"
 exe="${SAR_FOCUSSING:-$build/src/jobs/focussing}"  # another build of the engine to compare
 
+# Runs the job once on the simulated product with $1 threads; sets wall, cpu, peak_kb and the
+# work files the run left beside its products.
+run_job() {
+  local threads="$1" status
+  # A fresh working directory for each run: a finished job deletes its working file.
+  rm -rf "$job"
+  "$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
+    --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
+  sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
+  set +e
+  OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_IM#$job/job.txt" \
+    2>"$job/time.txt" >/dev/null
+  status=$?
+  set -e
+  if [ "$status" -ne 0 ]; then
+    echo "im_job_full: the job failed with status $status" >&2
+    cat "$job/Vanterra.working_error" >&2 || true
+    exit 1
+  fi
+  wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
+    "$job/time.txt")
+  peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
+  cpu=$(awk -F': ' '/User time/ {u = $2} /System time/ {s = $2} END {printf "%.2f", u + s}' "$job/time.txt")
+  leftover=$(cd "$job" && ls -d EXTR* DCEST_resume.txt 2>/dev/null | tr '\n' ' ' || true)
+}
+
+simulate "$lines"
 summary=""
+declare -A wall_of=()
 for threads in "${thread_counts[@]}"; do
-# A fresh working directory for each run: a finished job deletes its working file.
-rm -rf "$job"
-"$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
-  --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
-sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
 echo "== focussing (${threads} threads)"
-set +e
-OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_IM#$job/job.txt" \
-  2>"$job/time.txt" >/dev/null
-status=$?
-set -e
-if [ "$status" -ne 0 ]; then
-  echo "im_job_full: the job failed with status $status" >&2
-  cat "$job/Vanterra.working_error" >&2 || true
-  exit 1
-fi
-wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
-  "$job/time.txt")
-peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
-cpu=$(awk -F': ' '/User time/ {u = $2} /System time/ {s = $2} END {printf "%.2f", u + s}' "$job/time.txt")
+run_job "$threads"
+wall_of[$threads]="$wall"
 
 echo "== bare transforms of the same scene"
 bare=$(SAR_BENCH_LINES="$lines" SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="$threads" \
@@ -94,6 +109,7 @@ echo
 echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
 grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
+echo "  work files left      ${leftover:-none}"
 line=$(awk -v w="$wall" -v c="$cpu" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" -v b="$bound" -v t="$threads" 'BEGIN {
   bare = (r + a) / 1000.0
   printf "  wall time            %9.2f s\n", w
@@ -106,6 +122,24 @@ line=$(awk -v w="$wall" -v c="$cpu" -v p="$peak_kb" -v r="$range_ms" -v a="$azim
 echo "$line"
 summary+="${threads} threads: $(echo "$line" | awk '/wall time/ {w=$3} /peak memory/ {m=$3} /job \/ bound/ {r=$4} END {printf "wall %s s, peak %s GiB, job / bound %s", w, m, (r == "" ? "-" : r)}')"$'\n'
 done
+
+# The scaling line: the speed-up of 2 threads over 1 on the same scene, and half and quarter
+# scenes with 2 threads, whose time per line should match the whole scene's
+# (SAR_BENCH_SCALING=0 leaves it out).
+if [ "${SAR_BENCH_SCALING:-1}" != 0 ] && [ -n "${wall_of[2]:-}" ]; then
+  scaling="Scaling:"
+  [ -n "${wall_of[1]:-}" ] &&
+    scaling+=$(awk -v a="${wall_of[1]}" -v b="${wall_of[2]}" 'BEGIN {printf " 2 threads %.2f x 1 thread;", a / b}')
+  for part in 2 4; do
+    n=$(( lines / part ))
+    simulate "$n"
+    echo "== focussing ${n} lines (2 threads)"
+    run_job 2
+    scaling+=$(awk -v w="$wall" -v f="${wall_of[2]}" -v p="$part" -v n="$n" \
+      'BEGIN {printf " 1/%d scene (%d lines) %.2f s, %.2f x the whole scene per line;", p, n, w, (w * p) / f}')
+  done
+  summary+="${scaling%;}"$'\n'
+fi
 echo
 echo "== load at end: $(uptime | sed 's/.*load average: //')"
 echo "Summary (${lines} x ${samples}, Flag_incore ${incore}):"

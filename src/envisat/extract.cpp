@@ -65,6 +65,7 @@ struct ChannelState {
   int noisePackets = 0;
   double noisePower = 0.0;
   OutputFile out;
+  io::LineStore* store = nullptr;  // set: echo lines go here instead of `out`
   std::array<OutputFile, 4> cal;
 };
 
@@ -106,8 +107,14 @@ class Walker {
   void write_line(int channel, std::span<const float> samples) {
     ChannelState& s = state_[static_cast<std::size_t>(channel)];
     const float t = range_time(channel, s.currentSwst);
+    const std::size_t bytes = static_cast<std::size_t>(2 * par_[static_cast<std::size_t>(channel)].samples) * sizeof(float);
+    if (s.store) {
+      s.store->append(&t, sizeof t);
+      s.store->append(samples.data(), bytes);
+      return;
+    }
     s.out.write(&t, sizeof t);
-    s.out.write(samples.data(), static_cast<std::size_t>(2 * par_[static_cast<std::size_t>(channel)].samples) * sizeof(float));
+    s.out.write(samples.data(), bytes);
   }
   void side(int channel, int swst, int replaced, int counter) {
     const auto c = static_cast<std::size_t>(channel);
@@ -564,6 +571,9 @@ int extract_level0(const std::string& level0Path, const Level0Header& header, Li
     s.zeros.assign(2 * static_cast<std::size_t>(p.samples), 0.0f);
     if (conf.extract_kind == kExtractNoise) {
       s.out = OutputFile(p.noise_file);
+    } else if (conf.extract_kind == kExtractEchoes && conf.lines_in_memory && c < conf.line_stores.size()) {
+      conf.line_stores[c] = std::make_shared<io::LineStore>(4 + 8 * static_cast<std::size_t>(p.samples));
+      s.store = conf.line_stores[c].get();
     } else {
       const std::string path = !p.raw_file.empty() ? p.raw_file : p.extrPath;
       if (path.empty() || (p.raw_file.empty() && channels.size() > 1))

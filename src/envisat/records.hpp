@@ -3,9 +3,11 @@
 // product paths. The per-channel acquisition record is the sensor-neutral `metadata::sarpar`.
 #include <array>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
 
+#include "io/line_store.hpp"
 #include "metadata/acquisition.hpp"
 
 namespace sar::envisat {
@@ -26,6 +28,10 @@ struct extconf {
   std::array<std::vector<int32_t>, 2> line_swst;      // SWST code in force
   std::array<std::vector<int32_t>, 2> line_replaced;  // 1: filled, padded or calibration stand-in
   std::array<std::vector<int32_t>, 2> line_counter;   // mode packet counter of a genuine line, else 0
+  // When the whole scene is processed in memory, the echo lines of each channel are kept in a
+  // store instead of its line file and go straight on to range compression.
+  bool lines_in_memory = false;
+  std::array<std::shared_ptr<io::LineStore>, 2> line_stores;  // result, with lines_in_memory
 };
 
 /// The product paths of a job: level 0 product, ASA_INS, ASA_XCA, the ASA_XCH slot (which the

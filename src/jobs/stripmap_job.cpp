@@ -306,9 +306,14 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
     // The whole product, echoes only; the side tables live as long as the job.
     extconf extra;
     extra.extract_kind = envisat::kExtractEchoes;
+    // With the scene in memory the raw lines go to range compression without a line file.
+    extra.lines_in_memory = incore && flags[kStageRangeFocus] != 0;
     if (envi_extract(files, pars, extra) != 0)
       base::fatal(base::ec::kStageFailed, {processorDetail, failed_stage()});
-    for (std::size_t i = 0; i < channels.size(); ++i) channels[i].par = pars[i];
+    for (std::size_t i = 0; i < channels.size(); ++i) {
+      channels[i].par = pars[i];
+      if (i < extra.line_stores.size()) channels[i].proc.rawLines = std::move(extra.line_stores[i]);
+    }
   }
   const StageChain<StripmapChannel> chain = stripmap_chain(flags, files, incore);
   for (std::size_t i = 0; i < channels.size(); ++i) {

@@ -1,12 +1,14 @@
 #pragma once
 // The record that carries a stripmap job from stage to stage, and the azimuth configuration.
 #include <array>
+#include <memory>
 #include <complex>
 #include <string>
 #include <cstdint>
 #include <vector>
 
 #include "dsp/fft.hpp"
+#include "io/line_store.hpp"
 #include "metadata/scene_references.hpp"
 
 namespace sar::stripmap {
@@ -52,6 +54,12 @@ struct procparm : metadata::SceneReferences {
   dsp::cvector matrix;
   // Per line: window start offset in samples against the earliest window.
   std::vector<int32_t> lineShifts;
+  // Core mode: the raw lines as the extraction left them in memory (no line file); init_buffer
+  // takes them out and lets the store go.
+  std::shared_ptr<io::LineStore> rawLines;
+  // Core mode with the quadrature repair: the sums of each raw line (I, Q, I^2, Q^2, I Q), taken
+  // by init_buffer while the line passes through the cache, for rangefoc.
+  std::vector<std::array<double, 5>> rawSums;
   int32_t Azblk = 0;
   double equivalentVelocity = 0.0;   // m/s, at the scene's first block
   double azimuthPixelSpacing = 0.0;  // velocity / PRF, m

@@ -6,12 +6,15 @@
 #include <cstring>
 #include <string>
 
+#include <omp.h>
+
 #include "base/convert.hpp"
 #include "base/diagnostics.hpp"
 #include "base/parallel.hpp"
 #include "base/errors.hpp"
 #include "stripmap/progress.hpp"
 #include "stripmap/raster_files.hpp"
+#include "io/line_store.hpp"
 #include "dsp/fft.hpp"
 
 namespace sar::stripmap {
@@ -78,12 +81,100 @@ int load_lines(RawLines& in, const sarpar& par, const procparm& proc, const Rang
   return 0;
 }
 
+// The raw lines from the extraction's store into rows of pitch L of `matrix` (the tail of each
+// row zeroed). The shifts come first, so a broken line refuses the product before any copying;
+// the copies then run in parallel a store chunk at a time. The matrix grows by the chunk's rows
+// within its reserved room (so it never moves) and each chunk is freed once copied: the store
+// and the matrix never both hold the whole scene.
+int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, const RangeSizes& z, dsp::cvector& rows,
+               int32_t* shifts, OrtogMoments* sums) {
+  const int32_t lines = par.lines;
+  const std::size_t sampleBytes = 8 * static_cast<std::size_t>(z.rawSamples);
+  if (store.line_bytes() != 4 + sampleBytes || store.lines() < lines) {
+    reject(base::format_text("Range focusing: the extracted lines in memory (%lld of %zu bytes) do not hold %d lines of %d samples",
+                             static_cast<long long>(store.lines()), store.line_bytes(), lines, z.rawSamples));
+    return kRejected;
+  }
+  for (int32_t i = 0; i < lines; ++i) {
+    float t = 0.0f;
+    std::memcpy(&t, store.line(i), sizeof t);
+    if (int st = line_shift(par, proc, z, t, i, shifts[i])) return st;
+  }
+  const auto step = static_cast<int32_t>(std::min<std::size_t>(store.lines_per_chunk(), static_cast<std::size_t>(lines)));
+  rows.clear();
+  rows.reserve(static_cast<std::size_t>(lines) * static_cast<std::size_t>(z.padded));
+  for (int32_t start = 0; start < lines; start += step) {
+    const int32_t stop = std::min(lines, start + step);
+    rows.resize(static_cast<std::size_t>(stop) * static_cast<std::size_t>(z.padded));
+    fcomplex* matrix = rows.data();
+#pragma omp parallel for schedule(static)
+    for (int32_t i = start; i < stop; ++i) {
+      fcomplex* row = matrix + static_cast<int64_t>(i) * z.padded;
+      std::memcpy(static_cast<void*>(row), store.line(i) + 4, sampleBytes);
+      std::fill(row + z.rawSamples, row + z.padded, fcomplex{});
+      if (sums) sums[i] = ortog_moments(row, z.rawSamples);
+    }
+    store.release_below(stop);
+  }
+  return 0;
+}
+
+// Moves rows [from, to) of pitch L to pitch V + W in place, the rows before `from` being done:
+// row r gets `shift` zeros, its V valid lags, then zeros. Row r's destination ends at
+// (r + 1)(V + W) <= (r + 1) L, before the source of any later row, so only the sources of
+// earlier rows can lie under it. A run of rows [r, e) whose destinations all end before the
+// source of row r, e (V + W) <= r L, can therefore be copied in parallel once the rows before r
+// are done; the runs grow geometrically, so only the first rows (about (V + W) / (L - V - W)
+// of them) go one by one, through a copy of the line.
+void place_row(fcomplex* matrix, int32_t r, const fcomplex* valid, const RangeSizes& z, const int32_t* shifts) {
+  fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
+  const int32_t s = shifts ? shifts[r] : 0;
+  std::fill(dst, dst + s, fcomplex{});
+  std::copy(valid, valid + z.valid, dst + s);
+  std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
+}
+
+void repack_rows(fcomplex* matrix, int32_t from, int32_t to, const RangeSizes& z, const int32_t* shifts) {
+  std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
+  for (int32_t r = from; r < to;) {
+    const int64_t end = static_cast<int64_t>(r) * z.padded / std::max(z.output, 1);
+    const int32_t e = static_cast<int32_t>(std::min<int64_t>(to, end));
+    if (e - r < 2) {
+      const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
+      std::copy(src, src + z.valid, line.begin());
+      place_row(matrix, r, line.data(), z, shifts);
+      ++r;
+      continue;
+    }
+#pragma omp parallel for schedule(static)
+    for (int32_t q = r; q < e; ++q) place_row(matrix, q, matrix + static_cast<int64_t>(q) * z.padded, z, shifts);
+    r = e;
+  }
+}
+
+// The quadrature repair's corrections for `rows` raw rows of pitch L (block `block` of the
+// stage): their sums in parallel, then the running averages in order. The corrections are
+// applied by compress_rows.
+std::vector<OrtogCorrection> ortog_plan(const fcomplex* matrix, const RangeSizes& z, int32_t rows, int32_t block,
+                                        std::vector<OrtogMoments> moments = {}) {
+  if (moments.size() != static_cast<std::size_t>(rows)) {
+    moments.assign(static_cast<std::size_t>(rows), OrtogMoments{});
+#pragma omp parallel for schedule(static)
+    for (int32_t l = 0; l < rows; ++l)
+      moments[static_cast<std::size_t>(l)] = ortog_moments(matrix + static_cast<int64_t>(l) * z.padded, z.rawSamples);
+  }
+  std::vector<OrtogCorrection> corrections(static_cast<std::size_t>(rows));
+  ortog_corrections(moments, z.rawSamples, block, corrections);
+  return corrections;
+}
+
 // Correlates `rows` rows of pitch L with the replica and repacks them at the output pitch:
 // row i moves from i L to i (V + W), `shift` zeros first, then the V valid lags, then zeros.
 // The repacking runs in row order in place: row i's destination never reaches past its own
 // source, so each row is copied out before it can be overwritten.
 void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const dsp::cvector& replicaSpectrum,
-                   const int32_t* shifts, int32_t block, int32_t blockLines, int32_t blockCount) {
+                   const int32_t* shifts, const OrtogCorrection* corrections, int32_t block, int32_t blockLines,
+                   int32_t blockCount) {
   if (rows <= 0) return;
   // Forward transform, multiply and inverse run on a few rows at a time while they are in
   // cache, instead of three passes over the whole matrix. A row's bytes do not depend on the
@@ -98,43 +189,55 @@ void compress_rows(fcomplex* matrix, int32_t rows, const RangeSizes& z, const ds
     dsp::fft_makep_c(backwardTail, z.padded, z.padded, tail, tail, -1, 0, 1);
   }
   const fcomplex* h = replicaSpectrum.data();
+  // The quadrature repair of each row rides on the transforms' pass, while the row is in cache.
+  const auto correlate = [&](std::span<fcomplex> part, int32_t first, int32_t count) {
+    const bool full = count == kGroup;
+    if (corrections)
+      for (int32_t r = 0; r < count; ++r)
+        ortog_apply(part.data() + static_cast<int64_t>(r) * z.padded, z.rawSamples, corrections[first + r]);
+    dsp::pfft_c(full ? forward : forwardTail, part);
+    for (int32_t r = 0; r < count; ++r) {
+      fcomplex* x = part.data() + static_cast<int64_t>(r) * z.padded;
+      for (int32_t k = 0; k < z.padded; ++k) {
+        const double xr = x[k].real(), xi = x[k].imag();
+        const double hr = h[k].real(), hi = h[k].imag();
+        x[k] = fcomplex(static_cast<float>(xr * hr - xi * hi), static_cast<float>(xi * hr + xr * hi));
+      }
+    }
+    dsp::pfft_c(full ? backward : backwardTail, part);
+  };
+  // One aligned group of rows per thread: a row is transformed there and goes straight to its
+  // place at the output pitch, which saves the repacking pass over the matrix. That is safe for
+  // a window whose destinations all end before its first source (the windows before it being
+  // done); the first windows of a matrix are transformed in place and repacked.
+  std::vector<dsp::cvector> scratch(static_cast<std::size_t>(std::max(omp_get_max_threads(), 1)));
   base::ParallelFailure failure;
   constexpr int32_t kWindow = 64 * kGroup;  // lines between two progress reports
   for (int32_t start = 0; start < rows; start += kWindow) {
     const int32_t stop = std::min(rows, start + kWindow);
     const int32_t groups = (stop - start + kGroup - 1) / kGroup;
+    const bool direct = static_cast<int64_t>(stop) * z.output <= static_cast<int64_t>(start) * z.padded;
 #pragma omp parallel for schedule(static)
     for (int32_t g = 0; g < groups; ++g) failure.run([&] {
       const int32_t first = start + g * kGroup;
       const int32_t count = std::min(kGroup, stop - first);
-      const bool full = count == kGroup;
-      const std::span<fcomplex> part(matrix + static_cast<int64_t>(first) * z.padded,
-                                     static_cast<std::size_t>(count) * z.padded);
-      dsp::pfft_c(full ? forward : forwardTail, part);
-      for (int32_t r = 0; r < count; ++r) {
-        fcomplex* x = part.data() + static_cast<int64_t>(r) * z.padded;
-        for (int32_t k = 0; k < z.padded; ++k) {
-          const double xr = x[k].real(), xi = x[k].imag();
-          const double hr = h[k].real(), hi = h[k].imag();
-          x[k] = fcomplex(static_cast<float>(xr * hr - xi * hi), static_cast<float>(xi * hr + xr * hi));
-        }
+      const auto size = static_cast<std::size_t>(count) * z.padded;
+      fcomplex* source = matrix + static_cast<int64_t>(first) * z.padded;
+      if (!direct) {
+        correlate(std::span<fcomplex>(source, size), first, count);
+        return;
       }
-      dsp::pfft_c(full ? backward : backwardTail, part);
+      dsp::cvector& own = scratch[static_cast<std::size_t>(omp_get_thread_num())];
+      if (own.size() < static_cast<std::size_t>(kGroup) * z.padded) own.resize(static_cast<std::size_t>(kGroup) * z.padded);
+      std::copy(source, source + size, own.begin());
+      correlate(std::span<fcomplex>(own.data(), size), first, count);
+      for (int32_t r = 0; r < count; ++r)
+        place_row(matrix, first + r, own.data() + static_cast<int64_t>(r) * z.padded, z, shifts);
     });
     failure.rethrow();
+    if (!direct) repack_rows(matrix, start, stop, z, shifts);
     const double done = static_cast<double>(block) * blockLines + stop;
     progress_update(100.0 * done / (static_cast<double>(blockCount) * std::max(blockLines, 1)));
-  }
-
-  std::vector<fcomplex> line(static_cast<std::size_t>(z.valid));
-  for (int32_t r = 0; r < rows; ++r) {
-    const fcomplex* src = matrix + static_cast<int64_t>(r) * z.padded;
-    std::copy(src, src + z.valid, line.begin());
-    fcomplex* dst = matrix + static_cast<int64_t>(r) * z.output;
-    const int32_t s = shifts ? shifts[r] : 0;
-    std::fill(dst, dst + s, fcomplex{});
-    std::copy(line.begin(), line.end(), dst + s);
-    std::fill(dst + s + z.valid, dst + z.output, fcomplex{});
   }
 }
 
@@ -221,9 +324,20 @@ int init_buffer(const sarpar& par, procparm& proc) {
   proc.rangeSamples = z.output;
   proc.lines = par.lines;
   proc.lineShifts.assign(static_cast<std::size_t>(par.lines), 0);
-  proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
-  RawLines in(raw_path(par), par.lines, par.samples);
-  if (int st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data())) {
+  int st = 0;
+  if (proc.rawLines) {
+    // The extraction kept the lines in memory: no line file exists.
+    // The sums of the quadrature repair are taken while each line is in cache.
+    proc.rawSums.assign(proc.Flag_ortog ? static_cast<std::size_t>(par.lines) : 0, OrtogMoments{});
+    st = load_store(*proc.rawLines, par, proc, z, proc.matrix, proc.lineShifts.data(),
+                    proc.Flag_ortog ? proc.rawSums.data() : nullptr);
+    proc.rawLines.reset();
+  } else {
+    proc.matrix.assign(static_cast<std::size_t>(par.lines) * static_cast<std::size_t>(z.padded), fcomplex{});
+    RawLines in(raw_path(par), par.lines, par.samples);
+    st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data());
+  }
+  if (st != 0) {
     proc.matrix = dsp::cvector();
     proc.lineShifts.clear();
     return frame.check(st);
@@ -262,10 +376,12 @@ int rangefoc(const sarpar& par, procparm& proc) {
   progress_open("Range Focusing");
 
   if (core) {
-    if (proc.Flag_ortog) {
-      if (int st = frame.check(ortogN(proc.matrix, z.padded, z.rawSamples, lines, 0))) return st;
-    }
-    compress_rows(proc.matrix.data(), lines, z, h, proc.lineShifts.data(), 0, lines, 1);
+    const std::vector<OrtogCorrection> repair =
+        proc.Flag_ortog ? ortog_plan(proc.matrix.data(), z, lines, 0, std::move(proc.rawSums))
+                        : std::vector<OrtogCorrection>();
+    proc.rawSums = {};
+    compress_rows(proc.matrix.data(), lines, z, h, proc.lineShifts.data(), proc.Flag_ortog ? repair.data() : nullptr,
+                  0, lines, 1);
     proc.matrix.resize(static_cast<std::size_t>(lines) * z.output);
     block_counters().current = 1;
     progress_update(100.0);
@@ -282,10 +398,10 @@ int rangefoc(const sarpar& par, procparm& proc) {
     block_counters().current = b + 1;
     if (n == 0) continue;
     if (int st = load_lines(in, par, proc, z, b * blockLines, n, matrix.data(), shifts.data())) return frame.check(st);
-    if (proc.Flag_ortog) {
-      if (int st = frame.check(ortogN(matrix, z.padded, z.rawSamples, n, b))) return st;
-    }
-    compress_rows(matrix.data(), n, z, h, shifts.data(), b, blockLines, shownBlocks);
+    const std::vector<OrtogCorrection> repair =
+        proc.Flag_ortog ? ortog_plan(matrix.data(), z, n, b) : std::vector<OrtogCorrection>();
+    compress_rows(matrix.data(), n, z, h, shifts.data(), proc.Flag_ortog ? repair.data() : nullptr, b, blockLines,
+                  shownBlocks);
     out.write(matrix.data(), static_cast<int64_t>(n) * z.output);
   }
   out.commit();

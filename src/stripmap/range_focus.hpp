@@ -19,6 +19,7 @@
 // the whole matrix in procparm::matrix, at pitch L while raw and at pitch V + W after range
 // compression; `dest_buffer` writes the focused matrix at the end. Both modes give the same
 // samples bit for bit: the same transforms run on the same rows.
+#include <array>
 #include <complex>
 #include <cstdint>
 #include <span>
@@ -71,6 +72,26 @@ int imcutter_inv(const sarpar& par, const procparm& proc, const azimuthconf& az,
 /// channels, from running averages that carry over from block to block. A block index of 0
 /// starts the averages afresh. Returns 0.
 int ortogN(std::span<std::complex<float>> matrix, int32_t pitch, int32_t samples, int32_t lines, int32_t block);
+
+/// The quadrature repair in its three steps, so that its passes can ride on others over the
+/// same lines: the sums of each line (independent, any thread), the corrections from the
+/// running averages (over the lines in order, carrying over from block to block as ortogN
+/// does), and the correction of each line (independent). The energies and the correlation of
+/// the corrected channels follow from the sums of the raw samples by expanding the squares.
+/// ortogN is the three in a row.
+using OrtogMoments = std::array<double, 5>;  // sums of I, Q, I^2, Q^2, I Q
+/// What one line gets: its means taken off, Q scaled by `gain`, then Q' = (Q - I s) inv.
+struct OrtogCorrection {
+  bool apply = false;
+  bool rotate = false;
+  float meanI = 0.0f, meanQ = 0.0f;
+  double gain = 1.0;
+  double s = 0.0, inv = 1.0;
+};
+OrtogMoments ortog_moments(const std::complex<float>* line, int32_t samples);
+void ortog_corrections(std::span<const OrtogMoments> lines, int32_t samples, int32_t block,
+                       std::span<OrtogCorrection> out);
+void ortog_apply(std::complex<float>* line, int32_t samples, const OrtogCorrection& c);
 
 /// The running averages of ortogN (process-wide, so blocks must come in order).
 struct OrtogState {

@@ -218,6 +218,8 @@ constexpr long long kRawBytes = static_cast<long long>(kLines) * (kSamples * 8 +
 TEST_F(ImBadInput, FileSizeLimitEndsTheJobWithoutAProduct) {
   ScratchJob job("full_disk");
   const std::string cmd = prepare(job, *clean_);
+  // In file mode the extraction writes its line file, and the limit stops it there.
+  set_parameters(job.dir() / "des" / "parameters_IM.hdr", {{"Flag_incore", "0"}});
   // The job runs under /bin/sh, whose ulimit -f counts 512-byte blocks.
   const RunResult r = job.run(cmd, "", "ulimit -f " + std::to_string(kRawBytes / 2 / 512) + " &&");
   EXPECT_NE(r.status, 0) << r.err;
@@ -227,13 +229,14 @@ TEST_F(ImBadInput, FileSizeLimitEndsTheJobWithoutAProduct) {
 }
 
 // A real full disk, where the system allows mounting one: the output folder is a tmpfs with room
-// for the raw lines (which stay, as work files do) but not for the whole SLC.
+// for the small work files but not for the whole SLC (with the scene in memory the raw lines
+// never reach the disk).
 TEST_F(ImBadInput, FullFilesystemWhileWritingTheSlcLeavesNoProduct) {
   ScratchJob job("tmpfs");
   const std::string cmd = prepare(job, *clean_);
   const fs::path out = job.dir() / "out";
   fs::create_directories(out);
-  const std::string options = "size=" + std::to_string(kRawBytes + (1 << 20));
+  const std::string options = "size=" + std::to_string(1 << 19);
   if (::mount("tmpfs", out.c_str(), "tmpfs", 0, options.c_str()) != 0)
     GTEST_SKIP() << "no permission to mount a tmpfs here";
   const RunResult r = job.run(cmd);

@@ -1,6 +1,7 @@
 // Range compression against a direct correlation, the two storage modes, window alignment,
 // the quadrature repair and the refusals of bad sizes.
 #include <gtest/gtest.h>
+#include <omp.h>
 
 #include <cmath>
 #include <complex>
@@ -8,11 +9,13 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <memory>
 #include <random>
 #include <string>
 #include <vector>
 
 #include "base/errors.hpp"
+#include "io/line_store.hpp"
 #include "stripmap/range_focus.hpp"
 
 namespace fs = std::filesystem;
@@ -118,6 +121,20 @@ std::vector<cf> run_core_mode(Scene& s) {
   EXPECT_EQ(sar::stripmap::rangefoc(s.par, s.proc), 0);
   s.proc.Flag_incore = 0;
   return {s.proc.matrix.begin(), s.proc.matrix.end()};
+}
+
+// The line file's bytes handed over in memory, as the extraction does in core mode, in chunks
+// of `chunkLines` lines; the file itself is removed so that reading it would fail.
+std::shared_ptr<sar::io::LineStore> store_of(const Scene& s, std::size_t chunkLines, int lines) {
+  const std::size_t lineBytes = 4 + 8 * static_cast<std::size_t>(s.par.samples);
+  auto store = std::make_shared<sar::io::LineStore>(lineBytes, chunkLines * lineBytes);
+  std::ifstream in(s.par.extrPath, std::ios::binary);
+  std::vector<char> line(lineBytes);
+  for (int l = 0; l < lines && in.read(line.data(), static_cast<std::streamsize>(lineBytes)); ++l)
+    store->append(line.data(), lineBytes);
+  in.close();
+  fs::remove(s.par.extrPath);
+  return store;
 }
 
 }  // namespace
@@ -324,4 +341,46 @@ TEST(ImCutter, AcceptsInsideAndRefusesBeyondTheRawLines) {
   wanted.lines = 3000;
   wanted.samples = 4600;
   EXPECT_EQ(sar::stripmap::imcutter(par, proc, az, wanted, needed), 10);
+}
+
+// Lines handed over in memory give the file's samples bit for bit, whatever the chunks of the
+// store; a store that holds fewer lines than the product is refused, not read past.
+TEST(RangeFocus, LinesFromMemoryEqualFileModeBitForBit) {
+  for (const std::size_t chunkLines : {std::size_t{1}, std::size_t{7}, std::size_t{1000}}) {
+    SCOPED_TRACE(testing::Message() << chunkLines << " lines a chunk");
+    Scene s = make_scene("memfile", 40, 256, 41, 90, 13, 5);
+    s.proc.Flag_ortog = 1;
+    const auto file = run_file_mode(s);
+    Scene t = make_scene("memstore", 40, 256, 41, 90, 13, 5);
+    t.proc.Flag_ortog = 1;
+    t.proc.rawLines = store_of(t, chunkLines, 40);
+    const auto core = run_core_mode(t);
+    EXPECT_FALSE(t.proc.rawLines);  // the store is let go once read
+    ASSERT_EQ(file.size(), core.size());
+    EXPECT_EQ(0, std::memcmp(file.data(), core.data(), file.size() * sizeof(cf)));
+  }
+  Scene u = make_scene("memshort", 12, 128, 17, 40, 3, 2);
+  u.proc.rawLines = store_of(u, 4, 11);
+  EXPECT_EQ(sar::stripmap::init_buffer(u.par, u.proc), 10);
+  EXPECT_TRUE(u.proc.matrix.empty());
+}
+
+// A long matrix of short lines: past its first few windows core mode transforms each group of
+// rows aside and writes it straight at the output pitch, where file mode (blocks of Azblk lines)
+// transforms in place and repacks. Both give the same bytes, on one thread and on two.
+TEST(RangeFocus, LongMatrixRowsPlacedDirectlyEqualFileMode) {
+  Scene s = make_scene("longfile", 2600, 64, 17, 20, 1300, 5);
+  s.proc.Azblk = 1000;
+  s.proc.Flag_ortog = 1;
+  const auto file = run_file_mode(s);
+  for (const int threads : {1, 2}) {
+    SCOPED_TRACE(testing::Message() << threads << " threads");
+    omp_set_num_threads(threads);
+    Scene t = make_scene("longcore", 2600, 64, 17, 20, 1300, 5);
+    t.proc.Flag_ortog = 1;
+    const auto core = run_core_mode(t);
+    ASSERT_EQ(file.size(), core.size());
+    EXPECT_EQ(0, std::memcmp(file.data(), core.data(), file.size() * sizeof(cf)));
+  }
+  omp_set_num_threads(omp_get_num_procs());
 }
