@@ -203,8 +203,11 @@ TEST_F(WsJob, FocusesFiveSubSwathsWithTheirHeaders) {
   const RunResult r = job.run("main_focussing_asar_WS#" + list);
   ASSERT_EQ(r.status, 0) << r.err << job.log();
   for (int s = 1; s <= 5; ++s) {
-    const fs::path out = job.dir() / "out" / ("SS" + std::to_string(s) + ".out");
+    // Each focused sub-swath moved to its multilook work name, kept with DeleteTempFile 0.
+    const fs::path out = job.dir() / "out" / ("sceneML" + std::to_string(s));
     ASSERT_TRUE(fs::exists(out)) << out;
+    EXPECT_FALSE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")));
+    EXPECT_TRUE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s))));
     const std::string header = slurp(out.string() + ".hdr");
     EXPECT_NE(header.find("WideSwath SINGLE SWATH COMPLEX"), std::string::npos);
     EXPECT_NE(header.find("SS" + std::to_string(s)), std::string::npos);
@@ -238,9 +241,15 @@ TEST_F(WsJob, GroundRangeImageWithItsQuickLook) {
   const fs::path out = job.dir() / "out";
   EXPECT_TRUE(fs::exists(out / "scene_gr.tif"));
   EXPECT_FALSE(fs::exists(out / "scene_pwr"));
-  for (int s = 1; s <= 5; ++s)
+  for (int s = 1; s <= 5; ++s) {
     for (const char* suffix : {"", ".out", ".out.hdr"})
       EXPECT_FALSE(fs::exists(out / ("SS" + std::to_string(s) + suffix))) << s << suffix;
+    for (const char* suffix : {"", ".hdr"})
+      EXPECT_FALSE(fs::exists(out / ("sceneML" + std::to_string(s) + suffix))) << s << suffix;
+  }
+  // The host's list: the output root with each sub-swath's number.
+  const std::string root = (out / "scene").string();
+  EXPECT_EQ(lines_of(out / "sceneML.lst"), (std::vector<std::string>{root + "1", root + "2", root + "3", root + "4", root + "5"}));
   const Image image = read_image(out / "scene_gr", true);
   EXPECT_NEAR(image.rangeSpacing, 75.0, 1e-9);
   check_targets(image, *ws_);
@@ -266,6 +275,8 @@ TEST_F(WsJob, SarfocusLeavesTheMultilookedProduct) {
                                              stem + "_gr.prj", stem + "_gr.shp", stem + "_gr.shx", stem + "_gr.sml",
                                              stem + "_gr.vrt", stem + "_gr.xml", stem + "_gr_hdr"};
   EXPECT_EQ(names, expected);
+  // The host's list of sub-swaths stays in the job's folder, with the job's record.
+  EXPECT_EQ(lines_of(fs::path(sar::jobs::working_dir_for(out.string(), ws_->level0_path)) / (stem + "ML.lst")).size(), 5u);
   auto withSkip = args;
   withSkip.push_back("--skip-complete");
   const CliResult again = sarfocus(withSkip);
@@ -371,8 +382,12 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
     if (c.inLog) {
       EXPECT_NE(job.log().find(c.inLog), std::string::npos) << job.log();
     }
-    for (int s = 1; s <= 5; ++s)
-      EXPECT_EQ(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")), c.focused) << s;
+    // The focused sub-swaths stay under their work names; no list for the host.
+    for (int s = 1; s <= 5; ++s) {
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("sceneML" + std::to_string(s))), c.focused) << s;
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("sceneML" + std::to_string(s) + ".hdr")), c.focused) << s;
+    }
+    EXPECT_FALSE(fs::exists(job.dir() / "out" / "sceneML.lst"));
     for (const char* image : {"scene_pwr", "scene_pwr.part", "scene_pwr_hdr", "scene_gr"})
       EXPECT_FALSE(fs::exists(job.dir() / "out" / image)) << image;
   }
@@ -430,7 +445,7 @@ struct FocusedSwath {
 std::array<FocusedSwath, 5> focused_swaths(const fs::path& dir, double fs) {
   std::array<FocusedSwath, 5> out{};
   for (int s = 1; s <= 5; ++s) {
-    const fs::path h = dir / ("SS" + std::to_string(s) + ".out.hdr");
+    const fs::path h = dir / ("sceneML" + std::to_string(s) + ".hdr");
     const auto near = doubles_of(h, "NearRangeTime");
     const auto ground = doubles_of(h, "SlantToGround");
     const int samples = key_int(h, "Samples");
