@@ -15,13 +15,6 @@ namespace {
 
 constexpr double kDegree = kPi / 180.0;
 
-// Slant range of a point at `incidence_deg` on a sphere of radius re, seen from radius rs.
-double slant_range_of(double rs, double re, double incidence_deg) {
-  const double inc = incidence_deg * kDegree;
-  const double gamma = inc - std::asin(re * std::sin(inc) / rs);  // angle at the Earth's centre
-  return std::sqrt(rs * rs + re * re - 2.0 * rs * re * std::cos(gamma));
-}
-
 double incidence_of(double rs, double re, double r) {
   const double gamma = std::acos((rs * rs + re * re - r * r) / (2.0 * rs * re));
   return (gamma + std::asin(re * std::sin(gamma) / r)) / kDegree;
@@ -117,8 +110,10 @@ std::array<double, 5> ws_adjoining_incidences(const SimulationConfig& c, int spa
   const OrbitModel orbit =
       OrbitModel::for_scene(c.targets.front().position, t_scene, c.ws.swaths.at(ref).incidence_deg, c.ascending, c.orbit_number);
   const double rs = orbit.state(t_scene).position.norm();
-  const double re = geodetic_to_ecef(c.targets.front().position).norm();
-  const double r_ref = slant_range_of(rs, re, c.ws.swaths[ref].incidence_deg);
+  const Vec3 target = geodetic_to_ecef(c.targets.front().position);
+  const double re = target.norm();
+  // The target sub-swath's window is centred on the first target's echo at zero Doppler.
+  const double r_ref = (target - orbit.state_at_offset(zero_doppler_offset(orbit, target, 0.0)).position).norm();
   // Each window is centred on the echo of its incidence: centres `spacing` samples apart.
   const double step = 0.5 * kSpeedOfLight * spacing / c.im.sampling_frequency;
   std::array<double, 5> inc{};

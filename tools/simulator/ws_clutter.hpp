@@ -75,7 +75,8 @@ class WsClutter {
 void flatten_elevation_patterns(const std::string& xca_path);
 
 /// Incidences (degrees) for the five sub-swaths such that adjacent range windows start `spacing`
-/// samples apart, the target sub-swath's incidence kept: with a spacing below the focused width
+/// samples apart around the target sub-swath's window (centred on the first target's echo at
+/// zero Doppler; a beam steered to zero Doppler): with a spacing below the focused width
 /// (the window less the pulse), a small product whose sub-swaths meet, as a real one's do.
 std::array<double, 5> ws_adjoining_incidences(const SimulationConfig& config, int spacing);
 
