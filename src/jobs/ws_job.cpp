@@ -317,9 +317,12 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   }
   multilook::WsMultilookResult res;
   base::SetActivityLabel("WS Multilooking ...");
-  if (multilook::run_ws_multilook(swaths, cfg, orbit, output, res) != 0) {
-    note_failed_stage("mlook::run");
-    base::fatal(base::ec::kStageFailed, {"run()", res.error});
+  {
+    const StageClock clock("multilook");
+    if (multilook::run_ws_multilook(swaths, cfg, orbit, output, res) != 0) {
+      note_failed_stage("mlook::run");
+      base::fatal(base::ec::kStageFailed, {"run()", res.error});
+    }
   }
   base::LogPrintf("Multilooked %s: %d samples, %d lines, %d range looks\n", output.c_str(), res.samples, res.lines,
                   res.rangeLooks);
