@@ -7,7 +7,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstdio>
 #include <cmath>
 #include <cstring>
 #include <fstream>
@@ -637,8 +636,6 @@ void check_uniform(const UniformFigures& f) {
   ::testing::Test::RecordProperty("burst_cycle_levels_db", figures_text(f.cycleLevel));
   ::testing::Test::RecordProperty("enl", figures_text(f.enl));
   ::testing::Test::RecordProperty("enl_expected", figures_text(f.enlExpected));
-  std::printf("seams %s\ncycle %s\nenl %s\nexpected %s\n", figures_text(f.seamSteps).c_str(),
-              figures_text(f.cycleLevel).c_str(), figures_text(f.enl).c_str(), figures_text(f.enlExpected).c_str());
 }
 
 std::vector<std::string> uniform_args(const ScratchJob& job, const sim::SimulationTruth& t) {

@@ -293,7 +293,6 @@ struct ChannelSetup {
   std::vector<uint8_t> calibration;  // payload of its calibration pulses
 };
 
-// The wide swath clutter of the product, its level set in the reference sub-swath.
 // The wide swath clutter of the product's echo packets (indexed by packet), its level set in the
 // reference sub-swath.
 WsClutter make_ws_clutter(const SimulationConfig& c, const OrbitModel& orbit, const Attitude& attitude,
