@@ -624,7 +624,7 @@ std::string figures_text(const std::vector<double>& v) {
   return s;
 }
 
-void check_uniform(const UniformFigures& f) {
+void check_uniform(const UniformFigures& f, const std::string& tag) {
   ASSERT_EQ(f.seamSteps.size(), 4u);
   for (std::size_t s = 0; s < f.seamSteps.size(); ++s)
     EXPECT_LT(std::fabs(f.seamSteps[s]), 0.2) << "seam SS" << s + 1 << "/SS" << s + 2;
@@ -632,10 +632,10 @@ void check_uniform(const UniformFigures& f) {
     EXPECT_LT(std::fabs(f.cycleLevel[b]), 0.2) << "tenth " << b << " of the burst cycle";
   for (std::size_t s = 0; s < f.enl.size(); ++s)
     EXPECT_NEAR(f.enl[s] / f.enlExpected[s], 1.0, 0.1) << "SS" << s + 1 << ": ENL " << f.enl[s] << ", expected " << f.enlExpected[s];
-  ::testing::Test::RecordProperty("seam_steps_db", figures_text(f.seamSteps));
-  ::testing::Test::RecordProperty("burst_cycle_levels_db", figures_text(f.cycleLevel));
-  ::testing::Test::RecordProperty("enl", figures_text(f.enl));
-  ::testing::Test::RecordProperty("enl_expected", figures_text(f.enlExpected));
+  ::testing::Test::RecordProperty(tag + "seam_steps_db", figures_text(f.seamSteps));
+  ::testing::Test::RecordProperty(tag + "burst_cycle_levels_db", figures_text(f.cycleLevel));
+  ::testing::Test::RecordProperty(tag + "enl", figures_text(f.enl));
+  ::testing::Test::RecordProperty(tag + "enl_expected", figures_text(f.enlExpected));
 }
 
 std::vector<std::string> uniform_args(const ScratchJob& job, const sim::SimulationTruth& t) {
@@ -650,29 +650,23 @@ std::vector<std::string> uniform_args(const ScratchJob& job, const sim::Simulati
   return a;
 }
 
-// Slant range: the level is flat across the four seams and along the burst cycle, and the speckle
-// has the looks the range looks and the burst weights give.
-TEST_F(WsUniformScene, SlantImageIsFlatWithTheLooksItsWeightsGive) {
-  ScratchJob job("ws_uniform_slant");
-  const std::string list = job.layout(uniform_args(job, *truth_), "WS");
-  set_parameters(job.dir() / "des" / "parameters_multilook.hdr", {{"DeleteTempFile", "0"}});
-  const RunResult r = job.run("main_focussing_asar_WS#" + list);
-  ASSERT_EQ(r.status, 0) << r.err << job.log();
-  const Image im = read_image(job.dir() / "out" / "scene_pwr", false);
-  check_uniform(measure_uniform(im, *truth_, job.dir() / "out", 19207680.0, true));
-}
-
-// Ground range: the same level across the seams, resampled.
-TEST_F(WsUniformScene, GroundRangeImageIsFlatAcrossTheSeams) {
-  ScratchJob job("ws_uniform_ground");
-  auto a = uniform_args(job, *truth_);
-  a[11] = "OK";
-  const std::string list = job.layout(a, "WS");
-  set_parameters(job.dir() / "des" / "parameters_multilook.hdr", {{"DeleteTempFile", "0"}});
-  const RunResult r = job.run("main_focussing_asar_WS#" + list);
-  ASSERT_EQ(r.status, 0) << r.err << job.log();
-  const Image im = read_image(job.dir() / "out" / "scene_gr", true);
-  check_uniform(measure_uniform(im, *truth_, job.dir() / "out", 19207680.0, false));
+// Slant and ground range (one test, so that the scene is simulated once): the level is flat
+// across the four seams and along the burst cycle, and in slant range the speckle has the looks
+// the range looks and the burst weights give.
+TEST_F(WsUniformScene, JoinedImageIsFlatWithTheLooksItsWeightsGive) {
+  for (const bool ground : {false, true}) {
+    SCOPED_TRACE(ground ? "ground range" : "slant range");
+    ScratchJob job(ground ? "ws_uniform_ground" : "ws_uniform_slant");
+    auto a = uniform_args(job, *truth_);
+    if (ground) a[11] = "OK";
+    const std::string list = job.layout(a, "WS");
+    // The work files stay: their headers place the seams.
+    set_parameters(job.dir() / "des" / "parameters_multilook.hdr", {{"DeleteTempFile", "0"}});
+    const RunResult r = job.run("main_focussing_asar_WS#" + list);
+    ASSERT_EQ(r.status, 0) << r.err << job.log();
+    const Image im = read_image(job.dir() / "out" / (ground ? "scene_gr" : "scene_pwr"), ground);
+    check_uniform(measure_uniform(im, *truth_, job.dir() / "out", 19207680.0, !ground), ground ? "ground_" : "slant_");
+  }
 }
 
 }  // namespace

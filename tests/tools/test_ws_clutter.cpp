@@ -100,8 +100,17 @@ TEST_F(WsClutter, RawLevelIsUniformInRadarBrightness) {
 }
 
 // The written ASA_XCA has flat elevation patterns; the template keeps its own.
-TEST_F(WsClutter, FlatElevationPatternsOnDemand) {
-  const auto written = sar::envisat::XcaRecord::read(truth_->xca_path);
+TEST(WsElevation, FlatPatternsOnDemand) {
+  sim::SimulationConfig c;
+  c.mode = sim::AcquisitionMode::kWS;
+  c.out_dir = (fs::temp_directory_path() / ("ws_flat_" + std::to_string(::getpid()))).string();
+  c.samples = 256;
+  c.lines = 600;
+  c.targets = {{{45.0, 10.0, 0.0}, 10.0}};
+  c.ws.flat_elevation = true;
+  c.xca_template = kXcaTemplate;
+  const auto truth = sim::run_simulation(c);
+  const auto written = sar::envisat::XcaRecord::read(truth.xca_path);
   const auto original = sar::envisat::XcaRecord::read(kXcaTemplate);
   double spread = 0.0;
   for (int beam = 1; beam <= 7; ++beam)
@@ -111,6 +120,8 @@ TEST_F(WsClutter, FlatElevationPatternsOnDemand) {
       spread = std::max(spread, static_cast<double>(*std::max_element(o.begin(), o.end()) - *std::min_element(o.begin(), o.end())));
     }
   EXPECT_GT(spread, 3.0);
+  std::error_code ec;
+  fs::remove_all(c.out_dir, ec);
 }
 
 }  // namespace
