@@ -96,6 +96,9 @@ bool focused_sub_swath(const std::string& image, int s, multilook::WsSubSwath& o
   }
   base::GetProfileDoubleArray("Doppler", "SlantToGround", toGround, header);
   base::GetProfileDoubleArray("Doppler", "Rate", rate, header);
+  // The range window the burst chain put over the chirp band, for the looks' level.
+  double window[1] = {1.0};
+  base::GetProfileDoubleArray("General", "RangeWindowCoefficient", window, header);
   base::FreeProfile(header);
   std::error_code ec;
   const auto bytes = std::filesystem::file_size(image, ec);
@@ -121,6 +124,7 @@ bool focused_sub_swath(const std::string& image, int s, multilook::WsSubSwath& o
   // middle line is its centre: no centroid shift is to be added.
   out.centroid = 0.0;
   if (rate[0] < 0.0) out.rate = rate[0];
+  if (window[0] > 0.0 && window[0] <= 1.0) out.rangeWindow = window[0];
   errno = 0;
   return true;
 }
