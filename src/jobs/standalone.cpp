@@ -468,7 +468,7 @@ std::string finish_success(const StandaloneRequest& req, const Prepared& p, Stan
   for (const auto& e : fs::directory_iterator(p.work, ec)) {
     const std::string name = e.path().filename().string();
     const bool keep = e.is_directory() || name.rfind("Vanterra", 0) == 0 || name == "job.txt" ||
-                      name == "focussing.out" || name == "DCEST_resume.txt";
+                      name == "focussing.out" || name == "DCEST_resume.txt" || name == p.stem + "ML.lst";
     if (!keep) fs::remove(e.path(), ec);
   }
   const fs::path tmp = p.work / (std::string(kCompletionMarker) + ".tmp");

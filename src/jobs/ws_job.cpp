@@ -7,11 +7,13 @@
 #include <bit>
 #include <cerrno>
 #include <cmath>
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <numbers>
 #include <span>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "base/diagnostics.hpp"
@@ -63,10 +65,27 @@ std::string auxiliary(const std::string& arg, const std::string& product, const 
   return arg;
 }
 
-// One focused sub-swath as the multilooker reads it, from the header the burst chain wrote
-// beside it. False with `error` when the header or the image does not hold together.
-bool focused_sub_swath(const std::string& dir, int s, multilook::WsSubSwath& out, std::string& error) {
-  const std::string image = dir + "/SS" + std::to_string(s) + ".out", header = image + ".hdr";
+// The focused sub-swath D/SS<s>.out and its header moved to the multilook work names R + "ML" + s
+// and R + "ML" + s + ".hdr" (an earlier file of that name removed first). False with `error`.
+bool move_to_work_name(const std::string& dir, int s, const std::string& workName, std::string& error) {
+  const std::string image = dir + "/SS" + std::to_string(s) + ".out";
+  for (const auto& [from, to] : {std::pair{image, workName}, std::pair{image + ".hdr", workName + ".hdr"}}) {
+    const base::ErrnoGuard keep;
+    std::error_code ec;
+    std::filesystem::remove(to, ec);
+    std::filesystem::rename(from, to, ec);
+    if (ec) {
+      error = "cannot move " + from + " to " + to + ": " + ec.message();
+      return false;
+    }
+  }
+  return true;
+}
+
+// One focused sub-swath as the multilooker reads it, from its header beside it. False with
+// `error` when the header or the image does not hold together.
+bool focused_sub_swath(const std::string& image, int s, multilook::WsSubSwath& out, std::string& error) {
+  const std::string header = image + ".hdr";
   int32_t samples[1] = {0}, prefix[1] = {0};
   double near[1] = {0.0}, incidence[1] = {0.0};
   std::array<double, 5> toGround{}, rate{};
@@ -79,6 +98,9 @@ bool focused_sub_swath(const std::string& dir, int s, multilook::WsSubSwath& out
   }
   base::GetProfileDoubleArray("Doppler", "SlantToGround", toGround, header);
   base::GetProfileDoubleArray("Doppler", "Rate", rate, header);
+  // The range window the burst chain put over the chirp band, for the looks' level.
+  double window[1] = {1.0};
+  base::GetProfileDoubleArray("General", "RangeWindowCoefficient", window, header);
   base::FreeProfile(header);
   std::error_code ec;
   const auto bytes = std::filesystem::file_size(image, ec);
@@ -104,8 +126,28 @@ bool focused_sub_swath(const std::string& dir, int s, multilook::WsSubSwath& out
   // middle line is its centre: no centroid shift is to be added.
   out.centroid = 0.0;
   if (rate[0] < 0.0) out.rate = rate[0];
+  if (window[0] > 0.0 && window[0] <= 1.0) out.rangeWindow = window[0];
   errno = 0;
   return true;
+}
+
+// The list for the host: "%s%d" of the output root and each sub-swath's number, one a line, in
+// R + "ML.lst" (written whole under a temporary name, then renamed).
+void write_swath_list(const std::string& root) {
+  const std::string list = root + "ML.lst", part = list + ".part";
+  {
+    std::FILE* f = std::fopen(part.c_str(), "w");
+    bool ok = f != nullptr;
+    for (int s = 1; ok && s <= scansar::kSwaths; ++s) ok = std::fprintf(f, "%s%d\n", root.c_str(), s) > 0;
+    if (f && std::fclose(f) != 0) ok = false;
+    std::error_code ec;
+    if (ok) std::filesystem::rename(part, list, ec);
+    if (!ok || ec) {
+      std::filesystem::remove(part, ec);
+      base::report(base::kReportWarning, "cannot write the sub-swath list " + list);
+    }
+  }
+  errno = 0;
 }
 
 int optional_ints(const char* section, const char* key, std::span<int32_t> out, const std::string& file) {
@@ -311,13 +353,19 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   cfg.samplingRate = scan.samplingRate;
   // One range band for all: the narrowest chirp, which every sub-swath's spectrum covers.
   cfg.rangeBand = *std::min_element(scan.chirpBandwidth.begin(), scan.chirpBandwidth.end());
+  // Work names of the multilook: the root + "ML", and per sub-swath the root + "ML" + s, under
+  // which each focused sub-swath is read; they go once the image and its annotation stand.
+  const std::string workName = args[4] + "ML";
+  std::array<std::string, scansar::kSwaths> swathWorkNames;
+  for (int s = 0; s < scansar::kSwaths; ++s) swathWorkNames[static_cast<std::size_t>(s)] = workName + std::to_string(s + 1);
   std::array<multilook::WsSubSwath, scansar::kSwaths> swaths;
   std::string error;
   for (int s = 0; s < scansar::kSwaths && error.empty(); ++s) {
+    const std::string& name = swathWorkNames[static_cast<std::size_t>(s)];
     if (!par.swathsToProcess[static_cast<std::size_t>(s)])
       error = "the multilook joins all five sub-swaths; SS" + std::to_string(s + 1) + " was not focused";
-    else
-      focused_sub_swath(dir, s + 1, swaths[static_cast<std::size_t>(s)], error);
+    else if (move_to_work_name(dir, s + 1, name, error))
+      focused_sub_swath(name, s + 1, swaths[static_cast<std::size_t>(s)], error);
   }
   if (!error.empty()) {
     base::report(base::kReportError, error);
@@ -339,9 +387,12 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   }
   multilook::WsMultilookResult res;
   base::SetActivityLabel("WS Multilooking ...");
-  if (multilook::run_ws_multilook(swaths, cfg, orbit, output, res) != 0) {
-    note_failed_stage("mlook::run");
-    base::fatal(base::ec::kStageFailed, {"run()", res.error});
+  {
+    const StageClock clock("multilook");
+    if (multilook::run_ws_multilook(swaths, cfg, orbit, output, res) != 0) {
+      note_failed_stage("mlook::run");
+      base::fatal(base::ec::kStageFailed, {"run()", res.error});
+    }
   }
   base::LogPrintf("Multilooked %s: %d samples, %d lines, %d range looks\n", output.c_str(), res.samples, res.lines,
                   res.rangeLooks);
@@ -354,12 +405,17 @@ int main_focussing_asar_ws_v2(const std::string& listPath) {
   info.quickLookScale = std::atof(args[13].c_str());
   finish_ws_product(output, res, orbit, cfg.groundRange != 0, info);
 
-  // The sub-swath work files, once the joined image stands.
+  // The work files, once the joined image stands (DeleteTempFile 0 keeps them to look at): the
+  // extracted sub-swaths and the focused ones under their work names. The host is told the
+  // output root with each sub-swath's number, one a line.
   if (deleteTemporary) {
-    for (int s = 1; s <= scansar::kSwaths; ++s)
-      for (const std::string suffix : {"", ".out", ".out.hdr"})
-        base::DeleteProductFile(dir + "/SS" + std::to_string(s) + suffix, false);
+    for (int s = 1; s <= scansar::kSwaths; ++s) {
+      base::DeleteProductFile(dir + "/SS" + std::to_string(s), false);
+      base::DeleteProductFile(swathWorkNames[static_cast<std::size_t>(s - 1)], false);
+      base::DeleteProductFile(swathWorkNames[static_cast<std::size_t>(s - 1)] + ".hdr", false);
+    }
   }
+  write_swath_list(args[4]);
   errno = 0;
   return 0;
 }

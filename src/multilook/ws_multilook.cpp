@@ -87,6 +87,28 @@ std::vector<double> look_centres(int looks, double band, double fullBand) {
   return c;
 }
 
+double look_power_share(const std::vector<double>& centres, double band, double fullBand, double window) {
+  if (centres.empty() || !(band > 0.0) || !(fullBand > 0.0)) return 1.0;
+  // Mean of the spectrum's power over [f0, f1], clipped to the band.
+  auto mean_power = [&](double f0, double f1) {
+    f0 = std::max(f0, -0.5 * fullBand);
+    f1 = std::min(f1, 0.5 * fullBand);
+    if (!(f1 > f0)) return 0.0;
+    constexpr int kSteps = 256;
+    double s = 0.0;
+    for (int k = 0; k < kSteps; ++k) {
+      const double f = f0 + (k + 0.5) * (f1 - f0) / kSteps;
+      const double w = window + (1.0 - window) * std::cos(2.0 * std::numbers::pi * f / fullBand);
+      s += w * w;
+    }
+    return s / kSteps * (f1 - f0);
+  };
+  double looks = 0.0;
+  for (double c : centres) looks += mean_power(c - 0.5 * band, c + 0.5 * band) / band;
+  const double whole = mean_power(-0.5 * fullBand, 0.5 * fullBand) / fullBand;
+  return looks / static_cast<double>(centres.size()) / whole;
+}
+
 int plan_looks(double band, double incidence, int groundResolution, LookPlan& plan) {
   const double usable = 0.8 * band;
   const double needed = (kHalfLightSpeed / std::sin(incidence * std::numbers::pi / 180.0)) / groundResolution;
@@ -204,7 +226,8 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     const int fullBins = std::max(1, round_half_away(cfg.rangeBand / fs * n));
     if (bandBins > k) return fail(res, kRejected, "a range look is wider than the decimated rate");
     // Looks are cut square: their resolution is the ground resolution asked for.
-    const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks);
+    const double scale = static_cast<double>(fullBins) / (static_cast<double>(bandBins) * n * n * looks) /
+                         look_power_share(plan.centres, plan.band, cfg.rangeBand, sw[s].rangeWindow);
     dsp::cvector spectrum(static_cast<std::size_t>(n)), small(static_cast<std::size_t>(k));
     // x(t - delay): the spectrum times exp(-j 2 pi f delay), f the bin's frequency.
     std::vector<io::fcomplex> shift(static_cast<std::size_t>(n));

@@ -41,6 +41,7 @@ constexpr double kC = 299792458.0;
 constexpr int kMargin = 32;
 constexpr int32_t kScaleNode = 16;
 constexpr double kPassBand = 0.75, kStopBand = 2.0;  // in burst bandwidths
+constexpr double kReferenceBurst = 1.0 / 30.0;        // s of echoes a burst's weights stand for
 
 double poly(const std::array<double, 5>& c, double x) {
   return c[0] + x * (c[1] + x * (c[2] + x * (c[3] + x * c[4])));
@@ -112,7 +113,11 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
   par.linesPerBurst[i] = static_cast<int32_t>(std::ceil((2.0 * h - lower + upper) / a)) + 1;
   const int32_t Lpb = par.linesPerBurst[i];
 
-  // The burst's Hamming weight, normalised to unit mean power.
+  // The burst's Hamming weight. The kernel's gain is that of a stripmap aperture (a uniform
+  // scene keeps its level whatever the PRF), so a burst of N echoes comes out in proportion to its
+  // length N / PRF; the sub-swaths' bursts differ in length (30 to 37 ms), which would step the
+  // level of a uniform scene by up to 0.8 dB from one sub-swath to the next. The weights carry
+  // the power of kReferenceBurst seconds of echoes instead, whatever N and the PRF.
   std::vector<float> weight(static_cast<std::size_t>(N));
   {
     const double n = N - 1, c = par.azimuthHamming;
@@ -122,7 +127,7 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
       w[static_cast<std::size_t>(k)] = (1.0 - c) * std::cos(2.0 * kPi * (n / 2 - k) / n) + c;
       sum += w[static_cast<std::size_t>(k)] * w[static_cast<std::size_t>(k)];
     }
-    const double norm = std::sqrt(sum / N);
+    const double norm = std::sqrt(sum / (p * kReferenceBurst));
     for (int32_t k = 0; k < N; ++k) weight[static_cast<std::size_t>(k)] = static_cast<float>(w[static_cast<std::size_t>(k)] / norm);
   }
   // Spread of the weight over the burst, echoes^2: the curvature of a response's peak,

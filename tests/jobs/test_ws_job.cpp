@@ -1,10 +1,12 @@
 // The wide swath job on a small simulated product: five focused sub-swath images with their
 // headers joined into one multilooked image, slant or ground range, with its annotation and each
 // target where its zero-Doppler time and range put it; and the inputs that must stop it with
-// their codes and nothing half-written.
+// their codes and nothing half-written. On a uniform scene over sub-swaths that meet: the level
+// across the seams and along the burst cycle, and the speckle's looks.
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <cstring>
 #include <fstream>
@@ -18,7 +20,9 @@
 #include "base/errors.hpp"
 #include "job_harness.hpp"
 #include "test_standalone_support.hpp"
+#include "multilook/ws_multilook.hpp"
 #include "simulator/simulator.hpp"
+#include "simulator/ws_clutter.hpp"
 
 using namespace sar::test;
 namespace sim = sar::simulator;
@@ -79,6 +83,7 @@ sim::SimulationTruth* WsJob::im_ = nullptr;
 
 // The multilooked image and the grid its annotation gives.
 struct Image {
+  fs::path path;
   int lines = 0, samples = 0;
   std::vector<float> amplitude;
   double firstTime = 0.0, lineStep = 0.0;  // sec85, s
@@ -98,6 +103,7 @@ struct Image {
 
 Image read_image(const fs::path& raster, bool ground) {
   Image im;
+  im.path = raster;
   im.ground = ground;
   // The image, its headers and description, and its footprint for map tools.
   for (const char* suffix : {"", ".hdr", ".vrt", "_hdr", ".sml", ".kml", ".shp", ".xml"})
@@ -196,8 +202,11 @@ TEST_F(WsJob, FocusesFiveSubSwathsWithTheirHeaders) {
   const RunResult r = job.run("main_focussing_asar_WS#" + list);
   ASSERT_EQ(r.status, 0) << r.err << job.log();
   for (int s = 1; s <= 5; ++s) {
-    const fs::path out = job.dir() / "out" / ("SS" + std::to_string(s) + ".out");
+    // Each focused sub-swath moved to its multilook work name, kept with DeleteTempFile 0.
+    const fs::path out = job.dir() / "out" / ("sceneML" + std::to_string(s));
     ASSERT_TRUE(fs::exists(out)) << out;
+    EXPECT_FALSE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")));
+    EXPECT_TRUE(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s))));
     const std::string header = slurp(out.string() + ".hdr");
     EXPECT_NE(header.find("WideSwath SINGLE SWATH COMPLEX"), std::string::npos);
     EXPECT_NE(header.find("SS" + std::to_string(s)), std::string::npos);
@@ -231,9 +240,15 @@ TEST_F(WsJob, GroundRangeImageWithItsQuickLook) {
   const fs::path out = job.dir() / "out";
   EXPECT_TRUE(fs::exists(out / "scene_gr.tif"));
   EXPECT_FALSE(fs::exists(out / "scene_pwr"));
-  for (int s = 1; s <= 5; ++s)
+  for (int s = 1; s <= 5; ++s) {
     for (const char* suffix : {"", ".out", ".out.hdr"})
       EXPECT_FALSE(fs::exists(out / ("SS" + std::to_string(s) + suffix))) << s << suffix;
+    for (const char* suffix : {"", ".hdr"})
+      EXPECT_FALSE(fs::exists(out / ("sceneML" + std::to_string(s) + suffix))) << s << suffix;
+  }
+  // The host's list: the output root with each sub-swath's number.
+  const std::string root = (out / "scene").string();
+  EXPECT_EQ(lines_of(out / "sceneML.lst"), (std::vector<std::string>{root + "1", root + "2", root + "3", root + "4", root + "5"}));
   const Image image = read_image(out / "scene_gr", true);
   EXPECT_NEAR(image.rangeSpacing, 75.0, 1e-9);
   check_targets(image, *ws_);
@@ -259,6 +274,8 @@ TEST_F(WsJob, SarfocusLeavesTheMultilookedProduct) {
                                              stem + "_gr.prj", stem + "_gr.shp", stem + "_gr.shx", stem + "_gr.sml",
                                              stem + "_gr.vrt", stem + "_gr.xml", stem + "_gr_hdr"};
   EXPECT_EQ(names, expected);
+  // The host's list of sub-swaths stays in the job's folder, with the job's record.
+  EXPECT_EQ(lines_of(fs::path(sar::jobs::working_dir_for(out.string(), ws_->level0_path)) / (stem + "ML.lst")).size(), 5u);
   auto withSkip = args;
   withSkip.push_back("--skip-complete");
   const CliResult again = sarfocus(withSkip);
@@ -364,11 +381,293 @@ TEST_F(WsJob, BadInputStopsWithItsCodeAndLeavesNoImage) {
     if (c.inLog) {
       EXPECT_NE(job.log().find(c.inLog), std::string::npos) << job.log();
     }
-    for (int s = 1; s <= 5; ++s)
-      EXPECT_EQ(fs::exists(job.dir() / "out" / ("SS" + std::to_string(s) + ".out")), c.focused) << s;
+    // The focused sub-swaths stay under their work names; no list for the host.
+    for (int s = 1; s <= 5; ++s) {
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("sceneML" + std::to_string(s))), c.focused) << s;
+      EXPECT_EQ(fs::exists(job.dir() / "out" / ("sceneML" + std::to_string(s) + ".hdr")), c.focused) << s;
+    }
+    EXPECT_FALSE(fs::exists(job.dir() / "out" / "sceneML.lst"));
     for (const char* image : {"scene_pwr", "scene_pwr.part", "scene_pwr_hdr", "scene_gr"})
       EXPECT_FALSE(fs::exists(job.dir() / "out" / image)) << image;
   }
 }
 
 }  // namespace
+
+// ------------------------------------------------------------------ a uniform scene, measured
+
+namespace sar::test {
+namespace {
+
+// Five sub-swaths whose focused windows overlap (windows of 1024 samples, 472 of them left once
+// the pulse and the trimmed columns are gone, starting about 400 apart), nine burst cycles of
+// uniform clutter with no elevation pattern (flat patterns in the ASA_XCA the job reads), and no
+// receiver noise: the joined image's level and speckle are those of the processing alone.
+constexpr int kUniformSamples = 1024;
+constexpr int kWindowSpacing = 400;
+
+class WsUniformScene : public ::testing::Test {
+ protected:
+  static fs::path root() { return fs::temp_directory_path() / ("ws_uniform_" + std::to_string(::getpid())); }
+  static void SetUpTestSuite() {
+    fs::remove_all(root());
+    sim::SimulationConfig c;
+    c.mode = sim::AcquisitionMode::kWS;
+    c.out_dir = (root() / "ws").string();
+    c.samples = kUniformSamples;
+    c.lines = 525 + 9 * 380;
+    c.noise_db = -200.0;
+    c.targets = {{{45.0, 10.0, 0.0}, 0.0}};
+    c.clutter.power_db = 20.0;
+    c.ws.flat_elevation = true;
+    c.ins_template = kInsTemplate;
+    c.xca_template = kXcaTemplate;
+    const auto incidences = sim::ws_adjoining_incidences(c, kWindowSpacing);
+    for (std::size_t k = 0; k < 5; ++k) c.ws.swaths[k].incidence_deg = incidences[k];
+    truth_ = new sim::SimulationTruth(sim::run_simulation(c));
+  }
+  static void TearDownTestSuite() {
+    delete truth_;
+    std::error_code err;
+    fs::remove_all(root(), err);
+  }
+  static sim::SimulationTruth* truth_;
+};
+sim::SimulationTruth* WsUniformScene::truth_ = nullptr;
+
+// What the focused sub-swaths' headers say: near range, samples and the incidence the looks were
+// planned for.
+struct FocusedSwath {
+  double nearTime = 0.0, farTime = 0.0, incidence = 0.0;
+};
+
+std::array<FocusedSwath, 5> focused_swaths(const fs::path& dir, double fs) {
+  std::array<FocusedSwath, 5> out{};
+  for (int s = 1; s <= 5; ++s) {
+    const fs::path h = dir / ("sceneML" + std::to_string(s) + ".hdr");
+    const auto near = doubles_of(h, "NearRangeTime");
+    const auto ground = doubles_of(h, "SlantToGround");
+    const int samples = key_int(h, "Samples");
+    EXPECT_FALSE(near.empty()) << h;
+    EXPECT_GE(ground.size(), 2u) << h;
+    if (near.empty() || ground.size() < 2) continue;
+    auto& f = out[static_cast<std::size_t>(s - 1)];
+    f.nearTime = near[0];
+    f.farTime = near[0] + samples / fs;
+    f.incidence = std::asin(149896229.0 / ground[1]) * 180.0 / M_PI;
+  }
+  return out;
+}
+
+// The column of a two-way time, by bisection.
+double column_of(const Image& im, double tau) {
+  double lo = 0.0, hi = im.samples - 1.0;
+  for (int k = 0; k < 60; ++k) (im.column_time(0.5 * (lo + hi)) < tau ? lo : hi) = 0.5 * (lo + hi);
+  return 0.5 * (lo + hi);
+}
+
+double power(const Image& im, int l, int c) { return static_cast<double>(im.at(l, c)) * im.at(l, c); }
+
+// Mean power of each column over lines [l0, l1).
+std::vector<double> column_levels(const Image& im, int l0, int l1) {
+  std::vector<double> level(static_cast<std::size_t>(im.samples), 0.0);
+  for (int l = l0; l < l1; ++l)
+    for (int c = 0; c < im.samples; ++c) level[static_cast<std::size_t>(c)] += power(im, l, c);
+  for (double& v : level) v /= (l1 - l0);
+  return level;
+}
+
+// The step of the level (dB) at a seam: the mean level of `width` columns on each side, `gap`
+// columns off it (the scene is flat, so no slope is fitted: a fit would triple the speckle's
+// share of the estimate).
+double step_db(const std::vector<double>& level, double seam, int gap, int width) {
+  auto mean = [&](int from, int to) {
+    double s = 0.0;
+    for (int c = from; c < to; ++c) s += level[static_cast<std::size_t>(c)];
+    return s / (to - from);
+  };
+  const int s = static_cast<int>(std::floor(seam));
+  return 10.0 * std::log10(mean(s + 1 + gap, s + 1 + gap + width) / mean(s - gap - width, s - gap));
+}
+
+// The burst cycle (s) and the centre time (sec85) of each sub-swath's first burst, from the
+// packets.
+struct Bursts {
+  double cycle = 0.0;
+  std::array<double, 5> firstCentre{};
+};
+
+Bursts burst_timing(const sim::SimulationTruth& t) {
+  Bursts b;
+  std::array<std::vector<double>, 5> starts;
+  for (const auto& p : t.packets)
+    if (p.burst_start && p.channel >= 0 && p.channel < 5) starts[static_cast<std::size_t>(p.channel)].push_back(p.time);
+  for (std::size_t s = 0; s < 5; ++s) {
+    EXPECT_GE(starts[s].size(), 2u);
+    if (starts[s].size() < 2) return b;
+    const auto& ch = t.channels[s];
+    b.firstCentre[s] = starts[s].front() + 0.5 * (ch.burst_echoes - 1) / ch.prf;
+    if (s == 0) b.cycle = (starts[s].back() - starts[s].front()) / static_cast<double>(starts[s].size() - 1);
+  }
+  return b;
+}
+
+// ENL of m looks of band b cut from a spectrum weighted by a Hamming window of coefficient a
+// over the band B: (sum of the looks' powers)^2 over the sum of their squared covariances, which
+// are the spectrum's power over the part of the band two looks share.
+double range_enl(int looks, double band, double fullBand, double a) {
+  const auto centres = multilook::look_centres(looks, band, fullBand);
+  auto power_between = [&](double f0, double f1) {
+    double s = 0.0;
+    const int n = 400;
+    for (int k = 0; k < n; ++k) {
+      const double f = f0 + (k + 0.5) * (f1 - f0) / n;
+      const double w = a + (1.0 - a) * std::cos(2.0 * M_PI * f / fullBand);
+      s += w * w * (f1 - f0) / n;
+    }
+    return s;
+  };
+  double total = 0.0, covariance = 0.0;
+  for (double ci : centres) {
+    total += power_between(ci - band / 2, ci + band / 2);
+    for (double cj : centres) {
+      const double lo = std::max(ci, cj) - band / 2, hi = std::min(ci, cj) + band / 2;
+      if (hi > lo) covariance += std::pow(power_between(lo, hi), 2.0);
+    }
+  }
+  return total * total / covariance;
+}
+
+// The ENL of a region spread evenly over the burst cycle: each line's looks are the range looks
+// times (sum w^2)^2 / sum w^4 of the bursts that reach it; the pooled ENL is the inverse of the
+// mean of the inverses.
+double expected_enl(double rangeEnl, double w1, double w2) {
+  double inverse = 0.0;
+  const int n = 1000;
+  for (int k = 0; k < n; ++k) {
+    const double v = (k + 0.5) / n;
+    double w2sum = 0.0, w4sum = 0.0;
+    for (int b = -2; b <= 2; ++b) {
+      const double w = multilook::burst_weight(v - b, w1, w2);
+      w2sum += w * w;
+      w4sum += w * w * w * w;
+    }
+    inverse += w4sum / (rangeEnl * w2sum * w2sum);
+  }
+  return n / inverse;
+}
+
+struct UniformFigures {
+  std::vector<double> seamSteps;   // dB, seam by seam
+  std::vector<double> cycleLevel;  // dB against the mean, by tenth of the burst cycle
+  std::vector<double> enl, enlExpected;  // by sub-swath
+};
+
+// Lines a burst cycle and a half in from each end, where every line is made of bursts on both
+// sides of it in every sub-swath.
+UniformFigures measure_uniform(const Image& im, const sim::SimulationTruth& truth, const fs::path& workDir,
+                               double samplingRate, bool withEnl) {
+  UniformFigures f;
+  const Bursts bursts = burst_timing(truth);
+  const double cycleLines = bursts.cycle / im.lineStep;
+  const int first = static_cast<int>(std::ceil(1.5 * cycleLines)), last = im.lines - first;
+  EXPECT_GT(last - first, 4.0 * cycleLines) << "too few steady lines";
+  if (last - first < cycleLines) return f;
+  const auto swaths = focused_swaths(workDir, samplingRate);
+  const auto level = column_levels(im, first, last);
+  // Seams in the middle of the overlaps of the focused windows.
+  std::array<double, 6> bounds{};
+  bounds[5] = im.samples;
+  for (std::size_t s = 0; s + 1 < 5; ++s) {
+    const double seam = column_of(im, 0.5 * (swaths[s].farTime + swaths[s + 1].nearTime));
+    bounds[s + 1] = seam;
+    f.seamSteps.push_back(step_db(level, seam, 2, im.ground ? 56 : 60));
+  }
+  // Along azimuth: each sub-swath's lines folded by their place in its own burst cycle, all five
+  // pooled (each with its own phase, so that a scalloping adds up).
+  constexpr int kBins = 10;
+  std::array<double, kBins> sum{};
+  std::array<double, kBins> count{};
+  double all = 0.0, pixels = 0.0;
+  const int looks = key_int(fs::path(im.path.string() + "_hdr"), "NRangeLooks");
+  for (std::size_t s = 0; s < 5; ++s) {
+    const int c0 = static_cast<int>(bounds[s]) + 3, c1 = static_cast<int>(bounds[s + 1]) - 3;
+    double ss = 0.0, ss2 = 0.0;
+    std::size_t n = 0;
+    for (int l = first; l < last; ++l) {
+      const double phase = (im.firstTime + l * im.lineStep - bursts.firstCentre[s]) / bursts.cycle;
+      const auto bin = static_cast<std::size_t>(std::min(kBins - 1.0, (phase - std::floor(phase)) * kBins));
+      for (int c = c0; c < c1; ++c, ++n) {
+        const double p = power(im, l, c);
+        sum[bin] += p;
+        count[bin] += 1.0;
+        ss += p;
+        ss2 += p * p;
+      }
+    }
+    all += ss;
+    pixels += static_cast<double>(n);
+    if (!withEnl) continue;
+    multilook::LookPlan plan;
+    EXPECT_EQ(multilook::plan_looks(16e6, swaths[s].incidence, 150, plan), 0);
+    const double mean = ss / static_cast<double>(n);
+    f.enl.push_back(mean * mean / (ss2 / static_cast<double>(n) - mean * mean));
+    f.enlExpected.push_back(expected_enl(range_enl(looks, plan.band, 16e6, 0.75), 0.25, 0.5));
+  }
+  for (std::size_t b = 0; b < kBins; ++b) f.cycleLevel.push_back(10.0 * std::log10(sum[b] / count[b] / (all / pixels)));
+  return f;
+}
+
+std::string figures_text(const std::vector<double>& v) {
+  std::string s;
+  for (double x : v) s += (s.empty() ? "" : " ") + std::to_string(x);
+  return s;
+}
+
+void check_uniform(const UniformFigures& f, const std::string& tag) {
+  ASSERT_EQ(f.seamSteps.size(), 4u);
+  for (std::size_t s = 0; s < f.seamSteps.size(); ++s)
+    EXPECT_LT(std::fabs(f.seamSteps[s]), 0.2) << "seam SS" << s + 1 << "/SS" << s + 2;
+  for (std::size_t b = 0; b < f.cycleLevel.size(); ++b)
+    EXPECT_LT(std::fabs(f.cycleLevel[b]), 0.2) << "tenth " << b << " of the burst cycle";
+  for (std::size_t s = 0; s < f.enl.size(); ++s)
+    EXPECT_NEAR(f.enl[s] / f.enlExpected[s], 1.0, 0.1) << "SS" << s + 1 << ": ENL " << f.enl[s] << ", expected " << f.enlExpected[s];
+  ::testing::Test::RecordProperty(tag + "seam_steps_db", figures_text(f.seamSteps));
+  ::testing::Test::RecordProperty(tag + "burst_cycle_levels_db", figures_text(f.cycleLevel));
+  ::testing::Test::RecordProperty(tag + "enl", figures_text(f.enl));
+  ::testing::Test::RecordProperty(tag + "enl_expected", figures_text(f.enlExpected));
+}
+
+std::vector<std::string> uniform_args(const ScratchJob& job, const sim::SimulationTruth& t) {
+  std::vector<std::string> a(14, "");
+  a[0] = t.level0_path;
+  a[1] = t.orbit_path;
+  a[2] = t.ins_path;
+  a[3] = t.xca_path;
+  a[4] = (job.dir() / "out" / "scene").string();
+  a[7] = kXch;
+  a[12] = "NotOK";
+  return a;
+}
+
+// Slant and ground range (one test, so that the scene is simulated once): the level is flat
+// across the four seams and along the burst cycle, and in slant range the speckle has the looks
+// the range looks and the burst weights give.
+TEST_F(WsUniformScene, JoinedImageIsFlatWithTheLooksItsWeightsGive) {
+  for (const bool ground : {false, true}) {
+    SCOPED_TRACE(ground ? "ground range" : "slant range");
+    ScratchJob job(ground ? "ws_uniform_ground" : "ws_uniform_slant");
+    auto a = uniform_args(job, *truth_);
+    if (ground) a[11] = "OK";
+    const std::string list = job.layout(a, "WS");
+    // The work files stay: their headers place the seams.
+    set_parameters(job.dir() / "des" / "parameters_multilook.hdr", {{"DeleteTempFile", "0"}});
+    const RunResult r = job.run("main_focussing_asar_WS#" + list);
+    ASSERT_EQ(r.status, 0) << r.err << job.log();
+    const Image im = read_image(job.dir() / "out" / (ground ? "scene_gr" : "scene_pwr"), ground);
+    check_uniform(measure_uniform(im, *truth_, job.dir() / "out", 19207680.0, !ground), ground ? "ground_" : "slant_");
+  }
+}
+
+}  // namespace
+}  // namespace sar::test

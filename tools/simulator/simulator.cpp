@@ -18,6 +18,7 @@
 #include "simulator/level0_packet.hpp"
 #include "simulator/orbit_file.hpp"
 #include "simulator/truth_file.hpp"
+#include "simulator/ws_clutter.hpp"
 
 namespace sar::simulator {
 
@@ -294,13 +295,36 @@ struct ChannelSetup {
   std::optional<ElevationPattern> elevation;
 };
 
+// The wide swath clutter of the product's echo packets (indexed by packet), its level set in the
+// reference sub-swath.
+WsClutter make_ws_clutter(const SimulationConfig& c, const OrbitModel& orbit, const Attitude& attitude,
+                          const std::vector<ChannelSetup>& channels, SimulationTruth& truth, double first_offset,
+                          double span, const std::vector<Slot>& slots, std::vector<std::size_t>& line_of_packet) {
+  std::array<WsClutterSwath, 5> swaths{};
+  for (std::size_t k = 0; k < swaths.size(); ++k) {
+    const ChannelTruth& t = channels.at(k).truth;
+    swaths[k] = {t.prf, t.near_range_time, channels[k].tp, t.bandwidth_code * kBandwidthStep};
+  }
+  std::vector<WsEchoLine> lines;
+  line_of_packet.assign(static_cast<std::size_t>(c.lines), 0);
+  for (int l = 0; l < c.lines; ++l) {
+    const Slot& s = slots[static_cast<std::size_t>(l)];
+    if (s.kind != PacketKind::kEcho) continue;
+    line_of_packet[static_cast<std::size_t>(l)] = lines.size();
+    lines.push_back({s.channel, s.time - slots.front().time});
+  }
+  truth.clutter.present = true;
+  return WsClutter(c, orbit, attitude, swaths, truth.reference_channel, first_offset, span, lines);
+}
+
 }  // namespace
 
 SimulationTruth run_simulation(const SimulationConfig& c) {
   if (c.lines < 2 || c.lines > 200000) throw std::invalid_argument("lines must be 2 to 200000");
   if (c.samples < 64 || fbaq_line_bytes(c.samples) > 8192) throw std::invalid_argument("samples must be 64 to 8001");
   if (c.targets.empty()) throw std::invalid_argument("the scene needs at least one target");
-  if (is_ws(c) && c.clutter.enabled()) throw std::invalid_argument("clutter is simulated in IM and AP only");
+  if (is_ws(c) && c.clutter.enabled() && has_fault(c, Fault::kSwstChange))
+    throw std::invalid_argument("wide swath clutter is simulated with fixed sampling windows only");
   if (is_ws(c) && (c.ws.target_swath < 0 || c.ws.target_swath > 4)) throw std::invalid_argument("target sub-swath must be 0 to 4");
   const ImParameters& im = c.im;
   const double t_scene = base::ascii2sec85(c.scene_time);
@@ -592,6 +616,7 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
     truth.ins_path = write_ins_file(c.ins_template, im, rows, validity, c.out_dir);
   }
   if (!c.xca_template.empty()) truth.xca_path = write_xca_file(c.xca_template, validity, c.out_dir);
+  if (is_ws(c) && c.ws.flat_elevation && !truth.xca_path.empty()) flatten_elevation_patterns(truth.xca_path);
 
   // Headers.
   const double node_time = orbit.ascending_node_before(truth.first_packet_time);
@@ -642,7 +667,7 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
 
   // Clutter, made azimuth block by azimuth block as the lines go by.
   std::optional<ClutterEcho> clutter;
-  if (c.clutter.enabled()) {
+  if (c.clutter.enabled() && !is_ws(c)) {
     const ClutterGeometry g = clutter_geometry(c, truth);
     truth.clutter.present = true;
     const double last = truth.near_range_time + (c.samples - 1) / fs;
@@ -652,6 +677,11 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
     truth.clutter.ambiguity_mid = static_cast<int>(std::lround(truth.clutter.centroid_mid / prf));
     clutter.emplace(g, random_reflectivity(c.clutter, g, c.seed ^ 0xC1077E4ull));
   }
+
+  std::optional<WsClutter> ws_clutter;
+  std::vector<std::size_t> ws_clutter_line;
+  if (is_ws(c) && c.clutter.enabled())
+    ws_clutter.emplace(make_ws_clutter(c, orbit, attitude, channels, truth, first_offset, span, slots, ws_clutter_line));
 
   // Packets.
   const std::vector<double> gain = receive_gain(im, c.samples);
@@ -709,6 +739,10 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
           const double v = u - ch.tp / 2.0;
           echo[static_cast<std::size_t>(k)] += std::polar(amplitude, carrier + kPi * ch.rate * v * v);
         }
+      }
+      if (ws_clutter) {
+        const auto field = ws_clutter->line(ws_clutter_line[static_cast<std::size_t>(l)]);
+        for (std::size_t k = 0; k < echo.size(); ++k) echo[k] += std::complex<double>(field[k]);
       }
       if (clutter) {
         const auto field = clutter->line(static_cast<int>(slot.grid - slots.front().grid));

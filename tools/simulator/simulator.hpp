@@ -109,6 +109,10 @@ struct WsParameters {
   std::array<int, 5> order = {0, 1, 2, 3, 4};  // firing order
   int target_swath = 2;    // its window is centred on the first target's echo
   bool vertical = false;   // V/V instead of H/H
+  // The written ASA_XCA's elevation patterns flat (0 dB), so that a job correcting the elevation
+  // pattern leaves the echoes' range level as the simulator made it (the clutter carries no
+  // elevation pattern).
+  bool flat_elevation = false;
 };
 
 struct SimulationConfig {
@@ -147,7 +151,8 @@ struct SimulationConfig {
   // (middle line, middle sample) is this many Hz; attitude.squint_rad is then ignored.
   std::optional<double> centroid_hz;
   // Distributed clutter added to the echoes of the targets (see clutter.hpp); off by default.
-  // IM and AP only.
+  // WS: uniform clutter in every sub-swath (ws_clutter.hpp), its power that of a raw sample at
+  // the middle of the target sub-swath.
   ClutterOptions clutter;
 };
 

@@ -192,6 +192,17 @@ WssProduct write_wss_product(const WssConfig& c) {
   const int bandBins = static_cast<int>(std::floor(c.range_band / fs * n));
   std::vector<dsp::fcomplex> line(static_cast<std::size_t>(n));
   std::string record(static_cast<std::size_t>(recordBytes), '\0');
+  // The range window over the band's bins, scaled to unit mean power.
+  std::vector<double> window(static_cast<std::size_t>(bandBins), 1.0);
+  {
+    double power = 0.0;
+    for (int k = -bandBins / 2; k < bandBins - bandBins / 2; ++k) {
+      const double w = c.range_window + (1.0 - c.range_window) * std::cos(2.0 * M_PI * k / bandBins);
+      window[static_cast<std::size_t>(k + bandBins / 2)] = w;
+      power += w * w;
+    }
+    for (double& w : window) w /= std::sqrt(power / bandBins);
+  }
   for (int s = 0; s < 5; ++s) {
     if (s + 1 == c.drop_swath) continue;
     std::vector<double> spread(static_cast<std::size_t>(n));
@@ -204,10 +215,12 @@ WssProduct write_wss_product(const WssConfig& c) {
       const double phase0 = 2.0 * M_PI * std::uniform_real_distribution<double>(0.0, 1.0)(rng);
       for (int l = 0; l < c.burst_lines; ++l) {
         const int gridLine = firstLine + l;
-        // Clutter of the range band: white spectrum inside it, nothing outside.
+        // Clutter of the range band: white spectrum inside it (or weighted by the range window,
+        // at unit mean power), nothing outside.
         std::fill(line.begin(), line.end(), dsp::fcomplex{});
         for (int k = -bandBins / 2; k < bandBins - bandBins / 2; ++k)
           line[static_cast<std::size_t>((k + n) % n)] =
+              static_cast<float>(window[static_cast<std::size_t>(k + bandBins / 2)]) *
               dsp::fcomplex(static_cast<float>(gauss(rng)), static_cast<float>(gauss(rng)));
         dsp::fft_c(n, n, 1, 1, -2, 0, line);
         const float norm = static_cast<float>(c.clutter_std / std::sqrt(static_cast<double>(bandBins)));

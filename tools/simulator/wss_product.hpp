@@ -44,6 +44,7 @@ struct WssConfig {
   int cycle_lines = 200;                          // lines from one burst of a sub-swath to the next
   std::array<int, 5> swath_offset_lines = {0, 40, 80, 120, 160};  // acquisition time in the cycle
   double clutter_std = 300.0;                     // counts at the reference range
+  double range_window = 1.0;                      // Hamming coefficient over the clutter's band (1: white)
   std::vector<WssTarget> targets;
   unsigned seed = 7;
   bool truncate_mds = false;                      // cut the last MDS short (a fault)
