@@ -352,7 +352,9 @@ SimulationTruth run_simulation(const SimulationConfig& c) {
       t.beam_code = kWsFirstBeam + static_cast<int>(k);
       t.pri_code = w.pri_code;
       t.burst_echoes = w.burst_echoes;
-      if (!c.xca_template.empty() && !c.ins_template.empty())
+      // A product written with flat patterns must carry flat echoes too, or the engine would
+      // be judged against a pattern it is told is not there.
+      if (!c.ws.flat_elevation && !c.xca_template.empty() && !c.ins_template.empty())
         ch.elevation = read_elevation_pattern(c.xca_template, c.ins_template, kWsPatternSlot[k], c.ws.vertical ? 1 : 0);
       if (t.burst_echoes <= 0)
         t.burst_echoes = c.ins_template.empty() ? kWsBurstEchoes[k]
