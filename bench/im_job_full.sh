@@ -14,6 +14,7 @@
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
+source "$here/bench/measure.sh"
 lines="${1:-30000}"
 samples="${2:-5616}"
 shift $(( $# < 2 ? $# : 2 ))
@@ -22,24 +23,12 @@ thread_counts=("$@")
 work="${SAR_BENCH_DIR:-$here/out/bench_im}"
 incore="${SAR_BENCH_INCORE:-1}"
 
-if [ ! -x /usr/bin/time ]; then
-  echo "im_job_full: /usr/bin/time is needed for the peak memory (Debian package 'time')" >&2
-  exit 2
-fi
+bench_need_time
 cmake --build "$build" -j2 --target sarsim focussing bench_scene_transforms >/dev/null
 # The machine is shared: its load at the start and the end says how far the figures can be trusted.
-echo "== load at start: $(uptime | sed 's/.*load average: //') ($(nproc) cores)"
-
+bench_load start
 # The bound first, in the same run: this machine's speed varies from hour to hour.
-bound_2T="" bound_1T=""
-bound_sh="$here/../shared/perfbound/bound.sh"
-if [ -z "${SAR_BENCH_NO_BOUND:-}" ] && [ -x "$bound_sh" ]; then
-  echo "== bound of this machine (../shared/perfbound)"
-  bound_out=$("$bound_sh")
-  printf '%s\n' "$bound_out" | grep '^bound [12]T' | sed 's/^/  /'
-  bound_2T=$(printf '%s\n' "$bound_out" | awk '/^bound 2T:/ {print $3}')
-  bound_1T=$(printf '%s\n' "$bound_out" | awk '/^bound 1T:/ {print $3}')
-fi
+bench_bound
 
 # Simulates a scene of $1 lines once (kept for later runs) and sets product, orbit, ins, xca.
 simulate() {
@@ -71,20 +60,7 @@ run_job() {
   "$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
     --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
   sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
-  set +e
-  OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_IM#$job/job.txt" \
-    2>"$job/time.txt" >/dev/null
-  status=$?
-  set -e
-  if [ "$status" -ne 0 ]; then
-    echo "im_job_full: the job failed with status $status" >&2
-    cat "$job/Vanterra.working_error" >&2 || true
-    exit 1
-  fi
-  wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
-    "$job/time.txt")
-  peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
-  cpu=$(awk -F': ' '/User time/ {u = $2} /System time/ {s = $2} END {printf "%.2f", u + s}' "$job/time.txt")
+  bench_run_job "$threads" "$job" "$exe" "main_focussing_asar_IM#$job/job.txt"
   leftover=$(cd "$job" && ls -d EXTR* DCEST_resume.txt 2>/dev/null | tr '\n' ' ' || true)
 }
 
@@ -97,30 +73,18 @@ run_job "$threads"
 wall_of[$threads]="$wall"
 
 echo "== bare transforms of the same scene"
-bare=$(SAR_BENCH_LINES="$lines" SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="$threads" \
-  "$build/bench/bench_scene_transforms" --benchmark_format=csv 2>/dev/null | grep '^"BM_')
-range_ms=$(echo "$bare" | awk -F, '/BM_RangeLines/ {print $3}')
-azimuth_ms=$(echo "$bare" | awk -F, '/BM_AzimuthColumns/ {print $3}')
-bound=""
-[ "$threads" = 2 ] && bound="$bound_2T"
-[ "$threads" = 1 ] && bound="$bound_1T"
+read -r range_ms azimuth_ms < <(bench_bare "$lines" "$samples" "$threads")
 
 echo
 echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
-grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
+bench_stages "$job/Vanterra.log"
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
 echo "  work files left      ${leftover:-none}"
-line=$(awk -v w="$wall" -v c="$cpu" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" -v b="$bound" -v t="$threads" 'BEGIN {
-  bare = (r + a) / 1000.0
-  printf "  wall time            %9.2f s\n", w
-  printf "  processor time       %9.2f s (user and system, all threads)\n", c
-  printf "  peak memory          %9.2f GiB\n", p / 1048576.0
-  printf "  bare transforms      %9.2f s (range lines %.2f s, azimuth columns %.2f s)\n", bare, r / 1000.0, a / 1000.0
-  printf "  job / bare           %9.2f\n", w / bare
-  if (b != "") printf "  bound                %9.2f s\n  job / bound          %9.2f\n", b, w / b
-}')
+line=$(bench_figures "$(awk -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {print (r + a) / 1000.0}')" \
+  "$(awk -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {printf "range lines %.2f s, azimuth columns %.2f s", r / 1000.0, a / 1000.0}')" \
+  "$(bench_bound_for "$threads")")
 echo "$line"
-summary+="${threads} threads: $(echo "$line" | awk '/wall time/ {w=$3} /peak memory/ {m=$3} /job \/ bound/ {r=$4} END {printf "wall %s s, peak %s GiB, job / bound %s", w, m, (r == "" ? "-" : r)}')"$'\n'
+summary+="$(bench_summary_line "$line" "$threads")"$'\n'
 done
 
 # The scaling line: the speed-up of 2 threads over 1 on the same scene, and half and quarter
@@ -141,6 +105,6 @@ if [ "${SAR_BENCH_SCALING:-1}" != 0 ] && [ -n "${wall_of[2]:-}" ]; then
   summary+="${scaling%;}"$'\n'
 fi
 echo
-echo "== load at end: $(uptime | sed 's/.*load average: //')"
+bench_load end
 echo "Summary (${lines} x ${samples}, Flag_incore ${incore}):"
 printf '%s' "$summary" | sed 's/^/  /'

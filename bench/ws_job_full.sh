@@ -13,6 +13,7 @@
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
+source "$here/bench/measure.sh"
 bursts="${1:-1200}"
 samples="${2:-5000}"
 shift $(( $# < 2 ? $# : 2 ))
@@ -20,11 +21,10 @@ thread_counts=("$@")
 [ ${#thread_counts[@]} -gt 0 ] || thread_counts=(2)
 work="${SAR_BENCH_DIR:-$here/out/bench_ws}"
 
-if [ ! -x /usr/bin/time ]; then
-  echo "ws_job_full: /usr/bin/time is needed for the peak memory (Debian package 'time')" >&2
-  exit 2
-fi
+bench_need_time
 cmake --build "$build" -j2 --target sarsim focussing bench_ws_transforms >/dev/null
+bench_load start
+bench_bound
 
 # 525 packets open the acquisition; a cycle is about 360 packets.
 packets=$(( 525 + bursts * 360 ))
@@ -50,36 +50,20 @@ rm -rf "$job"
 "$exe" --setup "$job" --mode WS --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
   --arg 4="$job/scene" --arg 7="$xch" --arg 12=NotOK >/dev/null
 echo "== focussing (${threads} threads)"
-set +e
-OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_WS#$job/job.txt" \
-  2>"$job/time.txt" >/dev/null
-status=$?
-set -e
-if [ "$status" -ne 0 ]; then
-  echo "ws_job_full: the job failed with status $status" >&2
-  cat "$job/Vanterra.working_error" >&2 || true
-  exit 1
-fi
-wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
-  "$job/time.txt")
-peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
+bench_run_job "$threads" "$job" "$exe" "main_focussing_asar_WS#$job/job.txt"
 cycle_ms=$(SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="$threads" \
   "$build/bench/bench_ws_transforms" --benchmark_format=csv 2>/dev/null | awk -F, '/BM_WsCycleTransforms/ {print $3}')
 
 echo
 echo "WS job, ${bursts} bursts of ${samples} samples, ${threads} threads"
-grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /' || true
-line=$(awk -v w="$wall" -v p="$peak_kb" -v c="$cycle_ms" -v b="$bursts" 'BEGIN {
-  bare = c * b / 1000.0
-  printf "  wall time            %9.2f s\n", w
-  printf "  peak memory          %9.2f GiB\n", p / 1048576.0
-  printf "  bare transforms      %9.2f s (%.2f ms a burst cycle)\n", bare, c
-  printf "  job / bare           %9.2f\n", w / bare
-}')
+bench_stages "$job/Vanterra.log"
+line=$(bench_figures "$(awk -v c="$cycle_ms" -v b="$bursts" 'BEGIN {print c * b / 1000.0}')" \
+  "$(awk -v c="$cycle_ms" 'BEGIN {printf "%.2f ms a burst cycle", c}')" "$(bench_bound_for "$threads")")
 echo "$line"
-summary+="${threads} threads: $(echo "$line" | awk '/wall time/ {w=$3} /peak memory/ {m=$3} /job \/ bare/ {r=$4} END {printf "wall %s s, peak %s GiB, job / bare %s", w, m, r}')"$'\n'
+summary+="$(bench_summary_line "$line" "$threads")"$'\n'
 rm -f "$job"/SS? "$job"/rgfoc_ss?
 done
 echo
+bench_load end
 echo "Summary (${bursts} bursts x ${samples} samples):"
 printf '%s' "$summary" | sed 's/^/  /'
