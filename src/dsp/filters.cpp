@@ -10,11 +10,12 @@
 
 #include "base/diagnostics.hpp"
 #include "dsp/linalg.hpp"
+#include "base/constants.hpp"
 
 namespace sar::dsp {
 namespace {
 
-constexpr double kPi = std::numbers::pi;
+using base::kPi;
 
 void require(const char* what, std::size_t have, std::int64_t need) {
   if (static_cast<std::int64_t>(have) >= need) return;

@@ -17,11 +17,12 @@
 
 #include "base/diagnostics.hpp"
 #include "dsp/filters.hpp"
+#include "base/constants.hpp"
 
 namespace sar::dsp {
 namespace {
 
-constexpr double kPi = std::numbers::pi;
+using base::kPi;
 constexpr int kGridDensity = 16;
 constexpr int kMaxIterations = 60;
 constexpr double kConvergence = 1e-7;

@@ -36,6 +36,7 @@
 #include "multilook/ws_multilook.hpp"
 #include "multilook/wss_input.hpp"
 #include "scansar/wide_swath.hpp"
+#include "base/constants.hpp"
 
 namespace sar::jobs {
 namespace {
@@ -121,7 +122,7 @@ bool focused_sub_swath(const std::string& image, int s, multilook::WsSubSwath& o
   // Near range incidence from the slope of ground range against two-way time, (c/2) / sin(theta):
   // the looks must reach the ground resolution there, where a slant cell is widest on the ground.
   out.incidence = incidence[0];
-  if (toGround[1] > 149896229.0) out.incidence = std::asin(149896229.0 / toGround[1]) * 180.0 / 3.14159265358979323846;
+  if (toGround[1] > 149896229.0) out.incidence = std::asin(149896229.0 / toGround[1]) / base::kDegree;
   // The burst chain already placed each burst's lines around its beam centre, so the burst's
   // middle line is its centre: no centroid shift is to be added.
   out.centroid = 0.0;

@@ -21,13 +21,14 @@
 #include "jobs/annotation.hpp"
 #include "jobs/job_common.hpp"
 #include "jobs/stages.hpp"
+#include "base/constants.hpp"
 
 namespace sar::jobs {
 
 namespace {
 
 constexpr double kCarrier = 5.331e9;
-constexpr double kLightSpeed = 299792458.0;
+constexpr double kLightSpeed = base::kSpeedOfLight;
 
 std::string time_text(double sec85) {
   std::string text;
@@ -182,7 +183,7 @@ std::array<hostlib::GeoCorner, 5> ws_corners(const multilook::WsMultilookResult&
 }
 
 double ground_distance(const hostlib::GeoCorner& a, const hostlib::GeoCorner& b) {
-  constexpr double kRadius = 6371008.8, kDeg = 3.14159265358979323846 / 180.0;
+  constexpr double kRadius = 6371008.8, kDeg = base::kDegree;
   const double dlat = (b.latitude - a.latitude) * kDeg, dlon = (b.longitude - a.longitude) * kDeg;
   const double h = std::sin(0.5 * dlat) * std::sin(0.5 * dlat) +
                    std::cos(a.latitude * kDeg) * std::cos(b.latitude * kDeg) * std::sin(0.5 * dlon) * std::sin(0.5 * dlon);

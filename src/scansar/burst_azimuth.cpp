@@ -32,12 +32,13 @@
 #include "scansar/files.hpp"
 #include "scansar/wide_swath.hpp"
 #include "stripmap/azimuth_focus.hpp"
+#include "base/constants.hpp"
 
 namespace sar::scansar {
 namespace {
 constexpr int kRejected = 10;
-constexpr double kPi = 3.14159265358979323846;
-constexpr double kC = 299792458.0;
+using base::kPi;
+constexpr double kC = base::kSpeedOfLight;
 constexpr int kMargin = 32;
 constexpr int32_t kScaleNode = 16;
 constexpr double kPassBand = 0.75, kStopBand = 2.0;  // in burst bandwidths

@@ -22,12 +22,13 @@
 #include "base/run_services.hpp"
 #include "scansar/wide_swath.hpp"
 #include "stripmap/geopoly.hpp"
+#include "base/constants.hpp"
 
 namespace sar::scansar {
 namespace {
 constexpr int kRejected = 10;
-constexpr double kPi = 3.14159265358979323846;
-constexpr double kC = 299792458.0;
+using base::kPi;
+constexpr double kC = base::kSpeedOfLight;
 constexpr int kColumnBlock = 32;
 constexpr int kAmbiguitySpan = 10;
 constexpr std::size_t kSlopeBlocks = 8;

@@ -17,11 +17,12 @@
 #include "scansar/files.hpp"
 #include "scansar/wide_swath.hpp"
 #include "stripmap/range_focus.hpp"
+#include "base/constants.hpp"
 
 namespace sar::scansar {
 namespace {
 constexpr int kRejected = 10;
-constexpr double kPi = 3.14159265358979323846;
+using base::kPi;
 }  // namespace
 
 int burst_range_focus(const std::string& dir, int s, const sarpar& channel, const scansar& scan, const wsparm& par,

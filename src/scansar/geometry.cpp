@@ -7,11 +7,12 @@
 #include "base/diagnostics.hpp"
 #include "dsp/fft.hpp"
 #include "scansar/wide_swath.hpp"
+#include "base/constants.hpp"
 
 namespace sar::scansar {
 namespace {
 constexpr int kRejected = 10;
-constexpr double kPi = 3.14159265358979323846;
+using base::kPi;
 
 int reject(const std::string& why) {
   base::report(base::kReportError, "Wide swath acquisition: " + why);

@@ -7,6 +7,7 @@
 #include "base/stage_clock.hpp"
 #include "geometry/geolocation.hpp"
 #include "scansar/wide_swath.hpp"
+#include "base/constants.hpp"
 
 namespace sar::scansar {
 using base::StageClock;
@@ -23,7 +24,7 @@ SceneCorners get_coords(const scansar& scan, const wsparm& par, const RangeFocus
     rec.state_vectors[k] = {refs.orbitPositions[3 * k], refs.orbitPositions[3 * k + 1], refs.orbitPositions[3 * k + 2]};
   rec.t0 = refs.orbitStartTime;
   rec.dt = refs.orbitSpacing;
-  rec.wavelength = 299792458.0 / scan.carrierFrequency;
+  rec.wavelength = base::kSpeedOfLight / scan.carrierFrequency;
   rec.side = 1.0;
   rec.height = 0.0;
   rec.fdc = 0.0;

@@ -23,17 +23,18 @@
 #include <vector>
 
 #include "dsp/fft.hpp"
+#include "base/constants.hpp"
 
 namespace sar::stripmap {
 
 using fcomplex = std::complex<float>;
 
-inline constexpr double kC = 299792458.0;
+inline constexpr double kC = base::kSpeedOfLight;
 inline constexpr double kHalfC = 149896229.0;
 inline constexpr double kQuarterC = 74948114.5;
 inline constexpr double kTwoOverC = 6.671281903963041e-09;
 inline constexpr double kFourPiOverC = 4.191690043903363e-08;
-inline constexpr double kPi = 3.14159265358979323846;
+inline constexpr double kPi = base::kPi;
 
 /// Parameters of one block.
 struct wkparm {

@@ -16,6 +16,7 @@
 #include "stripmap/raster_files.hpp"
 #include "io/line_store.hpp"
 #include "dsp/fft.hpp"
+#include "base/constants.hpp"
 
 namespace sar::stripmap {
 
@@ -262,7 +263,7 @@ dsp::cvector replica_spectrum(const sarpar& par, const procparm& proc, const Ran
   for (int k = 0; k < L; ++k) {
     const double f = (k < (L + 1) / 2 ? k : k - L) / static_cast<double>(L);
     const std::complex<double> c = std::conj(std::complex<double>(h[static_cast<std::size_t>(k)])) *
-                                   std::polar(1.0, 2.0 * 3.14159265358979323846 * f * lead);
+                                   std::polar(1.0, base::kTwoPi * f * lead);
     h[static_cast<std::size_t>(k)] = fcomplex(static_cast<float>(c.real()), static_cast<float>(c.imag()));
   }
   return h;

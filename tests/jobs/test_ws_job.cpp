@@ -620,7 +620,10 @@ UniformFigures measure_uniform(const Image& im, const sim::SimulationTruth& trut
 
 std::string figures_text(const std::vector<double>& v) {
   std::string s;
-  for (double x : v) s += (s.empty() ? "" : " ") + std::to_string(x);
+  for (double x : v) {
+    if (!s.empty()) s += ' ';
+    s += std::to_string(x);
+  }
   return s;
 }
 

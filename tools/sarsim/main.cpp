@@ -32,6 +32,7 @@
 
 #include "base/command_line.hpp"
 #include "simulator/simulator.hpp"
+#include "base/constants.hpp"
 
 namespace {
 
@@ -41,7 +42,7 @@ const char* const kInsTemplate =
 const char* const kXcaTemplate =
     SARSIM_REAL_DATA_DIR "/ASA_XCA_AX/ASA_XCA_AXVIEC20101111_113830_20100601_000000_20141231_000000";
 
-constexpr double kPi = 3.14159265358979323846;
+using sar::base::kPi;
 constexpr long long kMaxCount = 100000000;
 
 }  // namespace

@@ -10,6 +10,7 @@
 // The velocity is the exact time derivative of the position, so an orbit file sampled every
 // 60 s interpolates back to the model far below a millimetre.
 #include <cmath>
+#include "base/constants.hpp"
 
 namespace sar::simulator {
 
@@ -24,8 +25,8 @@ struct Vec3 {
   Vec3 unit() const { return *this * (1.0 / norm()); }
 };
 
-inline constexpr double kPi = 3.14159265358979323846;
-inline constexpr double kSpeedOfLight = 299792458.0;
+using base::kPi;
+using base::kSpeedOfLight;
 inline constexpr double kEarthRotation = 7.292115189334571e-05;  // rad/s
 inline constexpr double kWgs84A = 6378137.0;
 inline constexpr double kWgs84B = 6356752.314245;

@@ -14,12 +14,13 @@
 #include "geometry/orbit_file.hpp"
 #include "geometry/orbit_interp.hpp"
 #include "simulator/header_text.hpp"
+#include "base/constants.hpp"
 
 namespace sar::simulator {
 
 namespace {
 
-constexpr double kC = 299792458.0;
+constexpr double kC = sar::base::kSpeedOfLight;
 constexpr int64_t kMppBytes = 2009;
 constexpr int64_t kDccBytes = 55;
 constexpr int64_t kGeoBytes = 521;
