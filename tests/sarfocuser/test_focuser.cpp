@@ -50,7 +50,7 @@ struct Focused {
       conf.az.AzimuthWindowHammingParameter = 0.0;
     }
     focuser = std::make_unique<sarfocuser::SARFocuser>(conf, sarfocuser::SARFocuser_input{rq.raw_path, rq.chirp_path, ""},
-                                                       sarfocuser::SARFocuser_output{(dir / "scene_slc").string()}, acq);
+                                                       sarfocuser::SARFocuser_output{(dir / "scene_slc").string()});
     status = focuser->run();
     if (status != 0) return;
     const auto& p = focuser->proc();
@@ -188,4 +188,38 @@ TEST(Focuser, CentroidOfSixPrfsEstimatedFromClutterPutsTheTargetAtZeroDoppler) {
   // moves by an eighth of a line.
   EXPECT_NEAR(m.peak_line, line, 0.1);
   EXPECT_NEAR(m.peak_sample, sample, 0.1);
+}
+
+TEST(Focuser, RawDataSetWithoutItsDescriptionIsRefusedBeforeAnyStage) {
+  const fs::path dir = fs::temp_directory_path() / ("rsat_focus_nodesc_" + std::to_string(::getpid()));
+  fs::remove_all(dir);
+  fs::create_directories(dir);
+  const std::string raw = (dir / "RAW").string(), chirp = (dir / "CHIRP").string();
+  std::ofstream(raw) << "lines";
+  std::ofstream(chirp) << "replica";
+  sarfocuser::SARFocuser_conf conf;
+  conf.readconf(std::string(SAR_DATA_DIR) + "/parameters_RS.hdr");
+  for (const bool partial : {false, true}) {
+    SCOPED_TRACE(partial ? "a record missing" : "no description");
+    if (partial) {
+      // Everything a raw set has but its pulse.
+      io::GeneralSAR gs;
+      gs.dataFile.lines = 1;
+      gs.dataFile.pixels = 5;
+      gs.roi.SetFastAxe(0.0067, 1e-7, 5);
+      gs.sampling.prf_hz = 1257.0;
+      gs.stateVectors.SVCreate(0.0, 30.0, 5);
+      gs.info.SceneID = "x";
+      for (io::GSObject s : {io::kGSDataFile, io::kGSRoi, io::kGSSamplingConstants, io::kGSStateVectors,
+                             io::kGSDataSetInfo, io::kGSSensorAttitude, io::kGSSwathInfo})
+        gs.GSenable(s);
+      ASSERT_EQ(gs.GSwrite(raw + ".hdr"), 0);
+    }
+    sarfocuser::SARFocuser f(conf, {raw, chirp, ""}, {(dir / "scene_slc").string()});
+    EXPECT_EQ(f.run(), 10);
+    EXPECT_EQ(f.failed_stage(), "GeneralRAWData::readhdr");
+    EXPECT_FALSE(fs::exists(dir / "scene_slc"));
+    EXPECT_FALSE(fs::exists(dir / "scene_slc.rgfoc"));
+  }
+  fs::remove_all(dir);
 }
