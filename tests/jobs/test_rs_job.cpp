@@ -10,6 +10,7 @@
 #include "analyser/irf.hpp"
 #include "base/convert.hpp"
 #include "io/general_sar.hpp"
+#include "multilook/strip_multilook.hpp"
 #include "job_harness.hpp"
 #include "simulator/rsat_product.hpp"
 #include "test_standalone_support.hpp"
@@ -95,6 +96,17 @@ TEST(RsJob, SimulatedProductFocusesThroughFocussing) {
   const std::string trace = slurp(job.dir() / "Vanterra.trace_save");
   EXPECT_NE(trace.find("Trying to read " + root.string() + "_slc.hdr, returning with result 0"), std::string::npos);
   EXPECT_NE(trace.find("Trying to write (BandWidth = 17280000.000000)"), std::string::npos);
+
+  // The stripmap multilook reads the product as it reads an IM one: raster header, annotation
+  // grid and orbit (ground range needs the state vectors).
+  multilook::StripMultilookRequest ml;
+  ml.slc = root.string() + "_slc";
+  ml.output = (job.dir() / "out" / "scene_gr").string();
+  ml.groundRange = true;
+  multilook::StripMultilookResult mr;
+  ASSERT_EQ(multilook::run_strip_multilook(ml, mr), 0) << mr.error;
+  EXPECT_NEAR(mr.firstLineTime, slc.roi.slowStart, 0.5 * mr.lineStep);
+  EXPECT_GT(mr.samples, 0);
   EXPECT_EQ(value_of(hdr, "SensorName"), "\"RADARSAT-1\"");
   EXPECT_EQ(value_of(hdr, "Swath"), "S3|");
   EXPECT_EQ(hdr.find("EnvisatTwoWayAntennaElevationPatternTable"), std::string::npos);
