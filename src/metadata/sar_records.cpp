@@ -9,6 +9,8 @@ namespace sar::metadata {
 namespace {
 
 constexpr double kIntMax = std::numeric_limits<int32_t>::max();
+// A header is untrusted input: its counts size buffers only up to what a data set can hold.
+constexpr int32_t kMaxBursts = 1000000;
 
 // Reads a record whose buffers are sized by counts in the same section: the counts first
 // (their own binding), then the buffers, then everything.
@@ -151,7 +153,7 @@ int SpectralWindows_Obj::clone(const SpectralWindows_Obj& other) {
 }
 
 int SwathInfo::createBuffers() {
-  if (Bursts < 0) return 1;
+  if (Bursts < 0 || Bursts > kMaxBursts) return 1;
   BurstTimes.assign(static_cast<std::size_t>(Bursts), 0.0);
   return 0;
 }
@@ -163,7 +165,7 @@ int SwathInfo::destroyBuffers() {
 
 int SwathInfo::refreshParameters() {
   createElementsVector(13);
-  addElementInt("Bursts", &Bursts, 1, 0.0, kIntMax, false);
+  addElementInt("Bursts", &Bursts, 1, 0.0, kMaxBursts, false);
   if (countsOnly_) return 0;
   addElementInt("Rank", &Rank, 1, 0.0, 0.0, false);
   addElementDouble("Rgate_bias", &Rgate_bias, 1, 0.0, 0.0, false);

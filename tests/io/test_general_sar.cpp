@@ -144,3 +144,33 @@ TEST_F(GeneralSarTest, MissingHeaderIsAnErrorAbsentRecordsAreNot) {
   ASSERT_EQ(gs.GSread(file("empty.hdr")), 0);
   for (int s = 0; s < kGSObjects; ++s) EXPECT_FALSE(gs.GSexists(static_cast<GSObject>(s))) << s;
 }
+
+TEST_F(GeneralSarTest, DamagedHeadersGiveAbsentRecordsNeverACrash) {
+  const std::string xmlHead = "<?xml version=\"1.0\"?>\n<OmbrixXmlDoc><Description>x</Description>"
+                              "<NumberOfChannels>1</NumberOfChannels><Channel Number=\"1\">";
+  const struct {
+    const char* name;
+    std::string text;
+  } cases[] = {
+      {"binary", std::string("\x00\x01\xff\xfe[[[=\n\x80", 10)},
+      {"truncated xml", xmlHead + "<SamplingConstants><fc_hz>5.3e9</fc"},
+      {"huge vector count", "[StateVectorData]\nnStateVectors = 2000000000\nTimeFirst = 1\nTimeDelta = 1\n"},
+      {"vector count without vectors", "[StateVectorData]\nnStateVectors = 5\nTimeFirst = 1\nTimeDelta = 1\npos = {1 2 3}\n"},
+      {"negative pattern", "[AntennaPattern]\nPatternSamples = -5\n"},
+      {"huge burst count", "[SwathInfo]\nBursts = 2147483647\n"},
+      {"raster of impossible size", "[RasterInfo]\nNrOfLinesPerImage = -3\nNrOfPixelsPerLine = 5\n"},
+      {"text for numbers", "[SamplingConstants]\nfc_hz = fast\nfrg_hz = 1\nBrg_hz = 1\nTrg_s = 1\nprf_hz = 1\n"
+                           "pri_s = 1\nBaz_hz = 1\nbrf_hz = 0\nbri_s = 0\nlambda_m = 1\n"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    const std::string raster = file(sar::io::test::numbered("damaged", static_cast<int>(&c - cases)));
+    const std::string path = header_of(raster);
+    std::ofstream(path, std::ios::binary) << c.text;
+    GeneralSAR gs;
+    EXPECT_EQ(gs.GSread(path), 0);
+    for (int s = 0; s < kGSObjects; ++s) EXPECT_FALSE(gs.GSexists(static_cast<GSObject>(s))) << s;
+    GeneralRAWData raw;
+    EXPECT_NE(raw.readhdr(raster), 0);
+  }
+}
