@@ -58,11 +58,10 @@ int write_fixed(GeneralSAR& gs, const std::string& raster, std::span<const GSObj
   return gs.GSwrite(header_of(raster));
 }
 
-constexpr std::array<GSObject, 8> kRawSlots = {kGSDataFile,    kGSRoi,           kGSSamplingConstants,
-                                                       kGSStateVectors, kGSPulse,        kGSDataSetInfo,
-                                                       kGSSensorAttitude, kGSSwathInfo};
+constexpr std::array<GSObject, 8> kRawSlots = {kGSDataFile, kGSRoi,         kGSSamplingConstants, kGSStateVectors,
+                                               kGSPulse,    kGSDataSetInfo, kGSSensorAttitude,    kGSSwathInfo};
 constexpr std::array<GSObject, 11> kSlcSlots = {
-    kGSDataFile, kGSRoi,           kGSPolySAR,         kGSSamplingConstants, kGSStateVectors, kGSPulse,
+    kGSDataFile,       kGSRoi,         kGSPolySAR,        kGSSamplingConstants, kGSStateVectors, kGSPulse,
     kGSAntennaPattern, kGSDataSetInfo, kGSSensorAttitude, kGSSpectralWindows,   kGSGeoCoords};
 
 }  // namespace
@@ -86,21 +85,35 @@ int GSBufferFile_Obj::writehdr(const std::string& path) { return BufferFile::wri
 
 metadata::GeneralSAR_Base& GeneralSAR::GSget(GSObject slot) {
   switch (slot) {
-    case kGSDataFile: return dataFile;
-    case kGSRoi: return roi;
-    case kGSPolySAR: return polys;
-    case kGSSamplingConstants: return sampling;
-    case kGSStateVectors: return stateVectors;
-    case kGSOrbit: return orbit;
-    case kGSPulse: return pulse;
-    case kGSAntennaPattern: return pattern;
-    case kGSDataSetInfo: return info;
-    case kGSSensorAttitude: return attitude;
-    case kGSSpectralWindows: return windows;
-    case kGSGeoCoords: return corners;
-    case kGSSwathInfo: return swath;
+    case kGSDataFile:
+      return dataFile;
+    case kGSRoi:
+      return roi;
+    case kGSPolySAR:
+      return polys;
+    case kGSSamplingConstants:
+      return sampling;
+    case kGSStateVectors:
+      return stateVectors;
+    case kGSOrbit:
+      return orbit;
+    case kGSPulse:
+      return pulse;
+    case kGSAntennaPattern:
+      return pattern;
+    case kGSDataSetInfo:
+      return info;
+    case kGSSensorAttitude:
+      return attitude;
+    case kGSSpectralWindows:
+      return windows;
+    case kGSGeoCoords:
+      return corners;
+    case kGSSwathInfo:
+      return swath;
     case kGSBufferFile:
-    case kGSObjects: break;
+    case kGSObjects:
+      break;
   }
   return buffer;
 }

@@ -69,10 +69,15 @@ int SamplingConstants_Obj::clone(const SamplingConstants_Obj& other) {
 
 int DataSetInfo_Obj::refreshParameters() {
   createElementsVector(36);
-  for (auto [name, field] : {std::pair{"OrbitNumber", &OrbitNumber}, {"Track", &Track}, {"SenseDate", &SenseDate},
-                             {"SceneID", &SceneID}, {"Description", &Description},
-                             {"AcquisitionStation", &AcquisitionStation}, {"ProcessingCenter", &ProcessingCenter},
-                             {"ProcessingDate", &ProcessingDate}, {"ProcessingSoftware", &ProcessingSoftware}})
+  for (auto [name, field] : {std::pair{"OrbitNumber", &OrbitNumber},
+                             {"Track", &Track},
+                             {"SenseDate", &SenseDate},
+                             {"SceneID", &SceneID},
+                             {"Description", &Description},
+                             {"AcquisitionStation", &AcquisitionStation},
+                             {"ProcessingCenter", &ProcessingCenter},
+                             {"ProcessingDate", &ProcessingDate},
+                             {"ProcessingSoftware", &ProcessingSoftware}})
     addElementString(name, field, true);
   addElementDouble("SceneHeading", &SceneHeading, 1, 0.0, 0.0, false);
   addElementString("OrbitConfiguration", &OrbitConfiguration, false);
@@ -86,8 +91,10 @@ int DataSetInfo_Obj::refreshParameters() {
   addElementDouble("ExternalCalibrationFactor", &ExternalCalibrationFactor, 1, 0.0, 0.0, false);
   addElementString("Projection", &Projection, false);
   addElementString("ImageType", &ImageType, false);
-  for (auto [name, field] : {std::pair{"RGAntenna_flag", &RGAntenna_flag}, {"AZAntenna_flag", &AZAntenna_flag},
-                             {"SpreadLoss_flag", &SpreadLoss_flag}, {"DroopGain_flag", &DroopGain_flag},
+  for (auto [name, field] : {std::pair{"RGAntenna_flag", &RGAntenna_flag},
+                             {"AZAntenna_flag", &AZAntenna_flag},
+                             {"SpreadLoss_flag", &SpreadLoss_flag},
+                             {"DroopGain_flag", &DroopGain_flag},
                              {"RGAntenna_AltitudeCorr_flag", &RGAntenna_AltitudeCorr_flag},
                              {"NoiseCorr_flag", &NoiseCorr_flag}})
     addElementInt(name, field, 1, 0.0, 1.0, false);

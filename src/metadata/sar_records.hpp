@@ -38,8 +38,8 @@ class SamplingConstants_Obj : public SectionRecord {
 /// Section "DataSetInfo": where the data come from.
 class DataSetInfo_Obj : public SectionRecord {
  public:
-  std::string OrbitNumber, Track, SenseDate, SceneID, Description, AcquisitionStation, ProcessingCenter,
-      ProcessingDate, ProcessingSoftware;
+  std::string OrbitNumber, Track, SenseDate, SceneID, Description, AcquisitionStation, ProcessingCenter, ProcessingDate,
+      ProcessingSoftware;
   double SceneHeading = 0.0;
   std::string OrbitConfiguration, Polarization, Swath;
   double SWST_MIN = 0.0, SWST_MAX = 0.0, RO_REF = 0.0;

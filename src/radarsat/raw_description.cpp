@@ -8,6 +8,7 @@
 #include "base/diagnostics.hpp"
 #include "geometry/orbit_interp.hpp"
 #include "io/general_sar.hpp"
+#include "io/vrt_sidecar.hpp"
 #include "radarsat/extract.hpp"
 
 namespace sar::radarsat {
@@ -87,7 +88,7 @@ void write_raw_description(const Acquisition& a, const ExtractRequest& rq) {
   auto& info = raw.info;
   const auto& dss = a.leader.dss;
   info.OrbitNumber = dss.orbit_number.empty() ? "0" : dss.orbit_number;
-  info.Track = "0";
+  info.Track = std::string(1, '0');  // (a literal assignment trips a false -Wrestrict of GCC 12)
   info.SenseDate = time_text(a.first_line_time);
   info.SceneID = dss.scene_id.empty() ? "unknown" : dss.scene_id;
   info.Description = "StripMap RAW Data File";
@@ -122,10 +123,11 @@ void write_raw_description(const Acquisition& a, const ExtractRequest& rq) {
   chirp.pixels = a.replica_samples;
   chirp.cellType = io::kFloatComplex;
   if (raw.writehdr(rq.raw_path) != 0 || chirp.write_hdr() != 0) {
-    for (const std::string& f : {rq.raw_path + ".hdr", rq.raw_path + ".vrt", rq.chirp_path + ".hdr",
-                                 rq.chirp_path + ".vrt"})
-      remove_quietly(f);
-    ceos_fail(rq.raw_path + ".hdr", -1, "the extracted data set's description cannot be written");
+    for (const std::string& raster : {rq.raw_path, rq.chirp_path}) {
+      remove_quietly(io::header_of(raster));
+      remove_quietly(io::vrt_sidecar_path(raster));
+    }
+    ceos_fail(io::header_of(rq.raw_path), -1, "the extracted data set's description cannot be written");
   }
 }
 

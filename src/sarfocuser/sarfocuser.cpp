@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <span>
 
+#include "base/constants.hpp"
 #include "base/diagnostics.hpp"
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
@@ -21,7 +22,7 @@
 namespace sar::sarfocuser {
 namespace {
 
-constexpr double kSpeedOfLight = 299792458.0;
+using base::kSpeedOfLight;
 constexpr double kEarthRotation = 7.292115189334571e-05;
 constexpr double kWgs84A = 6378137.0, kWgs84B = 6356752.314245;
 constexpr double kAntennaLength = 15.0;
@@ -341,7 +342,8 @@ int SARFocuser::writeheaders() {
   slc.attitude.clone(raw_.attitude);
   slc.attitude.Eq_speed = proc_.equivalentVelocity;
   slc.attitude.Mean_DC = centroid_;
-  slc.attitude.SquintAngle = std::asin(std::clamp(raw_.sampling.lambda_m * centroid_ / (2.0 * proc_.equivalentVelocity), -1.0, 1.0)) * 180.0 / M_PI;
+  const double sine = raw_.sampling.lambda_m * centroid_ / (2.0 * proc_.equivalentVelocity);
+  slc.attitude.SquintAngle = std::asin(std::clamp(sine, -1.0, 1.0)) / base::kDegree;
   slc.windows.RgMatchedFilterType = "HAMMING";
   slc.windows.AzMatchedFilterType = "HAMMING";
   slc.windows.RgMatchedFilterCoef = conf_.az.RangeWindowHammingParameter;

@@ -1,9 +1,9 @@
 // Data set containers: what GSwrite puts in a header GSread finds again, slot by slot; the
 // fixed raw and focused sets refuse a header that lacks one of their records.
-#include <gtest/gtest.h>
-
 #include <fstream>
 #include <string>
+
+#include <gtest/gtest.h>
 
 #include "io/general_sar.hpp"
 #include "io_test_util.hpp"
@@ -42,10 +42,10 @@ void describe_raw(GeneralSAR& gs, const std::string& raster) {
   gs.pulse.PulseKRate = 17.28e6 / 42e-6;
   gs.pulse.PulseEnergy = 1.0;
   gs.pulse.PulseSamplingRate = 18.47e6;
-  for (std::string* s : {&gs.info.OrbitNumber, &gs.info.Track, &gs.info.SenseDate, &gs.info.SceneID,
-                         &gs.info.Description, &gs.info.AcquisitionStation, &gs.info.ProcessingCenter,
-                         &gs.info.ProcessingDate, &gs.info.ProcessingSoftware})
-    *s = "x";
+  for (std::string* s :
+       {&gs.info.OrbitNumber, &gs.info.Track, &gs.info.SenseDate, &gs.info.SceneID, &gs.info.Description,
+        &gs.info.AcquisitionStation, &gs.info.ProcessingCenter, &gs.info.ProcessingDate, &gs.info.ProcessingSoftware})
+    *s = std::string(1, 'x');
   gs.info.SensorName = "RADARSAT-1";
   gs.info.Swath = "S3";
   gs.attitude.AntennaLength = 15.0;
@@ -61,8 +61,9 @@ TEST_F(GeneralSarTest, WrittenSlotsReadBackAndOnlyThey) {
   };
   const Case cases[] = {
       {"raster and region", {kGSDataFile, kGSRoi}},
-      {"raw set", {kGSDataFile, kGSRoi, kGSSamplingConstants, kGSStateVectors, kGSPulse, kGSDataSetInfo,
-                   kGSSensorAttitude, kGSSwathInfo}},
+      {"raw set",
+       {kGSDataFile, kGSRoi, kGSSamplingConstants, kGSStateVectors, kGSPulse, kGSDataSetInfo, kGSSensorAttitude,
+        kGSSwathInfo}},
       {"records without raster", {kGSSamplingConstants, kGSPulse, kGSAntennaPattern, kGSGeoCoords}},
   };
   for (const Case& c : cases) {
@@ -146,21 +147,24 @@ TEST_F(GeneralSarTest, MissingHeaderIsAnErrorAbsentRecordsAreNot) {
 }
 
 TEST_F(GeneralSarTest, DamagedHeadersGiveAbsentRecordsNeverACrash) {
-  const std::string xmlHead = "<?xml version=\"1.0\"?>\n<OmbrixXmlDoc><Description>x</Description>"
-                              "<NumberOfChannels>1</NumberOfChannels><Channel Number=\"1\">";
+  const std::string xmlHead =
+      "<?xml version=\"1.0\"?>\n<OmbrixXmlDoc><Description>x</Description>"
+      "<NumberOfChannels>1</NumberOfChannels><Channel Number=\"1\">";
   const struct {
     const char* name;
     std::string text;
   } cases[] = {
       {"binary", std::string("\x00\x01\xff\xfe[[[=\n\x80", 10)},
-      {"truncated xml", xmlHead + "<SamplingConstants><fc_hz>5.3e9</fc"},
+      {"truncated xml", std::string(xmlHead).append("<SamplingConstants><fc_hz>5.3e9</fc")},
       {"huge vector count", "[StateVectorData]\nnStateVectors = 2000000000\nTimeFirst = 1\nTimeDelta = 1\n"},
-      {"vector count without vectors", "[StateVectorData]\nnStateVectors = 5\nTimeFirst = 1\nTimeDelta = 1\npos = {1 2 3}\n"},
+      {"vector count without vectors",
+       "[StateVectorData]\nnStateVectors = 5\nTimeFirst = 1\nTimeDelta = 1\npos = {1 2 3}\n"},
       {"negative pattern", "[AntennaPattern]\nPatternSamples = -5\n"},
       {"huge burst count", "[SwathInfo]\nBursts = 2147483647\n"},
       {"raster of impossible size", "[RasterInfo]\nNrOfLinesPerImage = -3\nNrOfPixelsPerLine = 5\n"},
-      {"text for numbers", "[SamplingConstants]\nfc_hz = fast\nfrg_hz = 1\nBrg_hz = 1\nTrg_s = 1\nprf_hz = 1\n"
-                           "pri_s = 1\nBaz_hz = 1\nbrf_hz = 0\nbri_s = 0\nlambda_m = 1\n"},
+      {"text for numbers",
+       "[SamplingConstants]\nfc_hz = fast\nfrg_hz = 1\nBrg_hz = 1\nTrg_s = 1\nprf_hz = 1\n"
+       "pri_s = 1\nBaz_hz = 1\nbrf_hz = 0\nbri_s = 0\nlambda_m = 1\n"},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);

@@ -1,7 +1,5 @@
 // The data set records: every bound field of every record comes back as written, in both header
 // dialects; a missing required element or a value out of its range makes the record absent.
-#include <gtest/gtest.h>
-
 #include <unistd.h>
 
 #include <cmath>
@@ -11,6 +9,8 @@
 #include <memory>
 #include <string>
 #include <variant>
+
+#include <gtest/gtest.h>
 
 #include "base/profile.hpp"
 #include "metadata/sar_records.hpp"
@@ -37,10 +37,14 @@ void fill(GeneralSAR_BaseXML& r) {
       std::visit(
           [&](auto p) {
             using P = decltype(p);
-            if constexpr (std::is_same_v<P, double*>) p[i] = v * 1.000000123;
-            else if constexpr (std::is_same_v<P, float*>) p[i] = static_cast<float>(v);
-            else if constexpr (std::is_same_v<P, int32_t*> || std::is_same_v<P, int64_t*>) p[i] = static_cast<int>(v);
-            else if constexpr (std::is_same_v<P, std::string*>) p[i] = "text " + std::to_string(k) + " " + e.name;
+            if constexpr (std::is_same_v<P, double*>)
+              p[i] = v * 1.000000123;
+            else if constexpr (std::is_same_v<P, float*>)
+              p[i] = static_cast<float>(v);
+            else if constexpr (std::is_same_v<P, int32_t*> || std::is_same_v<P, int64_t*>)
+              p[i] = static_cast<int>(v);
+            else if constexpr (std::is_same_v<P, std::string*>)
+              p[i] = "text " + std::to_string(k) + " " + e.name;
           },
           e.address);
     }

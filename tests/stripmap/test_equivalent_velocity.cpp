@@ -2,9 +2,9 @@
 // block's two ends, against a hyperbolic geometry whose beam-centre centroid changes across the
 // block (an unsteered platform: several PRFs of centroid, a steep range slope). The rate at
 // either end is that of the beam centre there, so the fit must see either end's squint.
-#include <gtest/gtest.h>
-
 #include <cmath>
+
+#include <gtest/gtest.h>
 
 #include "stripmap/omegak.hpp"
 
@@ -15,10 +15,10 @@ constexpr double kF0 = 5.3e9;
 constexpr double kFs = 18.47e6;
 
 struct Geometry {
-  double V;       // m/s
-  double tau1;    // two-way time of the block's first sample, s
-  double fd1;     // beam-centre centroid there, Hz
-  double slope;   // its change with two-way time, Hz/s
+  double V;      // m/s
+  double tau1;   // two-way time of the block's first sample, s
+  double fd1;    // beam-centre centroid there, Hz
+  double slope;  // its change with two-way time, Hz/s
   int samples;
 
   double lambda() const { return kC / kF0; }
