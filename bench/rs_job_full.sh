@@ -8,20 +8,21 @@
 #
 # The simulated product (clutter of the unsteered beam, about six PRFs of centroid, and point
 # targets) is kept in $SAR_BENCH_DIR (default out/bench_rs) and reused by later runs of the same
-# size. The job runs with the shipped parameter file.
+# size. The job runs with the shipped parameter file, with the bound of ../shared/perfbound
+# measured in the same run (SAR_BENCH_NO_BOUND=1 leaves it out).
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
+source "$here/bench/measure.sh"
 lines="${1:-25000}"
 samples="${2:-6000}"
 threads="${3:-2}"
 work="${SAR_BENCH_DIR:-$here/out/bench_rs}"
 
-if [ ! -x /usr/bin/time ]; then
-  echo "rs_job_full: /usr/bin/time is needed for the peak memory (Debian package 'time')" >&2
-  exit 2
-fi
+bench_need_time
 cmake --build "$build" -j2 --target sarsim-rs focussing bench_scene_transforms >/dev/null
+bench_load start
+bench_bound
 
 input="$work/input_${lines}x${samples}"
 if [ ! -s "$input/dat_01.001" ]; then
@@ -39,34 +40,16 @@ exe="$build/src/jobs/focussing"
   --arg 12=OK --arg 13=1.0 >/dev/null
 
 echo "== focussing (${threads} threads)"
-set +e
-OMP_NUM_THREADS="$threads" VANTERRA_INIT_DIR="$job" /usr/bin/time -v "$exe" "main_focussing_asar_RS#$job/job.txt" \
-  2>"$job/time.txt" >/dev/null
-status=$?
-set -e
-if [ "$status" -ne 0 ]; then
-  echo "rs_job_full: the job failed with status $status" >&2
-  cat "$job/Vanterra.working_error" >&2 || true
-  exit 1
-fi
-wall=$(awk -F': ' '/Elapsed \(wall clock\)/ {n = split($2, p, ":"); s = 0; for (i = 1; i <= n; i++) s = s * 60 + p[i]; print s}' \
-  "$job/time.txt")
-peak_kb=$(awk -F': ' '/Maximum resident set size/ {print $2}' "$job/time.txt")
+bench_run_job "$threads" "$job" "$exe" "main_focussing_asar_RS#$job/job.txt"
 
 echo "== bare transforms of the same scene"
-bare=$(SAR_BENCH_LINES="$lines" SAR_BENCH_SAMPLES="$samples" SAR_BENCH_THREADS="$threads" \
-  "$build/bench/bench_scene_transforms" --benchmark_format=csv 2>/dev/null | grep '^"BM_')
-range_ms=$(echo "$bare" | awk -F, '/BM_RangeLines/ {print $3}')
-azimuth_ms=$(echo "$bare" | awk -F, '/BM_AzimuthColumns/ {print $3}')
+read -r range_ms azimuth_ms <<<"$(bench_bare "$lines" "$samples" "$threads")"
+bare=$(awk -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {printf "%.3f", (r + a) / 1000.0}')
 
 echo
 echo "RS job, ${lines} lines x ${samples} samples, ${threads} threads"
-grep -o "Stage time .*" "$job/Vanterra.log" | sed 's/^Stage time /  stage /'
+bench_stages "$job/Vanterra.log"
 grep -E "SLC: |Doppler centroid" "$job/Vanterra.log" | sed 's/^/  /'
-awk -v w="$wall" -v p="$peak_kb" -v r="$range_ms" -v a="$azimuth_ms" 'BEGIN {
-  bare = (r + a) / 1000.0
-  printf "  wall time            %9.2f s\n", w
-  printf "  peak memory          %9.2f GiB\n", p / 1048576.0
-  printf "  bare transforms      %9.2f s (range lines %.2f s, azimuth columns %.2f s)\n", bare, r / 1000.0, a / 1000.0
-  printf "  job / bare           %9.2f\n", w / bare
-}'
+bench_figures "$bare" "$(awk -v r="$range_ms" -v a="$azimuth_ms" \
+  'BEGIN {printf "range lines %.2f s, azimuth columns %.2f s", r / 1000.0, a / 1000.0}')" "$(bench_bound_for "$threads")"
+bench_load end

@@ -77,4 +77,12 @@ int write_stripmap_product(const std::string& headerPath, const sarpar& par, con
 int IMwritepars(const std::string& headerPath, const sarpar& par, const procparm& proc, const dcestconf& dc,
                 const azimuthconf& az, const extconf& extra, const enviauxfiles& files);
 
+/// The product annotation of the RADARSAT job: the focused image's description "<slcPath>.hdr"
+/// read back with GSread (traced), its grid, rates, pulse, orbit block and polynomials written
+/// as the stripmap annotation `headerPath` with RADARSAT-1's literals, then the description.
+/// What the description does not carry (corners, angles, spacings) comes from the focuser's
+/// records. 0, or 1 with a report when the description is missing or lacks a record.
+int RSMwritepars(const std::string& headerPath, const std::string& slcPath, const sarpar& par, const procparm& proc,
+                 const azimuthconf& az);
+
 }  // namespace sar::jobs

@@ -297,6 +297,7 @@ Acquisition radar_extract(const ExtractRequest& rq) {
   for (std::size_t k = 0; k < replica.size(); ++k)
     replica[k] = std::complex<float>(replicaSum[k] / static_cast<double>(acq.replicas));
   chirp.write(replica.data(), replica.size() * sizeof replica[0]);
+  write_raw_description(acq, rq);
   raw.commit();
   chirp.commit();
   base::report(base::kReportCheckpoint, "Extraction Ended");

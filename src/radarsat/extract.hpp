@@ -72,4 +72,10 @@ DataFileDescriptor read_data_descriptor(const std::string& dataFile);
 /// written under temporary names and appear only when the extraction succeeds.
 Acquisition radar_extract(const ExtractRequest& request);
 
+/// The description of the extracted data set beside its rasters: "<raw>.hdr" holds the raw set
+/// (raster, region, sampling constants, state vectors, pulse, data set info, sensor attitude,
+/// swath info) and "<chirp>.hdr" the replica's raster header. Throws CeosError naming the
+/// header when they cannot be written (and leaves neither behind).
+void write_raw_description(const Acquisition& acquisition, const ExtractRequest& request);
+
 }  // namespace sar::radarsat

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <span>
 
+#include "base/constants.hpp"
 #include "base/diagnostics.hpp"
 #include "base/profile.hpp"
 #include "base/run_services.hpp"
@@ -21,7 +22,7 @@
 namespace sar::sarfocuser {
 namespace {
 
-constexpr double kSpeedOfLight = 299792458.0;
+using base::kSpeedOfLight;
 constexpr double kEarthRotation = 7.292115189334571e-05;
 constexpr double kWgs84A = 6378137.0, kWgs84B = 6356752.314245;
 constexpr double kAntennaLength = 15.0;
@@ -112,9 +113,8 @@ int SARFocuser_conf::readconf(const std::string& f) {
   return 0;
 }
 
-SARFocuser::SARFocuser(SARFocuser_conf conf, SARFocuser_input input, SARFocuser_output output,
-                       const radarsat::Acquisition& acquisition)
-    : conf_(std::move(conf)), input_(std::move(input)), output_(std::move(output)), acq_(acquisition) {}
+SARFocuser::SARFocuser(SARFocuser_conf conf, SARFocuser_input input, SARFocuser_output output)
+    : conf_(std::move(conf)), input_(std::move(input)), output_(std::move(output)) {}
 
 int SARFocuser::fail(const char* stage, int status) {
   failedStage_ = stage;
@@ -128,18 +128,44 @@ int SARFocuser::run() {
     return fail("SARFocuser::run", 10);
   }
   base::report(base::kReportCheckpoint, "STRIPMAP RAW DATA DETECTED, FOCUSSING...");
+  if (raw_.readhdr(input_.RawDataFile) != 0) return fail("GeneralRAWData::readhdr", frame.check(10));
   if (!exists(input_.ChirpFile)) {
     base::report(0x11, "Chirp file does not exists!");
     return fail("SARFocuser::run", 10);
   }
+  io::DataFile chirp;
+  if (chirp.read_hdr(input_.ChirpFile) != 0) return fail("DataFile::read_hdr", frame.check(10));
   conf_.Flag_rgpatt = 0;
-  return frame.check(process());
+  if (int st = frame.check(process())) return st;
+  stripmap::progress_open("Writing headers");
+  return frame.check(writeheaders());
 }
 
 int SARFocuser::process() {
   base::Frame frame("SARFocuser::process");
-  const radarsat::Acquisition& a = acq_;
-  if (a.lines < 1 || a.samples < 1 || !(a.prf > 0.0) || !(a.sampling_rate > 0.0)) return fail("SARFocuser::process", 10);
+  const int64_t lines = raw_.dataFile.lines;
+  const int32_t samples = raw_.dataFile.pixels;
+  const auto& sc = raw_.sampling;
+  if (lines < 1 || samples < 1 || !(sc.prf_hz > 0.0) || !(sc.frg_hz > 0.0) || !(sc.lambda_m > 0.0))
+    return fail("SARFocuser::process", 10);
+  // The orbit of the state vectors: a degree 4 fit over five records, as the readers of the
+  // leader's and the text orbit's records fit them.
+  const auto& sv = raw_.stateVectors;
+  orbit_ = geometry::OrbitData{};
+  orbit_.family = geometry::OrbitFamily::kTextOrbit;
+  orbit_.path = input_.RawDataFile + ".hdr";
+  orbit_.product_name = "STATE_VECTORS";
+  for (int k = 0; k < sv.nStateVectors; ++k) {
+    geometry::StateVector v;
+    v.time = sv.TimeFirst + k * sv.TimeDelta;
+    const auto i = static_cast<std::size_t>(3 * k);
+    v.position = {sv.pos[i], sv.pos[i + 1], sv.pos[i + 2]};
+    v.velocity = {sv.vel[i], sv.vel[i + 1], sv.vel[i + 2]};
+    orbit_.vectors.push_back(v);
+  }
+  orbit_.sensing_start = orbit_.vectors.front().time;
+  orbit_.sensing_stop = orbit_.vectors.back().time;
+  orbit_.widest_spacing = sv.TimeDelta;
 
   // The acquisition in the terms of the stripmap stages.
   par_ = metadata::sarpar{};
@@ -148,23 +174,21 @@ int SARFocuser::process() {
   par_.outputDir = cut == std::string::npos ? "." : output_.OutputFilename.substr(0, cut);
   par_.extrPath = input_.RawDataFile;
   par_.rgfPath = output_.OutputFilename + ".rgfoc";
-  par_.samplingRate = a.sampling_rate;
-  par_.carrierFrequency = a.carrier_frequency;
-  par_.prf = a.prf;
-  par_.nearRangeTime = a.near_range_time;
-  par_.far_range_time = a.far_range_time;
-  par_.pulse_length = a.pulse_length;
-  par_.chirp_bandwidth = a.pulse_bandwidth;
-  par_.azimuthStartTime = a.first_line_time;
-  par_.antenna_length = kAntennaLength;
-  par_.swath_rank = a.pulses_in_flight;
-  par_.swst_code = *std::min_element(a.swst.begin(), a.swst.end());
-  par_.swst_max_code = *std::max_element(a.swst.begin(), a.swst.end());
-  par_.lines = static_cast<int32_t>(a.lines);
-  par_.samples = a.samples;
+  par_.samplingRate = sc.frg_hz;
+  par_.carrierFrequency = sc.fc_hz;
+  par_.prf = sc.prf_hz;
+  par_.nearRangeTime = raw_.roi.fastStart;
+  // The receive window's farthest line start (the window moves with SWST changes).
+  par_.far_range_time = std::max(raw_.info.SWST_MAX, raw_.roi.fastStart);
+  par_.pulse_length = raw_.pulse.PulseLength;
+  par_.chirp_bandwidth = raw_.pulse.Bandwidth;
+  par_.azimuthStartTime = raw_.roi.slowStart;
+  par_.antenna_length = raw_.attitude.AntennaLength > 0.0 ? raw_.attitude.AntennaLength : kAntennaLength;
+  par_.swath_rank = raw_.swath.Rank;
+  par_.lines = static_cast<int32_t>(lines);
+  par_.samples = samples;
   par_.resampling_factor = 1;
   par_.polarization_type = 0;  // H/H
-  par_.swath_number = a.beam_code;
 
   proc_ = stripmap::procparm{};
   proc_.Flag_incore = 0;  // the pipeline always goes through the range-compressed file
@@ -174,12 +198,12 @@ int SARFocuser::process() {
   proc_.Report_level = conf_.ReportLevel;
 
   // Orbit block: five vectors over the raw lines and the margin on either side.
-  const double duration = a.lines / a.prf;
-  const double centre = a.first_line_time + 0.5 * duration;
+  const double duration = static_cast<double>(lines) / sc.prf_hz;
+  const double centre = par_.azimuthStartTime + 0.5 * duration;
   proc_.orbitSpacing = (duration + 2.0 * kOrbitMargin) / 4.0;
   proc_.orbitStartTime = centre - 2.0 * proc_.orbitSpacing;
   try {
-    const geometry::OrbitSamples s = geometry::interpolate_orbit(a.orbit, centre, {5, proc_.orbitSpacing, true, false});
+    const geometry::OrbitSamples s = geometry::interpolate_orbit(orbit_, centre, {5, proc_.orbitSpacing, true, false});
     for (std::size_t k = 0; k < 5; ++k)
       for (std::size_t i = 0; i < 3; ++i) {
         proc_.orbitPositions[3 * k + i] = s.positions[k][i];
@@ -189,7 +213,7 @@ int SARFocuser::process() {
     base::report(base::kReportError, e.what());
     return fail("orbit", 10);
   }
-  proc_.orbitNumber = std::atoi(a.leader.dss.orbit_number.c_str());
+  proc_.orbitNumber = std::atoi(raw_.info.OrbitNumber.c_str());
 
   // Range reference: the nominal chirp of the pulse, as the stripmap chain expects it.
   if (int st = frame.check(metadata::synthetic_chirp(par_, proc_))) return fail("chirp", st);
@@ -203,7 +227,7 @@ int SARFocuser::process() {
   const double midRange = par_.nearRangeTime + 0.5 * par_.samples / par_.samplingRate;
   double geometric = 0.0;
   try {
-    geometric = unsteered_centroid(a.orbit, centre, midRange, a.wavelength);
+    geometric = unsteered_centroid(orbit_, centre, midRange, sc.lambda_m);
   } catch (const geometry::OrbitError& e) {
     base::report(base::kReportError, e.what());
     return fail("orbit", 10);
@@ -223,8 +247,8 @@ int SARFocuser::process() {
     image.samples = proc_.rangeSamples;
     image.lines = proc_.lines;
     image.prf = par_.prf;
-    const geometry::StateVector sv = geometry::orbit_state_at(a.orbit, centre);
-    image.platformSpeed = geometry::norm(sv.velocity) * 6371000.0 / geometry::norm(sv.position);
+    const geometry::StateVector platform = geometry::orbit_state_at(orbit_, centre);
+    image.platformSpeed = geometry::norm(platform.velocity) * 6371000.0 / geometry::norm(platform.position);
     image.rangeTimeOrigin = par_.nearRangeTime;
     image.azimuthTimeOrigin = par_.azimuthStartTime;
     doppler::dcestconf dc = conf_.dc;
@@ -274,6 +298,74 @@ int SARFocuser::process() {
     if (int st = frame.check(stripmap::get_coords(proc_, par_))) return fail("get_coords", st);
     if (conf_.DeleteTempFiles) remove_quietly(par_.rgfPath);
   }
+  return 0;
+}
+
+int SARFocuser::writeheaders() {
+  base::Frame frame("SARFocuser::writeheaders");
+  if (!conf_.Flag_azimuthfoc) return 0;  // nothing focused to describe
+  io::GeneralSLCData slc;
+  const double prf = par_.prf, fs = par_.samplingRate;
+  slc.dataFile.lines = proc_.focusedLines;
+  slc.dataFile.pixels = proc_.focusedSamples;
+  slc.dataFile.cellType = io::kFloatComplex;
+  slc.roi.SetSlowAxe(proc_.firstLineTime, 1.0 / prf, proc_.focusedLines);
+  slc.roi.SetFastAxe(proc_.firstSampleTime, 1.0 / fs, proc_.focusedSamples);
+
+  // The centroid and rate as range polynomials at the first focused line.
+  slc.polys.CreatePolys(1, 1);
+  auto put = [&](metadata::poly& p, const stripmap::DopplerPoly& d) {
+    const double y = proc_.firstLineTime - d[8];
+    p.pol = {d[0] + d[2] * y, d[1] + d[3] * y, 0.0, 0.0, d[4], d[5], d[6]};
+    p.trg0_s = d[7];
+    p.taz0_s = proc_.firstLineTime;
+  };
+  put(slc.polys.dc[0], proc_.dopplerCentroid);
+  put(slc.polys.fr[0], proc_.dopplerRate);
+
+  slc.sampling.clone(raw_.sampling);
+  slc.sampling.Brg_hz = conf_.az.RangeLookBandwidth > 0.0 ? std::min(1.0, conf_.az.RangeLookBandwidth) * fs : fs;
+  slc.sampling.Baz_hz = conf_.az.AzimuthLookBandwidth > 0.0 ? std::min(1.0, conf_.az.AzimuthLookBandwidth) * prf : prf;
+  // The five vectors of the scene's orbit block, which every later geometry uses.
+  slc.stateVectors.SVCreate(proc_.orbitStartTime, proc_.orbitSpacing, 5);
+  std::copy(proc_.orbitPositions.begin(), proc_.orbitPositions.begin() + 15, slc.stateVectors.pos.begin());
+  std::copy(proc_.orbitVelocities.begin(), proc_.orbitVelocities.begin() + 15, slc.stateVectors.vel.begin());
+  slc.pulse.clone(raw_.pulse);
+  slc.pattern.PatternSamples = 0;  // no elevation pattern for this sensor
+  slc.info.clone(raw_.info);
+  slc.info.Description = "StripMap level 1 Image File";
+  slc.info.ProcessingSoftware = "SARFocuser v1.0";
+  slc.info.ProcessingCenter = "Ombrix - Tarvia";
+  slc.info.ImageType = "SLC";
+  slc.info.SWST_MIN = proc_.firstSampleTime;
+  slc.info.SWST_MAX = proc_.firstSampleTime;
+  slc.attitude.clone(raw_.attitude);
+  slc.attitude.Eq_speed = proc_.equivalentVelocity;
+  slc.attitude.Mean_DC = centroid_;
+  const double sine = raw_.sampling.lambda_m * centroid_ / (2.0 * proc_.equivalentVelocity);
+  slc.attitude.SquintAngle = std::asin(std::clamp(sine, -1.0, 1.0)) / base::kDegree;
+  slc.windows.RgMatchedFilterType = "HAMMING";
+  slc.windows.AzMatchedFilterType = "HAMMING";
+  slc.windows.RgMatchedFilterCoef = conf_.az.RangeWindowHammingParameter;
+  slc.windows.AzMatchedFilterCoef = conf_.az.AzimuthWindowHammingParameter;
+  slc.windows.RgLookBandwidth = slc.sampling.Brg_hz;
+  slc.windows.AzLookBandwidth = slc.sampling.Baz_hz;
+  // Corners: near-early, far-early, near-late, far-late, centre of the focused grid.
+  const std::array<metadata::geopoint*, 5> where = [&] {
+    const bool north = proc_.corners[2].latitude > proc_.corners[0].latitude;
+    const bool eastIsFar = proc_.corners[1].longitude > proc_.corners[0].longitude;
+    metadata::geopoint* early[2] = {&slc.corners.SouthWest, &slc.corners.SouthEast};
+    metadata::geopoint* late[2] = {&slc.corners.NorthWest, &slc.corners.NorthEast};
+    if (!north) std::swap(early, late);
+    const int nearIdx = eastIsFar ? 0 : 1;
+    return std::array<metadata::geopoint*, 5>{early[nearIdx], early[1 - nearIdx], late[nearIdx], late[1 - nearIdx],
+                                              &slc.corners.Center};
+  }();
+  for (std::size_t i = 0; i < 5; ++i) {
+    const auto& c = proc_.corners[i];
+    where[i]->Point = {c.latitude, c.longitude, 0.0, c.azimuthTime, c.rangeTime};
+  }
+  if (int st = slc.writehdr(output_.OutputFilename)) return fail("GeneralSAR::GSwrite", frame.check(st));
   return 0;
 }
 

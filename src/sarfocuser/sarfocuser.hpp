@@ -5,14 +5,17 @@
 // steered, so the centroid is searched over several PRFs on either side), the geometry
 // polynomials, omega-K azimuth focusing and the corner coordinates.
 //
-// The stripmap stages take the acquisition as an ENVISAT `sarpar`; the focuser fills one from
-// the CEOS acquisition (the fields the stages read: rates, times, sizes, pulse) and the
-// scene's orbit block from the data set's orbit.
+// The raw data set comes described by its header "<raw>.hdr" (a raw set: raster, region,
+// sampling constants, state vectors, pulse, data set info, attitude, swath). The stripmap stages
+// take the acquisition as an ENVISAT `sarpar`; the focuser fills one from that description (the
+// fields the stages read: rates, times, sizes, pulse) and the scene's orbit block from its state
+// vectors. The focused image gets its own header "<output>.hdr", a focused set.
 #include <string>
 
 #include "doppler/dcestconf.hpp"
+#include "geometry/orbit_file.hpp"
+#include "io/general_sar.hpp"
 #include "metadata/acquisition.hpp"
-#include "radarsat/extract.hpp"
 #include "stripmap/procparm.hpp"
 
 namespace sar::sarfocuser {
@@ -55,12 +58,14 @@ struct SARFocuser_output {
 
 class SARFocuser {
  public:
-  SARFocuser(SARFocuser_conf conf, SARFocuser_input input, SARFocuser_output output,
-             const radarsat::Acquisition& acquisition);
+  SARFocuser(SARFocuser_conf conf, SARFocuser_input input, SARFocuser_output output);
 
-  /// The whole pipeline. 0, 10 for a missing raw or chirp file, or the failing stage's status
-  /// (its name in failed_stage()).
+  /// The whole pipeline. 0, 10 for a missing raw or chirp file or a raw description that lacks
+  /// a record, or the failing stage's status (its name in failed_stage()).
   int run();
+
+  /// The raw data set as its header describes it (after run()).
+  const io::GeneralRAWData& raw() const { return raw_; }
 
   const metadata::sarpar& par() const { return par_; }
   const stripmap::procparm& proc() const { return proc_; }
@@ -73,12 +78,14 @@ class SARFocuser {
 
  private:
   int process();
+  int writeheaders();
   int fail(const char* stage, int status);
 
   SARFocuser_conf conf_;
   SARFocuser_input input_;
   SARFocuser_output output_;
-  const radarsat::Acquisition& acq_;
+  io::GeneralRAWData raw_;
+  geometry::OrbitData orbit_;
   metadata::sarpar par_;
   stripmap::procparm proc_;
   double centroid_ = 0.0;

@@ -154,6 +154,8 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   const double savedNear = wk.nearTime;
   const std::span<fcomplex> block = wk.data;
   wk.fd = poly5(poly, wk.nearTime - reference + (n / wk.fs) / 2);
+  wk.fdNear = poly5(poly, wk.nearTime - reference);
+  wk.fdFar = poly5(poly, wk.nearTime - reference + n / wk.fs);
   if (int st = frame.check(MyComputeEqPar(wk))) return st;
   double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
   WKCentre(wk, kr0, ky0, kx0);
@@ -179,6 +181,8 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     }
     wk.nearTime = savedNear + o / wk.fs;
     wk.fd = poly5(poly, wk.nearTime - reference + (Sb / wk.fs) / 2);
+    wk.fdNear = poly5(poly, wk.nearTime - reference);
+    wk.fdFar = poly5(poly, wk.nearTime - reference + Sb / wk.fs);
     if ((status = frame.check(MyComputeEqPar(wk))) != 0) break;
     const double ky = spectrum_ky(wk);
     const double kxc = std::sqrt(kr0 * kr0 - ky * ky);
@@ -251,6 +255,8 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
   const auto& dc = proc.dopplerCentroid;
   const double fd = DCeval(dc, (samples / 2) / fs + par.nearRangeTime, (lines / 2) / prf + par.azimuthStartTime);
   wk.fd = fd;
+  wk.fdNear = DCeval(dc, par.nearRangeTime, (lines / 2) / prf + par.azimuthStartTime);
+  wk.fdFar = DCeval(dc, samples / fs + par.nearRangeTime, (lines / 2) / prf + par.azimuthStartTime);
   wk.spectrumCentreFd = proc.centroidOverride != 0.0 ? proc.centroidOverride : fd;
   if (int st = frame.check(MyComputeEqPar(wk))) return st;
   proc.equivalentVelocity = wk.V;

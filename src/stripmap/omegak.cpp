@@ -222,15 +222,22 @@ int MyComputeEqPar(wkparm& wk) {
   const double t1 = wk.nearTime - wk.rateReference;
   const double fm1 = fm(t1), fm2 = fm(t1 + Tr);
   const double p = lambda * wk.fd / 2.0;
-  const double d = 1.0 / fm1 - 1.0 / fm2;
-  const double v2 = p * p + kQuarterC * lambda * Tr / d;
-  if (!(fm1 != 0.0 && fm2 != 0.0 && fm1 != fm2 && v2 > p * p && std::isfinite(v2))) {
+  // The rate at either end is that of the beam centre there: with the hyperbolic range history
+  // 1/fm = -lambda R / (2 (V^2 - p^2)), p = lambda fd / 2. A centroid that changes across the
+  // block changes p from end to end; fitting V with the centre's p alone biases it, and at a
+  // centroid of several PRFs a bias of 1e-5 in V moves the targets by a tenth of a line.
+  const bool ends = wk.fdNear != 0.0 || wk.fdFar != 0.0;
+  const double p1 = ends ? lambda * wk.fdNear / 2.0 : p, p2 = ends ? lambda * wk.fdFar / 2.0 : p;
+  const double a1 = 1.0 / fm1, a2 = 1.0 / fm2;
+  const double v2 = (a1 * p1 * p1 - a2 * p2 * p2 + kQuarterC * lambda * Tr) / (a1 - a2);
+  if (!(fm1 != 0.0 && fm2 != 0.0 && fm1 != fm2 && v2 > std::max(p1 * p1, p2 * p2) && v2 > p * p && std::isfinite(v2))) {
     base::report(base::kReportError, "Doppler rate gives no equivalent velocity for the block");
     return 1;
   }
   wk.V = std::sqrt(v2);
   const double squint = std::asin(p / wk.V);
-  wk.R0 = -std::cos(squint) * Tr * kHalfC / (1.0 - fm1 / fm2);
+  // Slant range of the first sample's beam centre, then its closest approach at the block's squint.
+  wk.R0 = -2.0 * a1 * (v2 - p1 * p1) / lambda * std::sqrt(1.0 - p1 * p1 / v2);
   if (wk.PerformInterpolation == 0) wk.R0 += (kC / (2.0 * wk.fs)) * (wk.samples / 2) * std::cos(squint);
   return 0;
 }

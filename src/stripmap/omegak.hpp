@@ -44,6 +44,8 @@ struct wkparm {
   double carrier = 0.0;  // f0, Hz
   double fs = 0.0;       // range sampling rate, Hz
   double fd = 0.0;       // Doppler centroid of this block, Hz
+  // Centroid at the block's first and last sample, Hz; both 0: fd across the block.
+  double fdNear = 0.0, fdFar = 0.0;
   double rangePadding = 1.0;
   double azimuthShift = 0.0;  // s
   double rangeShift = 0.0;    // s

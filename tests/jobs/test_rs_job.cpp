@@ -9,6 +9,8 @@
 
 #include "analyser/irf.hpp"
 #include "base/convert.hpp"
+#include "io/general_sar.hpp"
+#include "multilook/strip_multilook.hpp"
 #include "job_harness.hpp"
 #include "simulator/rsat_product.hpp"
 #include "test_standalone_support.hpp"
@@ -69,12 +71,42 @@ TEST(RsJob, SimulatedProductFocusesThroughFocussing) {
   const auto truth = simulate(job.dir() / "product");
   const fs::path root = job.dir() / "out" / "scene";
   job.layout(rs_args(truth.data_path, root), "RS");
-  const RunResult r = job.run("main_focussing_asar_RS#" + (job.dir() / "job.txt").string());
+  const RunResult r = job.run("main_focussing_asar_RS#" + (job.dir() / "job.txt").string(), "VANTERRA_TRACING=ACTIVE");
   ASSERT_EQ(r.status, 0) << r.err << job.log();
   for (const char* suffix : {"_slc", "_slc_hdr", "_slc.hdr", "_slc.sml", "_slc.tif"})
     EXPECT_TRUE(fs::exists(root.string() + suffix)) << suffix;
-  EXPECT_FALSE(fs::exists(job.dir() / "out" / "RAW"));  // the raw work raster goes
+  for (const char* work : {"RAW", "RAW.hdr", "RAW.vrt"})  // the raw work raster and its description go
+    EXPECT_FALSE(fs::exists(job.dir() / "out" / work)) << work;
+  EXPECT_TRUE(fs::exists(job.dir() / "out" / "CHIRP.hdr"));
   const std::string hdr = slurp(root.string() + "_slc_hdr");
+
+  // The focused image's description is a complete focused set that agrees with the annotation,
+  // and the annotation step read it.
+  io::GeneralSLCData slc;
+  ASSERT_EQ(slc.readhdr(root.string() + "_slc"), 0);
+  EXPECT_EQ(std::to_string(slc.dataFile.lines), value_of(hdr, "NrOfLinesPerImage"));
+  EXPECT_EQ(std::to_string(slc.dataFile.pixels), value_of(hdr, "NrOfPixelsPerLine"));
+  EXPECT_EQ(slc.info.SensorName, "RADARSAT-1");
+  EXPECT_EQ(slc.info.Swath, "S3");
+  EXPECT_EQ(slc.info.ProcessingSoftware, "SARFocuser v1.0");
+  EXPECT_NEAR(slc.roi.slowDelta, 1.0 / truth.prf, 1e-12);
+  EXPECT_NEAR(slc.attitude.Mean_DC, truth.doppler_centroid, 0.02 * truth.prf);  // the centroid used
+  EXPECT_EQ(slc.stateVectors.nStateVectors, 5);
+  EXPECT_EQ(slc.pattern.PatternSamples, 0);
+  const std::string trace = slurp(job.dir() / "Vanterra.trace_save");
+  EXPECT_NE(trace.find("Trying to read " + root.string() + "_slc.hdr, returning with result 0"), std::string::npos);
+  EXPECT_NE(trace.find("Trying to write (BandWidth = 17280000.000000)"), std::string::npos);
+
+  // The stripmap multilook reads the product as it reads an IM one: raster header, annotation
+  // grid and orbit (ground range needs the state vectors).
+  multilook::StripMultilookRequest ml;
+  ml.slc = root.string() + "_slc";
+  ml.output = (job.dir() / "out" / "scene_gr").string();
+  ml.groundRange = true;
+  multilook::StripMultilookResult mr;
+  ASSERT_EQ(multilook::run_strip_multilook(ml, mr), 0) << mr.error;
+  EXPECT_NEAR(mr.firstLineTime, slc.roi.slowStart, 0.5 * mr.lineStep);
+  EXPECT_GT(mr.samples, 0);
   EXPECT_EQ(value_of(hdr, "SensorName"), "\"RADARSAT-1\"");
   EXPECT_EQ(value_of(hdr, "Swath"), "S3|");
   EXPECT_EQ(hdr.find("EnvisatTwoWayAntennaElevationPatternTable"), std::string::npos);

@@ -12,6 +12,7 @@
 #include <future>
 #include <unistd.h>
 
+#include "io/general_sar.hpp"
 #include "radarsat/extract.hpp"
 #include "simulator/orbit_model.hpp"
 #include "simulator/rsat_product.hpp"
@@ -135,6 +136,43 @@ TEST(Extract, LinesReplicaAndAcquisition) {
   ASSERT_TRUE(chirp);
   EXPECT_EQ(c[0], std::complex<float>(2.0f, 2.0f));
   EXPECT_EQ(c[575], std::complex<float>(2.0f, 2.0f));
+
+  // The description beside the rasters: a raw set a focuser can start from.
+  sar::io::GeneralRAWData d;
+  ASSERT_EQ(d.readhdr(p.request.raw_path), 0);
+  EXPECT_EQ(d.dataFile.lines, 10);
+  EXPECT_EQ(d.dataFile.pixels, kSamples);
+  EXPECT_EQ(d.dataFile.rowPrefix, 4);
+  EXPECT_NEAR(d.roi.slowStart, a.first_line_time, 1e-6);
+  EXPECT_NEAR(d.roi.fastStart, a.near_range_time, 1e-15);
+  EXPECT_NEAR(d.sampling.prf_hz, a.prf, 1e-9);
+  EXPECT_EQ(d.pulse.Bandwidth, 11580000.0);
+  EXPECT_EQ(d.info.Swath, "S3");
+  EXPECT_EQ(d.info.SensorName, "RADARSAT-1");
+  EXPECT_EQ(d.swath.Rank, a.pulses_in_flight);
+  EXPECT_EQ(d.stateVectors.nStateVectors, 21);  // every vector of the leader
+  EXPECT_EQ(d.stateVectors.TimeDelta, 30.0);
+  EXPECT_NEAR(d.stateVectors.pos[60], a.orbit.vectors[20].position[0], 1e-6);
+  sar::io::DataFile replica;
+  ASSERT_EQ(replica.read_hdr(p.request.chirp_path), 0);
+  EXPECT_EQ(replica.pixels, 576);
+}
+
+TEST(Extract, UnwritableDescriptionLeavesNothingBehind) {
+  Product p("nodesc");
+  p.leader();
+  auto recs = records({1, 2, 3, 4});
+  recs[0].replica.assign(1152, 0x02);
+  sim::rsat::write_data_file(p.request.data_file, recs);
+  fs::create_directories(p.request.raw_path + ".hdr");  // in the way of the header
+  try {
+    radar_extract(p.request);
+    ADD_FAILURE() << "accepted";
+  } catch (const CeosError& e) {
+    EXPECT_EQ(std::string(e.what()).rfind(p.request.raw_path + ".hdr: ", 0), 0u) << e.what();
+  }
+  fs::remove(p.request.raw_path + ".hdr");
+  EXPECT_TRUE(p.outputs_absent());
 }
 
 TEST(Extract, LineIndexBookkeeping) {
