@@ -43,8 +43,9 @@ void round_stats(ambstats& s, std::span<const double> values, double low, double
 
 bool agreeing(const ambstats& s, double varthr) {
   // Trimming up to 45 % from each end finds a tight core in any set, noise included; the core
-  // must also hold a quarter of the votes to count as an answer.
-  return s.count >= std::max(2, (s.total + 3) / 4) && s.std < varthr;
+  // must also hold a quarter of the votes, and four at least, to count as an answer (a few
+  // random votes agree by chance more often than a handful do).
+  return s.count >= std::max(4, (s.total + 3) / 4) && s.std < varthr;
 }
 
 int make_hist(std::span<const double> values, double& step, double& minimum, int bins, std::vector<int>& counts) {
@@ -133,10 +134,8 @@ int dcnastd(dcestconf& conf) {
   for (const auto& b : conf.wdarBlocks) w.push_back(b.estimate);
   conf.mlbfStats = trimmed_stats(m, conf.Varthr);
   conf.wdarStats = trimmed_stats(w, conf.Varthr);
-  // The votes are counted against every estimate made, voting or not.
-  int32_t all = 0;
-  for (const auto& b : conf.mlbfBlocks) all += static_cast<int32_t>(b.estimates.size());
-  conf.mlbfStats.total = all;
+  // The quorum is a share of the votes cast: estimates that did not vote say nothing against
+  // those that did (an unsteered scene with few bright places casts few votes, all right).
   return 0;
 }
 
