@@ -32,6 +32,20 @@ namespace {
 
 const std::string kXch = real("ASA_XCH_AX", "ASA_XCH_AXVIEC20101222_143057_20020301_000000_20141231_000000");
 
+// The WS job's arguments for a simulated product: its own auxiliary files, the real ASA_XCH,
+// slant range, output root "scene" in the job's out folder.
+std::vector<std::string> ws_args(const ScratchJob& job, const sim::SimulationTruth& t) {
+  std::vector<std::string> a(14, "");
+  a[0] = t.level0_path;
+  a[1] = t.orbit_path;
+  a[2] = t.ins_path;
+  a[3] = t.xca_path;
+  a[4] = (job.dir() / "out" / "scene").string();
+  a[7] = kXch;
+  a[12] = "NotOK";
+  return a;
+}
+
 class WsJob : public ::testing::Test {
  protected:
   static fs::path root() { return fs::temp_directory_path() / ("ws_job_" + std::to_string(::getpid())); }
@@ -63,17 +77,6 @@ class WsJob : public ::testing::Test {
     delete im_;
     std::error_code err;
     fs::remove_all(root(), err);
-  }
-  static std::vector<std::string> ws_args(const ScratchJob& job, const sim::SimulationTruth& t) {
-    std::vector<std::string> a(14, "");
-    a[0] = t.level0_path;
-    a[1] = t.orbit_path;
-    a[2] = t.ins_path;
-    a[3] = t.xca_path;
-    a[4] = (job.dir() / "out" / "scene").string();
-    a[7] = kXch;
-    a[12] = "NotOK";
-    return a;
   }
   static sim::SimulationTruth* ws_;
   static sim::SimulationTruth* im_;
@@ -641,18 +644,6 @@ void check_uniform(const UniformFigures& f, const std::string& tag) {
   ::testing::Test::RecordProperty(tag + "enl_expected", figures_text(f.enlExpected));
 }
 
-std::vector<std::string> uniform_args(const ScratchJob& job, const sim::SimulationTruth& t) {
-  std::vector<std::string> a(14, "");
-  a[0] = t.level0_path;
-  a[1] = t.orbit_path;
-  a[2] = t.ins_path;
-  a[3] = t.xca_path;
-  a[4] = (job.dir() / "out" / "scene").string();
-  a[7] = kXch;
-  a[12] = "NotOK";
-  return a;
-}
-
 // Slant and ground range (one test, so that the scene is simulated once): the level is flat
 // across the four seams and along the burst cycle, and in slant range the speckle has the looks
 // the range looks and the burst weights give.
@@ -660,7 +651,7 @@ TEST_F(WsUniformScene, JoinedImageIsFlatWithTheLooksItsWeightsGive) {
   for (const bool ground : {false, true}) {
     SCOPED_TRACE(ground ? "ground range" : "slant range");
     ScratchJob job(ground ? "ws_uniform_ground" : "ws_uniform_slant");
-    auto a = uniform_args(job, *truth_);
+    auto a = ws_args(job, *truth_);
     if (ground) a[11] = "OK";
     const std::string list = job.layout(a, "WS");
     // The work files stay: their headers place the seams.

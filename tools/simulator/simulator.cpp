@@ -320,7 +320,7 @@ WsClutter make_ws_clutter(const SimulationConfig& c, const OrbitModel& orbit, co
 }  // namespace
 
 SimulationTruth run_simulation(const SimulationConfig& c) {
-  if (c.lines < 2 || c.lines > 200000) throw std::invalid_argument("lines must be 2 to 200000");
+  if (c.lines < 2 || c.lines > 500000) throw std::invalid_argument("lines must be 2 to 500000");
   if (c.samples < 64 || fbaq_line_bytes(c.samples) > 8192) throw std::invalid_argument("samples must be 64 to 8001");
   if (c.targets.empty()) throw std::invalid_argument("the scene needs at least one target");
   if (is_ws(c) && c.clutter.enabled() && has_fault(c, Fault::kSwstChange))
