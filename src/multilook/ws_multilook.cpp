@@ -22,6 +22,8 @@ constexpr int kRejected = 10;
 constexpr double kHalfLightSpeed = 149896229.0;
 constexpr int kMostLooks = 15;
 constexpr int kMostDecimation = 32767;
+// Output lines made at a time: the looks of every sub-swath for one strip of the joined scene.
+constexpr int kStripLines = 4096;
 // Zero padding of a range line, as a share of its samples: the tails of a bright target's looks
 // wrap around the transform into the padding, not onto the far end of the line.
 constexpr int kPaddingShare = 4;
@@ -212,15 +214,36 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     delay[s] = (sw[s].nearTime - sw[0].nearTime) - firstColumn[s] * outStep;
   }
 
-  // Per sub-swath: weighted, detected, decimated looks summed over bursts.
-  std::array<std::vector<float>, 5> power;
   std::array<int, 5> outSamples{};
+  for (std::size_t s = 0; s < 5; ++s) outSamples[s] = sw[s].samples / decimation;
+
+  // Join the sub-swaths: each keeps its columns up to the middle of its overlap with the next.
+  // Sub-swaths that do not meet (a short sampling window) leave the columns between them at 0.
+  std::array<int, 5> endColumn{}, from{}, to{};
+  for (std::size_t s = 0; s < 5; ++s) endColumn[s] = firstColumn[s] + outSamples[s];
+  for (std::size_t s = 0; s < 5; ++s) {
+    from[s] = s == 0 ? firstColumn[0] : std::max(to[s - 1], firstColumn[s]);
+    const int middle = s == 4 ? endColumn[4] : firstColumn[s + 1] + (endColumn[s] - firstColumn[s + 1]) / 2;
+    to[s] = std::max(from[s], std::min(middle, endColumn[s]));
+  }
+  if (*std::min_element(firstColumn.begin(), firstColumn.end()) < 0 ||
+      *std::max_element(endColumn.begin(), endColumn.end()) != endColumn[4])
+    return fail(res, kRejected, "the sub-swaths are not in order of range");
+  const int slantWidth = endColumn[4];
+  std::vector<double> spreading(static_cast<std::size_t>(slantWidth));
+  const double refTime = sw[0].nearTime + 0.5 * slantWidth * outStep;
+  for (int i = 0; i < slantWidth; ++i) spreading[static_cast<std::size_t>(i)] = std::pow((sw[0].nearTime + i * outStep) / refTime, 3.0);
+
+  // Per sub-swath: weighted, detected, decimated looks summed over bursts, for the output lines
+  // [blockFirst, blockFirst + blockLines) only: the joined scene is made a strip at a time, so
+  // memory does not grow with the scene's length.
+  std::array<std::vector<float>, 5> power;
+  auto accumulate = [&](int blockFirst, int blockLines) -> int {
   for (std::size_t s = 0; s < 5; ++s) {
     const int padded = sw[s].samples + sw[s].samples / kPaddingShare;
     const int n = dsp::genpow((padded + decimation - 1) / decimation, 1) * decimation;
     const int k = n / decimation;
-    outSamples[s] = sw[s].samples / decimation;
-    power[s].assign(static_cast<std::size_t>(lines) * outSamples[s], 0.0f);
+    power[s].assign(static_cast<std::size_t>(blockLines) * outSamples[s], 0.0f);
     const LookPlan& plan = plans[s];
     const int bandBins = std::max(1, round_half_away(plan.band / fs * n));
     const int fullBins = std::max(1, round_half_away(cfg.rangeBand / fs * n));
@@ -252,12 +275,15 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
     std::vector<double> acc(static_cast<std::size_t>(outSamples[s]));
     for (int b = skip; b < skip + process; ++b) {
       const Burst& burst = bursts[s][static_cast<std::size_t>(b)];
+      const int burstFirst = round_half_away((burst.firstTime - first) / dt);
+      if (burstFirst + burst.lines <= blockFirst || burstFirst >= blockFirst + blockLines) continue;
       const double centre = burst.firstTime + 0.5 * (burst.lines - 1) * dt;
       for (int l = 0; l < burst.lines; ++l) {
         const double t = burst.firstTime + l * dt;
         const double v = (sw[s].centroid / sw[s].rate + t - centre) / cycle;
         const double w = burst_weight(v, cfg.w1, cfg.w2);
-        if (w == 0.0) continue;
+        const int line = round_half_away((t - first) / dt);
+        if (w == 0.0 || line < blockFirst || line >= blockFirst + blockLines) continue;
         io::BufferIO rd(&in, 0, sw[s].samples, static_cast<int32_t>(burst.firstRecord + l), 1, io::kFloatComplex);
         if (rd.readbuffer(row.data()) != 0) return fail(res, 1, "cannot read sub-swath " + std::to_string(s + 1));
         std::fill(spectrum.begin(), spectrum.end(), io::fcomplex{});
@@ -276,30 +302,13 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
           dsp::pfft_c(backward, small);
           for (int i = 0; i < outSamples[s]; ++i) acc[static_cast<std::size_t>(i)] += std::norm(small[static_cast<std::size_t>(i)]);
         }
-        const int line = round_half_away((t - first) / dt);
-        if (line < 0 || line >= lines) continue;
-        float* dst = power[s].data() + static_cast<std::size_t>(line) * outSamples[s];
+        float* dst = power[s].data() + static_cast<std::size_t>(line - blockFirst) * outSamples[s];
         for (int i = 0; i < outSamples[s]; ++i) dst[i] += static_cast<float>(w * w * scale * acc[static_cast<std::size_t>(i)]);
       }
     }
   }
-
-  // Join the sub-swaths: each keeps its columns up to the middle of its overlap with the next.
-  // Sub-swaths that do not meet (a short sampling window) leave the columns between them at 0.
-  std::array<int, 5> endColumn{}, from{}, to{};
-  for (std::size_t s = 0; s < 5; ++s) endColumn[s] = firstColumn[s] + outSamples[s];
-  for (std::size_t s = 0; s < 5; ++s) {
-    from[s] = s == 0 ? firstColumn[0] : std::max(to[s - 1], firstColumn[s]);
-    const int middle = s == 4 ? endColumn[4] : firstColumn[s + 1] + (endColumn[s] - firstColumn[s + 1]) / 2;
-    to[s] = std::max(from[s], std::min(middle, endColumn[s]));
-  }
-  if (*std::min_element(firstColumn.begin(), firstColumn.end()) < 0 ||
-      *std::max_element(endColumn.begin(), endColumn.end()) != endColumn[4])
-    return fail(res, kRejected, "the sub-swaths are not in order of range");
-  const int slantWidth = endColumn[4];
-  std::vector<double> spreading(static_cast<std::size_t>(slantWidth));
-  const double refTime = sw[0].nearTime + 0.5 * slantWidth * outStep;
-  for (int i = 0; i < slantWidth; ++i) spreading[static_cast<std::size_t>(i)] = std::pow((sw[0].nearTime + i * outStep) / refTime, 3.0);
+  return 0;
+  };
 
   std::vector<double> where;
   res.samples = slantWidth;
@@ -326,11 +335,19 @@ int run_ws_multilook(const std::array<WsSubSwath, 5>& sw, const WsMultilookConfi
   std::vector<double> slant(static_cast<std::size_t>(slantWidth));
   std::vector<float> amplitude(static_cast<std::size_t>(slantWidth));
   for (int l = 0; l < lines; ++l) {
+    if (l % kStripLines == 0) {
+      if (const int st = accumulate(l, std::min(kStripLines, lines - l)); st != 0) {
+        out.close();
+        std::error_code ec;
+        std::filesystem::remove(part, ec);
+        return st;
+      }
+    }
+    const std::size_t row = static_cast<std::size_t>(l % kStripLines);
     for (std::size_t s = 0; s < 5; ++s)
       for (int c = from[s]; c < to[s]; ++c)
         slant[static_cast<std::size_t>(c)] =
-            power[s][static_cast<std::size_t>(l) * outSamples[s] + static_cast<std::size_t>(c - firstColumn[s])] *
-            spreading[static_cast<std::size_t>(c)];
+            power[s][row * outSamples[s] + static_cast<std::size_t>(c - firstColumn[s])] * spreading[static_cast<std::size_t>(c)];
     if (cfg.groundRange) {
       resample_power(slant, where, amplitude);
     } else {
