@@ -22,8 +22,7 @@ int envi_beam_corr(const ElevationPattern& pattern, const std::array<double, 5>&
   int outside = 0;
   for (std::size_t j = 0; j < gain.size(); ++j) {
     const double x = x0 + static_cast<double>(j) / fs;
-    const auto& c = slantToElevation;
-    const double theta = c[0] + x * (c[1] + x * (c[2] + x * (c[3] + x * c[4])));
+    const double theta = poly4(slantToElevation, x);
     const double g = (theta - pattern.reference) / pattern.step() + (n == 0 ? 0 : (n - 1) / 2);
     const double k = std::floor(g);
     if (n < 2 || !(k >= 0.0) || k > n - 2) {

@@ -43,10 +43,6 @@ constexpr int kMargin = 32;
 constexpr int32_t kScaleNode = 16;
 constexpr double kPassBand = 0.75, kStopBand = 2.0;  // in burst bandwidths
 constexpr double kReferenceBurst = 1.0 / 30.0;        // s of echoes a burst's weights stand for
-
-double poly(const std::array<double, 5>& c, double x) {
-  return c[0] + x * (c[1] + x * (c[2] + x * (c[3] + x * c[4])));
-}
 }  // namespace
 
 double half_window(const scansar& scan, const wsparm& par) {
@@ -85,8 +81,8 @@ int burst_azimuth_focus(const std::string& dir, int s, const scansar& scan, wspa
     const auto dc = centroidOf(g), rate = rateOf(g);
     for (int32_t c = 0; c < W; ++c) {
       const double x = outNear + c / fs - est.refTime;
-      fdc[static_cast<std::size_t>(c)] = poly(dc, x);
-      ka[static_cast<std::size_t>(c)] = poly(rate, x);
+      fdc[static_cast<std::size_t>(c)] = poly4(dc, x);
+      ka[static_cast<std::size_t>(c)] = poly4(rate, x);
       if (!(ka[static_cast<std::size_t>(c)] < 0.0)) return false;
     }
     xMid = fdc[mid] / ka[mid];

@@ -36,9 +36,6 @@ constexpr double kNoiseSigmas = 5.0;
 
 double wrap(double x, double period) { return x - period * std::floor(x / period + 0.5); }
 
-double poly(const std::array<double, 5>& c, double x) {
-  return c[0] + x * (c[1] + x * (c[2] + x * (c[3] + x * c[4])));
-}
 
 // Fractional centroid of a sub-swath: constant and slope in range time about refTime.
 bool fractional_centroid(const CorrelationSums& sums, const RangeFocused& f, double prf, double fs, double refTime,
@@ -208,15 +205,15 @@ int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneR
     } else {
       est.centroid[i] = {est.geometric[i], 0.0, 0.0, 0.0, 0.0};
     }
-    if (const int st = orbit_geometry(scan, s, refs, focused[i], poly(est.centroid[i], mid[i] - est.refTime),
+    if (const int st = orbit_geometry(scan, s, refs, focused[i], poly4(est.centroid[i], mid[i] - est.refTime),
                                       est.refTime, tMid, est);
         st != 0) {
       base::report(base::kReportError, "Burst Doppler: no rate from the orbit for SS" + std::to_string(s + 1));
       return frame.check(st);
     }
     base::LogPrintf("SS%d: centroid %.2f Hz (fraction %.2f Hz, ambiguity %d, orbit %.2f Hz), rate %.2f Hz/s\n", s + 1,
-                    poly(est.centroid[i], mid[i] - est.refTime), est.fractional[i], est.ambiguity[i], est.geometric[i],
-                    poly(est.rate[i], mid[i] - est.refTime));
+                    poly4(est.centroid[i], mid[i] - est.refTime), est.fractional[i], est.ambiguity[i], est.geometric[i],
+                    poly4(est.rate[i], mid[i] - est.refTime));
   }
 
   // Granules along the scene: each sub-swath's centroid from the granule's bursts alone, its
@@ -240,12 +237,12 @@ int burst_doppler(const scansar& scan, const wsparm& par, const metadata::SceneR
       double f0 = 0.0, f1 = 0.0;
       if (i < sums.size() && g < sums[i].granules.size() &&
           fractional_centroid(sums[i].granules[g], focused[i], scan.prf[i], scan.samplingRate, est.refTime, f0, f1)) {
-        const double whole = poly(est.centroid[i], m);
+        const double whole = poly4(est.centroid[i], m);
         const double shift = std::round((whole - (f0 + f1 * m)) / scan.prf[i]) * scan.prf[i];
         if (std::abs(f0 + shift + f1 * m - whole) <= 0.5 * scan.prf[i]) c = {f0 + shift, f1, 0.0, 0.0, 0.0};
       }
       DopplerEstimate at;
-      if (const int st = orbit_geometry(scan, s, refs, focused[i], poly(c, m), est.refTime, tk, at); st != 0) {
+      if (const int st = orbit_geometry(scan, s, refs, focused[i], poly4(c, m), est.refTime, tk, at); st != 0) {
         base::report(base::kReportError, "Burst Doppler: no rate from the orbit for SS" + std::to_string(s + 1));
         return frame.check(st);
       }

@@ -169,8 +169,13 @@ struct RangeFocused {
 int burst_range_focus(const std::string& dir, int s, const sarpar& channel, const scansar& scan, const wsparm& par,
                       std::span<const fcomplex> replica, RangeFocused& out, CorrelationSums& sums);
 
+/// c0 + c1 x + c2 x^2 + c3 x^3 + c4 x^4: the polynomials of the records below.
+inline double poly4(const std::array<double, 5>& c, double x) {
+  return c[0] + x * (c[1] + x * (c[2] + x * (c[3] + x * c[4])));
+}
+
 /// Centroid and rate of every sub-swath, as polynomials in two-way range time about refTime
-/// (the near range of SS1): c0 + c1 x + c2 x^2 + c3 x^3 + c4 x^4.
+/// (the near range of SS1), evaluated by `poly4`.
 struct DopplerEstimate {
   double refTime = 0.0;
   std::array<std::array<double, 5>, kSwaths> centroid{};

@@ -230,16 +230,26 @@ int Stage::planner_threads_for(int /*threads*/) const {
   return 1;
 }
 
-PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int threads) const {
+namespace {
+
+// The key of a plan of `shape`: an in-place plan has one alignment for both sides.
+PlanKey key_of(const BatchShape& shape, bool inPlace, int alignIn, int alignOut, int plannerThreads) {
   PlanKey k;
-  k.shape = shape_;
-  k.shape.howmany = howmany;
+  k.shape = shape;
   k.inPlace = inPlace;
   k.alignIn = alignIn;
   k.alignOut = inPlace ? alignIn : alignOut;
-  k.threads = planner_threads_for(threads);
+  k.threads = plannerThreads;
   k.flags = planner_flags();
   return k;
+}
+
+}  // namespace
+
+PlanKey Stage::key_for(int howmany, bool inPlace, int alignIn, int alignOut, int threads) const {
+  BatchShape shape = shape_;
+  shape.howmany = howmany;
+  return key_of(shape, inPlace, alignIn, alignOut, planner_threads_for(threads));
 }
 
 PlanKey Stage::turned_key(int threads) const {
@@ -248,14 +258,8 @@ PlanKey Stage::turned_key(int threads) const {
 }
 
 PlanKey Stage::row_key(bool inPlace, int alignIn, int alignOut, int threads) const {
-  PlanKey k;
-  k.shape = BatchShape{shape_.n, 1, 1, shape_.n, shape_.sign};
-  k.inPlace = inPlace;
-  k.alignIn = alignIn;
-  k.alignOut = inPlace ? alignIn : alignOut;
-  k.threads = planner_threads_for(threads);
-  k.flags = planner_flags();
-  return k;
+  return key_of(BatchShape{shape_.n, 1, 1, shape_.n, shape_.sign}, inPlace, alignIn, alignOut,
+                planner_threads_for(threads));
 }
 
 std::shared_ptr<const FftwPlan> Stage::single_plan(const PlanKey& key) const {
