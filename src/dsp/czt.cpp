@@ -22,26 +22,20 @@ namespace sar::dsp {
 namespace detail {
 
 /// The tables of one step a: the quadratic phase q[i] = i^2 a / 2 for i = 1-N .. max(N, M) - 1
-/// (stored at i + N - 1), the output chirp exp(j q[k]) for k = 0..M-1 and the forward
-/// transform of the kernel exp(-j q[i]) for i = 1-N .. M-1, zero padded to L.
+/// (stored at i + N - 1), the input chirp's quadratic part exp(j q[n]) for n = 0..N-1 in double,
+/// the output chirp exp(j q[k]) for k = 0..M-1 and the forward transform of the kernel
+/// exp(-j q[i]) for i = 1-N .. M-1, zero padded to L.
 struct CztKernel {
   std::uint64_t aBits = 0;
   std::vector<double> q;
+  std::vector<dcomplex> inQuadratic;
   cvector outChirp;
   cvector kernel;
-};
-
-/// The input chirp exp(j (q[n] - n b)), n = 0..N-1, of one step and start.
-struct CztInputChirp {
-  std::uint64_t aBits = 0;
-  std::uint64_t bBits = 0;
-  cvector d;
 };
 
 class CztTables {
  public:
   std::shared_ptr<const CztKernel> kernel(const czt_plan& plan, double a);
-  std::shared_ptr<const CztInputChirp> input(const czt_plan& plan, const CztKernel& k, double b);
 
  private:
   // A plan seldom sees more than one step; a few are kept so that alternating steps do not
@@ -49,8 +43,13 @@ class CztTables {
   static constexpr std::size_t kKernels = 4;
   std::mutex mutex_;
   std::vector<std::shared_ptr<const CztKernel>> kernels_;  // most recently made first
-  std::shared_ptr<const CztInputChirp> input_;
 };
+
+/// The input chirp exp(j (q[n] - n b)), n = 0..N-1, of one step and start, into d. The start
+/// changes with every Doppler line of the Stolt kernel, so its linear phase is not taken through
+/// the sine and cosine sample by sample: exp(-j n b) = exp(-j 64 h b) exp(-j l b) for
+/// n = 64 h + l, which asks for N / 64 + 64 phasors instead of N; the products are in double.
+void input_chirp(const CztKernel& k, int N, double b, fcomplex* d);
 
 }  // namespace detail
 
@@ -198,6 +197,11 @@ std::shared_ptr<const CztKernel> CztTables::kernel(const czt_plan& plan, double 
     const double i = s - (N - 1);
     k->q[static_cast<std::size_t>(s)] = i * i * a * 0.5;
   }
+  k->inQuadratic.resize(static_cast<std::size_t>(N));
+  for (int n = 0; n < N; ++n) {
+    const double qn = k->q[static_cast<std::size_t>(n + N - 1)];
+    k->inQuadratic[static_cast<std::size_t>(n)] = dcomplex(std::cos(qn), std::sin(qn));
+  }
   k->outChirp.resize(static_cast<std::size_t>(M));
   for (int m = 0; m < M; ++m) k->outChirp[static_cast<std::size_t>(m)] = phasor(k->q[static_cast<std::size_t>(m + N - 1)]);
   k->kernel.assign(static_cast<std::size_t>(L), fcomplex{});
@@ -213,26 +217,28 @@ std::shared_ptr<const CztKernel> CztTables::kernel(const czt_plan& plan, double 
   return k;
 }
 
-std::shared_ptr<const CztInputChirp> CztTables::input(const czt_plan& plan, const CztKernel& k, double b) {
-  const std::uint64_t bits = std::bit_cast<std::uint64_t>(b);
-  {
-    std::lock_guard lock(mutex_);
-    if (input_ && input_->aBits == k.aBits && input_->bBits == bits) return input_;
+void input_chirp(const CztKernel& k, int N, double b, fcomplex* d) {
+  constexpr int kRun = 64;
+  const int runs = (N + kRun - 1) / kRun;
+  thread_local std::vector<double> phase, sn, cs;
+  const auto need = static_cast<std::size_t>(kRun + runs);
+  if (phase.size() < need) {
+    phase.resize(need);
+    sn.resize(need);
+    cs.resize(need);
   }
-  const int N = plan.N;
-  auto c = std::make_shared<CztInputChirp>();
-  c->aBits = k.aBits;
-  c->bBits = bits;
-  c->d.resize(static_cast<std::size_t>(N));
-  // A new start comes with every Doppler line of the Stolt kernel: the chirp's phases go
-  // through the vector sine and cosine.
-  std::vector<double> phase(static_cast<std::size_t>(N)), sn(phase.size()), cs(phase.size());
-  for (int n = 0; n < N; ++n) phase[static_cast<std::size_t>(n)] = k.q[static_cast<std::size_t>(n + N - 1)] - n * b;
-  sincos_n(phase, sn, cs);
-  for (std::size_t n = 0; n < phase.size(); ++n) c->d[n] = fcomplex(static_cast<float>(cs[n]), static_cast<float>(sn[n]));
-  std::lock_guard lock(mutex_);
-  input_ = c;
-  return c;
+  for (int l = 0; l < kRun; ++l) phase[static_cast<std::size_t>(l)] = -l * b;
+  for (int h = 0; h < runs; ++h) phase[static_cast<std::size_t>(kRun + h)] = -(static_cast<double>(h) * kRun) * b;
+  sincos_n(std::span<const double>(phase.data(), need), sn, cs);
+  for (int h = 0; h < runs; ++h) {
+    const dcomplex outer(cs[static_cast<std::size_t>(kRun + h)], sn[static_cast<std::size_t>(kRun + h)]);
+    const int first = h * kRun, last = std::min(N, first + kRun);
+    for (int n = first; n < last; ++n) {
+      const auto l = static_cast<std::size_t>(n - first);
+      const dcomplex v = k.inQuadratic[static_cast<std::size_t>(n)] * outer * dcomplex(cs[l], sn[l]);
+      d[n] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+    }
+  }
 }
 
 }  // namespace detail
@@ -261,8 +267,10 @@ int pczt_c(const czt_plan& plan, std::span<const fcomplex> input, std::span<fcom
   if (rows == 0) return 0;
 
   const auto kernel = plan.tables->kernel(plan, a);
-  const auto chirp = plan.tables->input(plan, *kernel, b);
-  const fcomplex* d = chirp->d.data();
+  thread_local cvector chirp;
+  if (chirp.size() < static_cast<std::size_t>(N)) chirp.resize(static_cast<std::size_t>(N));
+  detail::input_chirp(*kernel, N, b, chirp.data());
+  const fcomplex* d = chirp.data();
   const fcomplex* h = kernel->kernel.data();
   const fcomplex* c = kernel->outChirp.data();
 

@@ -22,7 +22,7 @@ class CztTables;
 /// L = genpow(N + M - 1, 1) samples, in place, and the chirp tables of the steps it has run
 /// with. The tables and the transformed kernel depend on N, M and a only, so they are made on
 /// the first call with a step and reused by every later call with the same step (the input
-/// chirp also depends on b and is kept for the last start). The tables are shared by copies
+/// chirp also depends on b and is made on each call, from the step's table). The tables are shared by copies
 /// of the plan and guarded by a lock: one plan may be run from several threads at once.
 struct czt_plan {
   fft_plan forward;

@@ -11,6 +11,7 @@
 #include "dsp/fft.hpp"
 #include "dsp/filters.hpp"
 #include "dsp/vsincos.hpp"
+#include "stripmap/stolt_lines.hpp"
 
 namespace sar::stripmap {
 
@@ -91,6 +92,20 @@ class LineWeight {
     ky_ = ky;
   }
   // Weight of one sample; adds to the normalisation sums when it lies in the chirp's band.
+  /// Weights of bins kStart + (first + u) dk, u < count, without a range window: through the
+  /// vector loops unless the line is weighted sample by sample.
+  void weights(double kStart, int first, double dk, int count, double* out, double& s1, double& s2) const {
+    if (!w_.active()) {
+      std::fill(out, out + count, 1.0);
+      return;
+    }
+    if (exact_) {
+      for (int u = 0; u < count; ++u) out[u] = weight(kStart + (first + u) * dk, 1.0, s1, s2);
+      return;
+    }
+    const detail::NodeWeights nodes{az_.data(), g_.data(), kNodes, k0_, step_, w_.kr0, w_.normBand};
+    detail::line_kernels().node_weights(nodes, kStart, first, dk, count, out, s1, s2);
+  }
   double weight(double kr, double rangeWeight, double& s1, double& s2) const {
     if (!w_.active()) return 1.0;
     double az = 0.0, G = 0.0;
@@ -421,42 +436,36 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
       const int m2 = std::min(M2 - 1, static_cast<int>(std::floor(bin(i2))) + 1);
       double s1 = 0.0, s2 = 0.0;
       const LineWeight lw(w, y, kr0 + s + m1 * dk, kr0 + s + m2 * dk);
+      const detail::LineKernels& kern = detail::line_kernels();
       if (m2 >= m1) {
-        const auto count = static_cast<std::size_t>(m2 - m1 + 1);
-        for (int m = m1; m <= m2; ++m) {
-          const double k = kr0 + s + m * dk;
-          const auto u = static_cast<std::size_t>(m - m1);
-          sc.phase[u] = (std::sqrt(k * k - y * y) - kx0) * wk.R0 - (k + r - kr0) * sr;
-          sc.weight[u] = lw.weight(k, 1.0, s1, s2);
-        }
-        dsp::rotate_n(std::span<fcomplex>(z.data() + m1, count), std::span<const double>(sc.phase.data(), count),
-                      std::span<const double>(sc.weight.data(), count));
+        const int count = m2 - m1 + 1;
+        const auto ucount = static_cast<std::size_t>(count);
+        const detail::ReferencePhase ref{kr0 + s, dk, y * y, kx0, wk.R0, r - kr0, sr, m1};
+        kern.reference_phase(ref, count, sc.phase.data());
+        lw.weights(kr0 + s, m1, dk, count, sc.weight.data(), s1, s2);
+        dsp::rotate_n(std::span<fcomplex>(z.data() + m1, ucount), std::span<const double>(sc.phase.data(), ucount),
+                      std::span<const double>(sc.weight.data(), ucount));
       }
       sums[static_cast<std::size_t>(j)] = {s1, s2};
-      std::fill(out.begin(), out.end(), fcomplex{});
       const double lineTurn = (y - ky0) * sa + (wk.R0 / std::cos(squint)) * r;
       // Linear interpolation between the two chirp-Z bins, each turned back by its half-bin
       // phase: (1 - t) e^{j pi t} z_p + t e^{-j pi (1 - t)} z_{p+1}, and the line's own turn.
       // Since e^{-j pi (1 - t)} = -e^{j pi t}, one rotation serves all three. The bins and
       // phases of the line's span are gathered first for one call of the vector sine.
-      const auto span = static_cast<std::size_t>(i2 - i1 + 1);
-      for (int i = i1; i <= i2; ++i) {
-        const double x = bin(i);
-        const auto u = static_cast<std::size_t>(i - i1);
-        sc.weight[u] = x;  // the fractional bin, kept for the mix below
-        sc.phase[u] = kPi * (x - std::floor(x)) + lineTurn;
-      }
-      dsp::sincos_n(std::span<const double>(sc.phase.data(), span), sc.s, sc.c);
-      for (int i = i1; i <= i2; ++i) {
-        const auto u = static_cast<std::size_t>(i - i1);
-        const double x = sc.weight[u];
-        const int p = static_cast<int>(std::floor(x));
-        if (p < 0 || p >= M2) continue;
-        const double t = x - p;
-        const dcomplex mix = (1.0 - t) * dcomplex(z[static_cast<std::size_t>(p)]) -
-                             t * dcomplex(z[static_cast<std::size_t>(p + 1)]);
-        const dcomplex v = mix * dcomplex(sc.c[u], sc.s[u]);
-        out[static_cast<std::size_t>((i + M / 2) % M)] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+      const int span = i2 - i1 + 1;
+      const auto uspan = static_cast<std::size_t>(span);
+      const detail::OutputBins bins{kx.first, kx.step, y * y, kr0 + s, dk, lineTurn, i1};
+      kern.output_bins(bins, span, sc.weight.data(), sc.phase.data());
+      dsp::sincos_n(std::span<const double>(sc.phase.data(), uspan), sc.s, sc.c);
+      // Output bin i goes to (i + M / 2) mod M: two runs, each contiguous.
+      std::fill(out.begin(), out.end(), fcomplex{});
+      const int wrap = M - M / 2;  // first bin that wraps round
+      for (const auto& [from, to, dst] : {std::array<int, 3>{i1, std::min(i2, wrap - 1), i1 + M / 2},
+                                          std::array<int, 3>{std::max(i1, wrap), i2, std::max(i1, wrap) + M / 2 - M}}) {
+        if (to < from) continue;
+        const auto u = static_cast<std::size_t>(from - i1);
+        kern.two_point(z.data(), M2, sc.weight.data() + u, sc.s.data() + u, sc.c.data() + u, to - from + 1,
+                       out.data() + dst);
       }
       finish_row(back, out, row, Nout, n);
     });
