@@ -22,7 +22,8 @@ constexpr int kSamples = 5616;
 constexpr int kReplica = 521;
 constexpr double kFs = 19.20768e6;
 
-void fill(sar::dsp::cvector& m, std::size_t n) {
+template <class Matrix>
+void fill(Matrix& m, std::size_t n) {
   m.resize(n);
   std::mt19937 gen(1);
   std::uniform_real_distribution<float> u(-20.0f, 20.0f);

@@ -19,6 +19,8 @@
 #include <memory>
 #include <new>
 #include <span>
+#include <type_traits>
+#include <utility>
 #include <vector>
 
 #include "dsp/complex.hpp"
@@ -107,6 +109,35 @@ struct fft_allocator {
 
 /// A vector of samples in aligned memory.
 using cvector = std::vector<fcomplex, fft_allocator<fcomplex>>;
+
+/// fft_allocator whose growth leaves new samples unwritten (resize(n) without a value, or
+/// vector(n)): for large matrices whose rows are written before they are read, so that their
+/// pages are first touched by the threads that fill them, once, instead of being cleared by
+/// one thread beforehand. A value given explicitly (assign(n, v), resize(n, v)) is written.
+template <class T>
+struct fft_uninit_allocator : fft_allocator<T> {
+  using value_type = T;
+  template <class U>
+  struct rebind {
+    using other = fft_uninit_allocator<U>;
+  };
+  fft_uninit_allocator() = default;
+  template <class U>
+  fft_uninit_allocator(const fft_uninit_allocator<U>&) noexcept {}
+  template <class U, class... Args>
+  void construct(U* p, Args&&... args) {
+    if constexpr (sizeof...(Args) == 0 && std::is_trivially_copyable_v<U>) {
+      // Left as the allocation found it.
+    } else {
+      ::new (static_cast<void*>(p)) U(std::forward<Args>(args)...);
+    }
+  }
+  template <class U>
+  bool operator==(const fft_uninit_allocator<U>&) const noexcept { return true; }
+};
+
+/// A matrix of samples in aligned memory, grown without clearing (see fft_uninit_allocator).
+using cmatrix = std::vector<fcomplex, fft_uninit_allocator<fcomplex>>;
 
 /// Engine settings. Threads: how many threads a large transform may use (0: the default,
 /// OpenMP's or the hardware's count). The result does not depend on it: a batch is cut into

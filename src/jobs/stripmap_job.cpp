@@ -345,7 +345,7 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
     hostlib::write_footprint(c.par.slcPath, hostlib::kFootprintAllFiles);
     errno = 0;
     // The next image needs the memory this one held.
-    c.proc.matrix = dsp::cvector();
+    c.proc.matrix = dsp::cmatrix();
     c.proc.lineShifts = std::vector<int32_t>();
   }
 

@@ -329,7 +329,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     in = std::make_unique<InputRaster>(par.rgfPath, static_cast<int64_t>(lines) * samples * 8, "range-focused file");
     out = std::make_unique<OutputRaster>(par.slcPath);
   }
-  dsp::cvector block(static_cast<std::size_t>(samples) * std::min(Lb, lines));
+  dsp::cmatrix block(static_cast<std::size_t>(samples) * std::min(Lb, lines));  // every block is copied in whole
   progress_open("Azimuth Focusing");
   focazwk_result result;
   int64_t written = 0;  // focused lines so far (core mode packs them at pitch So)

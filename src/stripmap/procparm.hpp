@@ -50,8 +50,9 @@ struct procparm : metadata::SceneReferences {
   // FFT length of the range correlation; in core mode also the row pitch of the raw matrix.
   int32_t paddedLength = 0;
   // The block buffer, or in core mode the whole matrix (pitch paddedLength while raw, then
-  // rangeSamples after range compression, focusedSamples after azimuth focusing).
-  dsp::cvector matrix;
+  // rangeSamples after range compression, focusedSamples after azimuth focusing). Grown
+  // without clearing: every row is written before it is read.
+  dsp::cmatrix matrix;
   // Per line: window start offset in samples against the earliest window.
   std::vector<int32_t> lineShifts;
   // Core mode: the raw lines as the extraction left them in memory (no line file); init_buffer

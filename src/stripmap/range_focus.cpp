@@ -87,7 +87,7 @@ int load_lines(RawLines& in, const sarpar& par, const procparm& proc, const Rang
 // the copies then run in parallel a store chunk at a time. The matrix grows by the chunk's rows
 // within its reserved room (so it never moves) and each chunk is freed once copied: the store
 // and the matrix never both hold the whole scene.
-int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, const RangeSizes& z, dsp::cvector& rows,
+int load_store(io::LineStore& store, const sarpar& par, const procparm& proc, const RangeSizes& z, dsp::cmatrix& rows,
                int32_t* shifts, OrtogMoments* sums) {
   const int32_t lines = par.lines;
   const std::size_t sampleBytes = 8 * static_cast<std::size_t>(z.rawSamples);
@@ -339,7 +339,7 @@ int init_buffer(const sarpar& par, procparm& proc) {
     st = load_lines(in, par, proc, z, 0, par.lines, proc.matrix.data(), proc.lineShifts.data());
   }
   if (st != 0) {
-    proc.matrix = dsp::cvector();
+    proc.matrix = dsp::cmatrix();
     proc.lineShifts.clear();
     return frame.check(st);
   }
@@ -420,7 +420,7 @@ int dest_buffer(const sarpar& par, procparm& proc) {
   OutputRaster out(par.slcPath);
   out.write(proc.matrix.data(), count);
   out.commit();
-  proc.matrix = dsp::cvector();
+  proc.matrix = dsp::cmatrix();
   proc.lineShifts = std::vector<int32_t>();
   return 0;
 }
