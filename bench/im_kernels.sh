@@ -10,7 +10,10 @@
 # The simulated product is shared with bench/im_job_full.sh ($SAR_BENCH_DIR, out/bench_im).
 # SAR_BENCH_SQUINT_HZ=F simulates (and keeps apart) a scene whose beam is squinted to the
 # centroid F instead of following the yaw-steering law; AzimuthOverlap is then taken from
-# SAR_BENCH_AZIMUTH_OVERLAP when set.
+# SAR_BENCH_AZIMUTH_OVERLAP when set. SAR_BENCH_EDGES=1 adds (and keeps apart) two targets
+# near the near and far edges of the swath, where a range block's single equivalent velocity
+# and centroid are furthest from the targets' own. SAR_BENCH_PARAMS, a sed script, edits the
+# parameter file of every run (e.g. 's/^SamplesInBlock = .*/SamplesInBlock = 5120/').
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
@@ -24,14 +27,16 @@ work="${SAR_BENCH_DIR:-$here/out/bench_im}"
 cmake --build "$build" -j2 --target sarsim focussing sarirf >/dev/null
 
 squint="${SAR_BENCH_SQUINT_HZ:-}"
-input="$work/input_${lines}x${samples}${squint:+_squint$squint}"
+edges=()
+[ "${SAR_BENCH_EDGES:-0}" = 1 ] && edges=(--target 44.916,10.540,0,40 --target 45.090,9.530,0,40)
+input="$work/input_${lines}x${samples}${squint:+_squint$squint}${edges:+_edges}"
 if ! ls "$input"/ASA_IM__0*.N1 >/dev/null 2>&1; then
   rm -rf "$input"
   mkdir -p "$input"
   echo "== simulating ${lines} x ${samples} (clutter and point targets)"
   "$build/tools/sarsim" --out "$input" --lines "$lines" --samples "$samples" --noise 0 --clutter-db 25 \
     --clutter-contrast low --yaw-steering on ${squint:+--squint-hz "$squint"} --target 45.000,10.000,0,40 --target 45.010,10.030,0,40 \
-    --target 44.992,9.985,100,35 >/dev/null
+    --target 44.992,9.985,100,35 "${edges[@]}" >/dev/null
 fi
 product=$(ls "$input"/ASA_IM__0*.N1)
 orbit=$(ls "$input"/DOR_VOR_AX*)
@@ -49,6 +54,7 @@ for kernel in "${kernels[@]}"; do
   sed -i "s/^PerformInterpolation = .*/PerformInterpolation = $kernel/" "$job/des/parameters_IM.hdr"
   [ -z "${SAR_BENCH_AZIMUTH_OVERLAP:-}" ] ||
     sed -i "s/^AzimuthOverlap = .*/AzimuthOverlap = $SAR_BENCH_AZIMUTH_OVERLAP/" "$job/des/parameters_IM.hdr"
+  [ -z "${SAR_BENCH_PARAMS:-}" ] || sed -i "$SAR_BENCH_PARAMS" "$job/des/parameters_IM.hdr"
   start=$(date +%s.%N)
   # Processor time (user and system) beside the wall time: on a shared machine it is the figure
   # the load disturbs least.

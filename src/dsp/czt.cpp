@@ -230,13 +230,16 @@ void input_chirp(const CztKernel& k, int N, double b, fcomplex* d) {
   for (int l = 0; l < kRun; ++l) phase[static_cast<std::size_t>(l)] = -l * b;
   for (int h = 0; h < runs; ++h) phase[static_cast<std::size_t>(kRun + h)] = -(static_cast<double>(h) * kRun) * b;
   sincos_n(std::span<const double>(phase.data(), need), sn, cs);
+  // The products written out: std::complex's operator* would check every one for NaN.
   for (int h = 0; h < runs; ++h) {
-    const dcomplex outer(cs[static_cast<std::size_t>(kRun + h)], sn[static_cast<std::size_t>(kRun + h)]);
+    const double oc = cs[static_cast<std::size_t>(kRun + h)], os = sn[static_cast<std::size_t>(kRun + h)];
     const int first = h * kRun, last = std::min(N, first + kRun);
-    for (int n = first; n < last; ++n) {
-      const auto l = static_cast<std::size_t>(n - first);
-      const dcomplex v = k.inQuadratic[static_cast<std::size_t>(n)] * outer * dcomplex(cs[l], sn[l]);
-      d[n] = fcomplex(static_cast<float>(v.real()), static_cast<float>(v.imag()));
+    const dcomplex* q = k.inQuadratic.data() + first;
+    for (int l = 0; l < last - first; ++l) {
+      const double lc = cs[static_cast<std::size_t>(l)] * oc - sn[static_cast<std::size_t>(l)] * os;
+      const double ls = cs[static_cast<std::size_t>(l)] * os + sn[static_cast<std::size_t>(l)] * oc;
+      const double qr = q[l].real(), qi = q[l].imag();
+      d[first + l] = fcomplex(static_cast<float>(qr * lc - qi * ls), static_cast<float>(qr * ls + qi * lc));
     }
   }
 }

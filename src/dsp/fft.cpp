@@ -98,7 +98,8 @@ int fft_makep_c(fft_plan& plan, int pitch, int length, int rows, int count, int 
   return 0;
 }
 
-int pfft_c(const fft_plan& plan, std::span<const fcomplex> input, std::span<fcomplex> output) {
+namespace {
+int run_plan(const fft_plan& plan, std::span<const fcomplex> input, std::span<fcomplex> output, double gain) {
   if (!plan.rowStage && !plan.colStage) return 0;
   const std::int64_t need = plan.extent();
   if (static_cast<std::int64_t>(input.size()) < need) throw_short("pfft_c", "input", input.size(), need);
@@ -108,13 +109,23 @@ int pfft_c(const fft_plan& plan, std::span<const fcomplex> input, std::span<fcom
   if (in != out && overlap(in, out, need))
     throw std::invalid_argument("pfft_c: input and output overlap without being the same buffer");
 
-  const double factor = (plan.rowScale ? 1.0 / plan.rowLength : 1.0) * (plan.colScale ? 1.0 / plan.colLength : 1.0);
+  const double factor =
+      (plan.rowScale ? 1.0 / plan.rowLength : 1.0) * (plan.colScale ? 1.0 / plan.colLength : 1.0) * gain;
   if (plan.rowStage) plan.rowStage->run(in, out, plan.colStage ? 1.0 : factor);
   if (plan.colStage) plan.colStage->run(plan.rowStage ? out : in, out, factor);
   return 0;
 }
+}  // namespace
+
+int pfft_c(const fft_plan& plan, std::span<const fcomplex> input, std::span<fcomplex> output) {
+  return run_plan(plan, input, output, 1.0);
+}
 
 int pfft_c(const fft_plan& plan, std::span<fcomplex> data) { return pfft_c(plan, data, data); }
+
+int pfft_c(const fft_plan& plan, std::span<fcomplex> data, double gain) {
+  return run_plan(plan, data, data, gain);
+}
 
 int fft_destp_c(fft_plan& plan) {
   plan = fft_plan{};

@@ -66,6 +66,9 @@ int fft_makep_c(fft_plan& plan, int pitch, int length, int rows, int count, int 
 int pfft_c(const fft_plan& plan, std::span<const fcomplex> input, std::span<fcomplex> output);
 /// In place.
 int pfft_c(const fft_plan& plan, std::span<fcomplex> data);
+/// In place, the result also multiplied by `gain` (in the same pass as the normalisation; an
+/// empty plan leaves the data as it is, like the other forms).
+int pfft_c(const fft_plan& plan, std::span<fcomplex> data, double gain);
 
 /// Releases the plan's stages. Returns 0.
 int fft_destp_c(fft_plan& plan);

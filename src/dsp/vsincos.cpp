@@ -83,4 +83,15 @@ void rotate_n(std::span<fcomplex> x, std::span<const double> phase, std::span<co
     detail::rotate_sse2(x.data(), phase.data(), w, x.size());
 }
 
+void rotate_by(std::span<fcomplex> x, std::span<const dcomplex> phasor) {
+  if (phasor.size() < x.size()) throw std::invalid_argument("rotate_by: fewer phasors than samples");
+  float* v = reinterpret_cast<float*>(x.data());
+  const double* p = reinterpret_cast<const double*>(phasor.data());
+  for (std::size_t i = 0; i < x.size(); ++i) {
+    const double re = v[2 * i], im = v[2 * i + 1], c = p[2 * i], s = p[2 * i + 1];
+    v[2 * i] = static_cast<float>(re * c - im * s);
+    v[2 * i + 1] = static_cast<float>(re * s + im * c);
+  }
+}
+
 }  // namespace sar::dsp

@@ -18,6 +18,11 @@ void sincos_n(std::span<const double> phase, std::span<double> s, std::span<doub
 /// An empty weight counts as all ones. Spans as long as x (throws std::invalid_argument).
 void rotate_n(std::span<fcomplex> x, std::span<const double> phase, std::span<const double> weight = {});
 
+/// x[i] = phasor[i] x[i], the product in double precision, rounded to float: for a turn that is
+/// the same on many rows, whose phasors are made once. phasor as long as x (throws
+/// std::invalid_argument otherwise).
+void rotate_by(std::span<fcomplex> x, std::span<const dcomplex> phasor);
+
 /// Name of the vector path in use ("avx2" or "sse2"), for logs and benchmarks.
 const char* sincos_path();
 

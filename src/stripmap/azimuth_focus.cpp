@@ -201,22 +201,23 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     // The copy back carries the ramp that removes the change of the wavenumber centre
     // (exp(j k_d i dr) over the block's samples i), while the lines are in cache.
     const double step = result.rangeSpacing;
-    base::ParallelFailure failure;
-#pragma omp parallel
-    {
-      std::vector<double> phase;
-      failure.run([&] {
-        phase.resize(kd != 0.0 ? static_cast<std::size_t>(std::max(back, 0)) : 0);
-        for (std::size_t i = 0; i < phase.size(); ++i) phase[i] = kd * ((o + static_cast<int32_t>(i)) * step + 0.0);
-      });
-#pragma omp for schedule(static)
-      for (int32_t l = 0; l < lines; ++l) failure.run([&] {
-        const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
-        fcomplex* dst = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
-        std::copy(src, src + back, dst);
-        if (!phase.empty()) dsp::rotate_n(std::span<fcomplex>(dst, phase.size()), phase);
-      });
+    // The ramp is the same on every line: its phasors are made once per sub-block.
+    std::vector<dsp::dcomplex> ramp;
+    if (kd != 0.0 && back > 0) {
+      std::vector<double> phase(static_cast<std::size_t>(back)), s(phase.size()), c(phase.size());
+      for (std::size_t i = 0; i < phase.size(); ++i) phase[i] = kd * ((o + static_cast<int32_t>(i)) * step + 0.0);
+      dsp::sincos_n(phase, s, c);
+      ramp.resize(phase.size());
+      for (std::size_t i = 0; i < ramp.size(); ++i) ramp[i] = dsp::dcomplex(c[i], s[i]);
     }
+    base::ParallelFailure failure;
+#pragma omp parallel for schedule(static)
+    for (int32_t l = 0; l < lines; ++l) failure.run([&] {
+      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
+      fcomplex* dst = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
+      std::copy(src, src + back, dst);
+      if (!ramp.empty()) dsp::rotate_by(std::span<fcomplex>(dst, ramp.size()), ramp);
+    });
     failure.rethrow();
   }
   wk.nearTime = savedNear;

@@ -182,16 +182,11 @@ double normalisation(const Weighting& w, const std::vector<std::array<double, 2>
   return (s1 > 0.0 && s2 > 0.0) ? std::sqrt(s2 / s1) : 1.0;
 }
 
-void scale(std::span<fcomplex> data, double norm) {
-  if (norm == 1.0) return;
-  const auto f = static_cast<float>(1.0 / norm);
-  for (auto& x : data) x *= f;
-}
-
-// Back to azimuth time and the weighting's normalisation.
+// Back to azimuth time and the weighting's normalisation, in one pass.
 void finish_block(wkparm& wk, const Weighting& w, const std::vector<std::array<double, 2>>& sums) {
-  dsp::fft_c(wk.samples, wk.samples, wk.lines, wk.lines, 0, -1, wk.data);
-  scale(wk.data, normalisation(w, sums));
+  dsp::fft_plan back;
+  if (dsp::fft_makep_c(back, wk.samples, wk.samples, wk.lines, wk.lines, 0, -1, 1) != 0) return;
+  dsp::pfft_c(back, wk.data, 1.0 / normalisation(w, sums));
 }
 
 // kx axis of the mapped grid: kx[i] = kxc - floor(M/2) dkx + i dkx.

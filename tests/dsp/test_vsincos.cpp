@@ -68,6 +68,13 @@ TEST(VectorSinCos, RotatesSamplesWithAndWithoutWeights) {
     EXPECT_NEAR(z[i].real(), weight[i] * want.real(), 1e-6) << i;
     EXPECT_NEAR(z[i].imag(), weight[i] * want.imag(), 1e-6) << i;
   }
+  // The same turn from phasors made beforehand.
+  std::vector<std::complex<double>> phasor(n);
+  for (std::size_t i = 0; i < n; ++i) phasor[i] = std::polar(weight[i], phase[i]);
+  std::vector<fcomplex> t = x;
+  sar::dsp::rotate_by(t, phasor);
+  for (std::size_t i = 0; i < n; ++i) EXPECT_NEAR(std::abs(std::complex<double>(t[i]) - std::complex<double>(z[i])), 0.0, 2e-6) << i;
+  EXPECT_THROW(sar::dsp::rotate_by(t, std::span<const std::complex<double>>(phasor.data(), n - 1)), std::invalid_argument);
   std::vector<double> shortWeight(n - 1, 1.0);
   EXPECT_THROW(sar::dsp::rotate_n(y, phase, shortWeight), std::invalid_argument);
   EXPECT_THROW(sar::dsp::rotate_n(y, std::span<const double>(phase.data(), n - 1)), std::invalid_argument);
