@@ -153,6 +153,13 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   }
   const double savedNear = wk.nearTime;
   const std::span<fcomplex> block = wk.data;
+  const fcomplex* source = wk.input ? wk.input : block.data();
+  const int32_t keepFirst = wk.keepLines < 0 ? 0 : std::clamp(wk.keepFirst, 0, lines);
+  const int32_t keepLines = wk.keepLines < 0 ? lines : std::min(wk.keepLines, lines - keepFirst);
+  if (static_cast<int64_t>(std::max(keepLines, 0)) * n > static_cast<int64_t>(block.size())) {
+    base::report(base::kReportError, "Range sub-blocks: the output lines do not fit the block");
+    return frame.check(kRejected);
+  }
   wk.fd = poly5(poly, wk.nearTime - reference + (n / wk.fs) / 2);
   wk.fdNear = poly5(poly, wk.nearTime - reference);
   wk.fdFar = poly5(poly, wk.nearTime - reference + n / wk.fs);
@@ -174,7 +181,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     const int32_t take = std::min(Sb, n - o);
 #pragma omp parallel for schedule(static)
     for (int32_t l = 0; l < lines; ++l) {
-      const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
+      const fcomplex* src = source + static_cast<std::ptrdiff_t>(l) * n + o;
       const auto row = work.begin() + static_cast<std::ptrdiff_t>(l) * Sb;
       std::fill(row + take, row + Sb, fcomplex{});
       std::copy(src, src + take, row);
@@ -211,9 +218,11 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
       for (std::size_t i = 0; i < ramp.size(); ++i) ramp[i] = dsp::dcomplex(c[i], s[i]);
     }
     base::ParallelFailure failure;
+    // Later sub-blocks read columns from o + back on, so the kept lines may overwrite the
+    // input in place.
 #pragma omp parallel for schedule(static)
-    for (int32_t l = 0; l < lines; ++l) failure.run([&] {
-      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l) * Sb + Ov / 2;
+    for (int32_t l = 0; l < keepLines; ++l) failure.run([&] {
+      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l + keepFirst) * Sb + Ov / 2;
       fcomplex* dst = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
       std::copy(src, src + back, dst);
       if (!ramp.empty()) dsp::rotate_by(std::span<fcomplex>(dst, ramp.size()), ramp);
@@ -344,12 +353,15 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     block_counters().current = b + 1;
     if (blockLines <= lead + trail) continue;
     const auto count = static_cast<std::size_t>(blockLines) * samples;
-    if (core) {
-      std::copy_n(proc.matrix.begin() + static_cast<std::ptrdiff_t>(l0) * samples, count, block.begin());
-    } else {
+    // Core mode reads the sub-blocks straight from the matrix; the block buffer then only
+    // takes the focused lines.
+    if (!core) {
       in->seek(static_cast<int64_t>(l0) * samples * 8);
       in->read(block.data(), static_cast<int64_t>(count) * 8);
     }
+    wk.input = core ? proc.matrix.data() + static_cast<std::ptrdiff_t>(l0) * samples : nullptr;
+    wk.keepFirst = lead;
+    wk.keepLines = Ln;
     const double t = (blockLines / 2 + l0) / prf + par.azimuthStartTime - dc[8];
     const double p[5] = {dc[0] + dc[2] * t, dc[1] + dc[3] * t, dc[4], dc[5], dc[6]};
     wk.lines = blockLines;
@@ -359,7 +371,7 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     wk.rangeShift = sceneRangeShift;
     wk.azimuthShift = sceneAzimuthShift;
     if (int st = frame.check(multirg(wk, result, az.SamplesInBlock, 2 * hr, p, dc[7]))) return st;
-    for (int32_t l = lead; l < lead + Ln; ++l) {
+    for (int32_t l = 0; l < Ln; ++l) {
       const fcomplex* src = block.data() + static_cast<std::ptrdiff_t>(l) * samples;
       if (core) {
         std::copy(src, src + So, proc.matrix.begin() + static_cast<std::ptrdiff_t>(written) * So);

@@ -64,6 +64,12 @@ struct wkparm {
   int32_t WhiteningFlag = 0;
   int32_t transformSign = 0;  // only 0 is supported
   std::span<fcomplex> data;   // lines x samples
+  // multirg only: where the sub-blocks are read from (lines x samples; null: `data`), and the
+  // lines of the block whose focused samples are written back into `data`, from its first
+  // line on (keepLines < 0: every line, in place).
+  const fcomplex* input = nullptr;
+  int32_t keepFirst = 0;
+  int32_t keepLines = -1;
   // The range sub-block work matrix: made once for the stage, reused by every block.
   dsp::cvector subBlock;
   double R0 = 0.0;            // reference range, m
