@@ -16,12 +16,12 @@ namespace detail {
 void sincos_sse2(const double* phase, double* s, double* c, std::size_t n) {
   std::size_t i = 0;
   for (; i + 2 <= n; i += 2) {
-    const Sleef___m128d_2 r = Sleef_sincosd2_u10sse2(_mm_loadu_pd(phase + i));
+    const Sleef___m128d_2 r = Sleef_sincosd2_u35sse2(_mm_loadu_pd(phase + i));
     _mm_storeu_pd(s + i, r.x);
     _mm_storeu_pd(c + i, r.y);
   }
   if (i < n) {
-    const Sleef___m128d_2 r = Sleef_sincosd2_u10sse2(_mm_set_pd(0.0, phase[i]));
+    const Sleef___m128d_2 r = Sleef_sincosd2_u35sse2(_mm_set_pd(0.0, phase[i]));
     s[i] = _mm_cvtsd_f64(r.x);
     c[i] = _mm_cvtsd_f64(r.y);
   }

@@ -1,7 +1,8 @@
 #pragma once
 // Vector sine and cosine in double precision for the per-sample phase terms of the focusing
-// kernels: SLEEF's vector functions (within 1 ulp), four phases at a time where the processor
-// has AVX2 and FMA, two at a time otherwise. The choice is made once per process, so every
+// kernels: SLEEF's vector functions within 3.5 ulp (a few parts in 1e16, far below the float
+// samples' own rounding, in 60 % of the time of the 1-ulp ones), four phases at a time where
+// the processor has AVX2 and FMA, two at a time otherwise. The choice is made once per process, so every
 // call of a run, on any thread, gives the same bytes.
 #include <cstddef>
 #include <span>

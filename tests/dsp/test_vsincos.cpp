@@ -26,10 +26,10 @@ TEST(VectorSinCos, MatchesTheLibraryAtEveryLengthAndPhase) {
     // The baseline path too, which this machine may not choose.
     sar::dsp::detail::sincos_sse2(phase.data(), s2.data(), c2.data(), n);
     for (std::size_t i = 0; i < n; ++i) {
-      EXPECT_NEAR(s[i], std::sin(phase[i]), 2e-16) << sar::dsp::sincos_path() << " n " << n << " phase " << phase[i];
-      EXPECT_NEAR(c[i], std::cos(phase[i]), 2e-16) << sar::dsp::sincos_path() << " n " << n << " phase " << phase[i];
-      EXPECT_NEAR(s2[i], std::sin(phase[i]), 2e-16) << "sse2 n " << n << " phase " << phase[i];
-      EXPECT_NEAR(c2[i], std::cos(phase[i]), 2e-16) << "sse2 n " << n << " phase " << phase[i];
+      EXPECT_NEAR(s[i], std::sin(phase[i]), 1e-15) << sar::dsp::sincos_path() << " n " << n << " phase " << phase[i];
+      EXPECT_NEAR(c[i], std::cos(phase[i]), 1e-15) << sar::dsp::sincos_path() << " n " << n << " phase " << phase[i];
+      EXPECT_NEAR(s2[i], std::sin(phase[i]), 1e-15) << "sse2 n " << n << " phase " << phase[i];
+      EXPECT_NEAR(c2[i], std::cos(phase[i]), 1e-15) << "sse2 n " << n << " phase " << phase[i];
     }
   }
 }

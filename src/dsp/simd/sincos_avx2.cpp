@@ -12,7 +12,7 @@ namespace sar::dsp::detail {
 void sincos_avx2(const double* phase, double* s, double* c, std::size_t n) {
   std::size_t i = 0;
   for (; i + 4 <= n; i += 4) {
-    const Sleef___m256d_2 r = Sleef_sincosd4_u10avx2(_mm256_loadu_pd(phase + i));
+    const Sleef___m256d_2 r = Sleef_sincosd4_u35avx2(_mm256_loadu_pd(phase + i));
     _mm256_storeu_pd(s + i, r.x);
     _mm256_storeu_pd(c + i, r.y);
   }
@@ -21,7 +21,7 @@ void sincos_avx2(const double* phase, double* s, double* c, std::size_t n) {
     // where it stands in the array.
     alignas(32) double p[4] = {0.0, 0.0, 0.0, 0.0}, rs[4], rc[4];
     for (std::size_t k = 0; i + k < n; ++k) p[k] = phase[i + k];
-    const Sleef___m256d_2 r = Sleef_sincosd4_u10avx2(_mm256_load_pd(p));
+    const Sleef___m256d_2 r = Sleef_sincosd4_u35avx2(_mm256_load_pd(p));
     _mm256_store_pd(rs, r.x);
     _mm256_store_pd(rc, r.y);
     for (std::size_t k = 0; i + k < n; ++k) {
