@@ -8,9 +8,13 @@
 #
 #   bench/im_job_full.sh [LINES [SAMPLES [THREADS...]]]     default 30000 5616 2 1
 #
-# The simulated product is kept in $SAR_BENCH_DIR (default out/bench_im) and reused by later
-# runs of the same size. The job runs with the shipped parameter file, with Flag_incore set
-# from SAR_BENCH_INCORE (default 1: the range-compressed scene held in memory).
+# SAR_BENCH_MODE=AP measures the AP job the same way on an alternating polarisation product of
+# as many packets (the simulator's APC sub-mode; bench/ap_job_full.sh sets it).
+#
+# The simulated product is kept in $SAR_BENCH_DIR (default out/bench_im, out/bench_ap for AP)
+# and reused by later runs of the same size. The job runs with the shipped parameter file,
+# with Flag_incore set from SAR_BENCH_INCORE (default 1: the range-compressed scene held in
+# memory).
 set -euo pipefail
 here="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 build="${SAR_BUILD_DIR:-$here/build}"
@@ -20,7 +24,13 @@ samples="${2:-5616}"
 shift $(( $# < 2 ? $# : 2 ))
 thread_counts=("$@")
 [ ${#thread_counts[@]} -gt 0 ] || thread_counts=(2 1)
-work="${SAR_BENCH_DIR:-$here/out/bench_im}"
+mode="${SAR_BENCH_MODE:-IM}"
+case "$mode" in
+  IM) sim_mode=im; product_glob='ASA_IM__0*.N1' ;;
+  AP) sim_mode=apc; product_glob='ASA_AP*_0*.N1' ;;
+  *) echo "$bench_name: SAR_BENCH_MODE must be IM or AP" >&2; exit 2 ;;
+esac
+work="${SAR_BENCH_DIR:-$here/out/bench_$(echo "$mode" | tr 'A-Z' 'a-z')}"
 incore="${SAR_BENCH_INCORE:-1}"
 
 bench_need_time
@@ -34,15 +44,15 @@ bench_bound
 simulate() {
   local n="$1"
   local input="$work/input_${n}x${samples}"
-  if ! ls "$input"/ASA_IM__0*.N1 >/dev/null 2>&1; then
+  if ! ls "$input"/$product_glob >/dev/null 2>&1; then
     rm -rf "$input"
     mkdir -p "$input"
     echo "== simulating ${n} x ${samples} (clutter and point targets)"
-    "$build/tools/sarsim" --out "$input" --lines "$n" --samples "$samples" --noise 0 --clutter-db 25 \
+    "$build/tools/sarsim" --out "$input" --mode "$sim_mode" --lines "$n" --samples "$samples" --noise 0 --clutter-db 25 \
       --clutter-contrast low --yaw-steering on --target 45.000,10.000,0,40 --target 45.010,10.030,0,40 \
       --target 44.992,9.985,100,35 >/dev/null
   fi
-  product=$(ls "$input"/ASA_IM__0*.N1)
+  product=$(ls "$input"/$product_glob)
   orbit=$(ls "$input"/DOR_VOR_AX*)
   ins=$(ls "$input"/ASA_INS_AX*)
   xca=$(ls "$input"/ASA_XCA_AX*)
@@ -57,10 +67,10 @@ run_job() {
   local threads="$1" status
   # A fresh working directory for each run: a finished job deletes its working file.
   rm -rf "$job"
-  "$exe" --setup "$job" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
+  "$exe" --setup "$job" --mode "$mode" --arg 0="$product" --arg 1="$orbit" --arg 2="$ins" --arg 3="$xca" \
     --arg 4="$job/scene" --arg 5=1024 --arg 6=1024 --arg 12=OK --arg 13=1.0 >/dev/null
-  sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_IM.hdr"
-  bench_run_job "$threads" "$job" "$exe" "main_focussing_asar_IM#$job/job.txt"
+  sed -i "s/^Flag_incore = .*/Flag_incore = $incore/" "$job/des/parameters_$mode.hdr"
+  bench_run_job "$threads" "$job" "$exe" "main_focussing_asar_$mode#$job/job.txt"
   leftover=$(cd "$job" && ls -d EXTR* DCEST_resume.txt 2>/dev/null | tr '\n' ' ' || true)
 }
 
@@ -76,7 +86,7 @@ echo "== bare transforms of the same scene"
 read -r range_ms azimuth_ms < <(bench_bare "$lines" "$samples" "$threads")
 
 echo
-echo "IM job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
+echo "$mode job, ${lines} lines x ${samples} samples, ${threads} threads, Flag_incore ${incore}"
 bench_stages "$job/Vanterra.log"
 grep -E "SLC: " "$job/Vanterra.log" | sed 's/^/  /'
 echo "  work files left      ${leftover:-none}"
