@@ -1,10 +1,35 @@
 #include "io/line_store.hpp"
 
+#include <sys/mman.h>
+
 #include <algorithm>
+#include <cstdlib>
 #include <cstring>
+#include <new>
 #include <stdexcept>
 
+#include "base/diagnostics.hpp"
+
 namespace sar::io {
+
+namespace {
+
+constexpr std::size_t kHugePage = std::size_t{2} << 20;
+
+std::byte* allocate_chunk(std::size_t bytes) {
+  const std::size_t rounded = (bytes + kHugePage - 1) / kHugePage * kHugePage;
+  void* p = std::aligned_alloc(kHugePage, rounded);
+  if (!p) throw std::bad_alloc();
+  // Advice only: without huge pages it fails, which changes nothing and must leave no errno
+  // behind for the callers' frames to report.
+  const base::ErrnoGuard keep;
+  ::madvise(p, rounded, MADV_HUGEPAGE);
+  return static_cast<std::byte*>(p);
+}
+
+}  // namespace
+
+void LineStore::Free::operator()(std::byte* p) const noexcept { std::free(p); }
 
 LineStore::LineStore(std::size_t lineBytes, std::size_t chunkBytes)
     : lineBytes_(std::max<std::size_t>(lineBytes, 1)), linesPerChunk_(std::max<std::size_t>(chunkBytes / lineBytes_, 1)) {}
@@ -15,7 +40,7 @@ void LineStore::append(const void* data, std::size_t bytes) {
   while (bytes > 0) {
     const std::size_t chunk = bytes_ / chunkBytes;
     const std::size_t at = bytes_ % chunkBytes;
-    if (chunk == chunks_.size()) chunks_.push_back(std::make_unique_for_overwrite<std::byte[]>(chunkBytes));
+    if (chunk == chunks_.size()) chunks_.emplace_back(allocate_chunk(chunkBytes));
     if (!chunks_[chunk]) throw std::logic_error("line store: append after release");
     const std::size_t n = std::min(bytes, chunkBytes - at);
     std::memcpy(chunks_[chunk].get() + at, p, n);
