@@ -171,9 +171,13 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   // The work matrix is kept from block to block in the stage's record: a fresh quarter of a
   // gigabyte per block cost its page faults and clearing on every call.
   dsp::cvector& work = wk.subBlock;
-  work.resize(static_cast<std::size_t>(Sb) * lines);
+  // Rows a multiple of 4 KiB apart would put each column's samples in one cache set, which the
+  // column transforms' turns pay for: such rows are padded by one cache line.
+  const int32_t Sp = (static_cast<int64_t>(Sb) * 8) % 4096 == 0 ? Sb + 8 : Sb;
+  work.resize(static_cast<std::size_t>(Sp) * lines);
   wk.data = work;
   wk.samples = Sb;
+  wk.pitch = Sp;
   double accum = 0.0, base = 0.0, previousKxc = 0.0;
   int status = 0;
   for (int32_t sb = 0; sb < Ns && status == 0; ++sb) {
@@ -182,7 +186,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
 #pragma omp parallel for schedule(static)
     for (int32_t l = 0; l < lines; ++l) {
       const fcomplex* src = source + static_cast<std::ptrdiff_t>(l) * n + o;
-      const auto row = work.begin() + static_cast<std::ptrdiff_t>(l) * Sb;
+      const auto row = work.begin() + static_cast<std::ptrdiff_t>(l) * Sp;
       std::fill(row + take, row + Sb, fcomplex{});
       std::copy(src, src + take, row);
     }
@@ -222,7 +226,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     // input in place.
 #pragma omp parallel for schedule(static)
     for (int32_t l = 0; l < keepLines; ++l) failure.run([&] {
-      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l + keepFirst) * Sb + Ov / 2;
+      const fcomplex* src = work.data() + static_cast<std::ptrdiff_t>(l + keepFirst) * Sp + Ov / 2;
       fcomplex* dst = block.data() + static_cast<std::ptrdiff_t>(l) * n + o;
       std::copy(src, src + back, dst);
       if (!ramp.empty()) dsp::rotate_by(std::span<fcomplex>(dst, ramp.size()), ramp);
@@ -231,6 +235,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   }
   wk.nearTime = savedNear;
   wk.samples = n;
+  wk.pitch = 0;
   wk.data = block;
   return status;
 }

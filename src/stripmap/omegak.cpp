@@ -185,7 +185,8 @@ double normalisation(const Weighting& w, const std::vector<std::array<double, 2>
 // Back to azimuth time and the weighting's normalisation, in one pass.
 void finish_block(wkparm& wk, const Weighting& w, const std::vector<std::array<double, 2>>& sums) {
   dsp::fft_plan back;
-  if (dsp::fft_makep_c(back, wk.samples, wk.samples, wk.lines, wk.lines, 0, -1, 1) != 0) return;
+  const int pitch = wk.pitch > 0 ? wk.pitch : wk.samples;
+  if (dsp::fft_makep_c(back, pitch, wk.samples, wk.lines, wk.lines, 0, -1, 1) != 0) return;
   dsp::pfft_c(back, wk.data, 1.0 / normalisation(w, sums));
 }
 
@@ -330,6 +331,7 @@ void RngShift(const fcomplex* input, int n, double step, double k, fcomplex* out
 int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2*/, std::span<const double> rs,
            double sa, double sr) {
   const int n = wk.samples, L = wk.lines;
+  const int pitch = wk.pitch > 0 ? wk.pitch : n;
   double kr0 = 0.0, ky0 = 0.0, kx0 = 0.0;
   WKCentre(wk, kr0, ky0, kx0);
   const double B = 4.0 * kPi * wk.fs / kC;
@@ -337,7 +339,7 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
   const double squint = block_squint(wk);
   Weighting w = make_weighting(wk, true);
 
-  dsp::fft_c(n, n, L, L, 1, 1, wk.data);
+  dsp::fft_c(pitch, n, L, L, 1, 1, wk.data);
   std::vector<double> kr(static_cast<std::size_t>(n)), wr(static_cast<std::size_t>(n));
   for (int i = 0; i < n; ++i) {
     const double k = kr0 + (i - n / 2) * B / n;
@@ -356,7 +358,7 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
     failure.run([&] { sc.reserve(static_cast<std::size_t>(n)); });
 #pragma omp for schedule(static)
     for (int j = 0; j < L; ++j) failure.run([&] {
-      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * pitch;
       const double y = ky[static_cast<std::size_t>(j)];
       const LineWeight lw(w, y, kr0 - (n / 2) * B / n, kr0 + (n - 1 - n / 2) * B / n);
       double s1 = 0.0, s2 = 0.0;
@@ -372,13 +374,14 @@ int FastWK(wkparm& wk, std::span<const double> ky, std::span<const double> /*ky2
     });
   }
   failure.rethrow();
-  dsp::fft_c(n, n, L, L, 0, -1, wk.data);
+  dsp::fft_c(pitch, n, L, L, 0, -1, wk.data);
   return 0;
 }
 
 int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> ky, std::span<const double> /*ky2*/,
                   std::span<const double> rs, double spacing, double sa, double sr) {
   const int n = wk.samples, L = wk.lines;
+  const int pitch = wk.pitch > 0 ? wk.pitch : n;
   const int M2 = static_cast<int>(std::lround(Ni));
   if (M2 < 2 || M < 1 || Nout > n) {
     base::report(base::kReportError, "Stolt grid of the block cannot be built");
@@ -394,7 +397,7 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
   const double half = std::floor(M2 / 2.0);
   const double endOffset = (M2 - 1) * dk - half * dk;
 
-  dsp::fft_c(n, n, L, L, 0, 1, wk.data);
+  dsp::fft_c(pitch, n, L, L, 0, 1, wk.data);
   dsp::czt_plan plan;
   if (dsp::czt_makep_c(plan, n, M2) != 0) return 1;
   dsp::fft_plan back;
@@ -413,7 +416,7 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
     });
 #pragma omp for schedule(dynamic, 16)
     for (int j = 0; j < L; ++j) failure.run([&] {
-      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * pitch;
       const double y = ky[static_cast<std::size_t>(j)], r = rs[static_cast<std::size_t>(j)];
       const double e = r - std::trunc(r / dk) * dk;
       const double s = -half * dk - e;
@@ -473,6 +476,7 @@ int ChirpInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double
 int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> ky, std::span<const double> /*ky2*/,
                double spacing, double sa, double sr) {
   const int n = wk.samples, L = wk.lines;
+  const int pitch = wk.pitch > 0 ? wk.pitch : n;
   const int order = wk.PerformInterpolation;
   const int taps = 2 * order + 1;
   const int N = static_cast<int>(Ni);
@@ -508,7 +512,7 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
     for (std::size_t i = 0; i < turn.size(); ++i) turn[i] = dcomplex(tc[i], ts[i]);
   }
 
-  dsp::fft_c(n, n, L, L, 0, 1, wk.data);
+  dsp::fft_c(pitch, n, L, L, 0, 1, wk.data);
   dsp::fft_plan fwd, back;
   if (dsp::fft_makep_c(fwd, N, N, 1, 1, 1, 0, 1) != 0 || dsp::fft_makep_c(back, M, M, 1, 1, -1, 0, 1) != 0) return 1;
   std::vector<std::array<double, 2>> sums(static_cast<std::size_t>(L), {0.0, 0.0});
@@ -525,7 +529,7 @@ int LSInterpWK(wkparm& wk, double Ni, int M, int Nout, std::span<const double> k
     });
 #pragma omp for schedule(dynamic, 16)
     for (int j = 0; j < L; ++j) failure.run([&] {
-      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * n;
+      fcomplex* row = wk.data.data() + static_cast<std::ptrdiff_t>(j) * pitch;
       const double y = ky[static_cast<std::size_t>(j)];
       const double lowArg = krs * krs - y * y, highArg = kre * kre - y * y;
       int i1 = 0, i2 = 0;

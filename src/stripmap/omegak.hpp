@@ -63,7 +63,10 @@ struct wkparm {
   double rangeTransitionBandwidth = 0.0;
   int32_t WhiteningFlag = 0;
   int32_t transformSign = 0;  // only 0 is supported
-  std::span<fcomplex> data;   // lines x samples
+  std::span<fcomplex> data;   // lines x samples, rows `pitch` samples apart
+  // Samples between the starts of two rows of `data` (0: `samples`). A pitch of a multiple of
+  // 4 KiB puts a column's samples in one cache set; the sub-blocks are padded past it.
+  int32_t pitch = 0;
   // multirg only: where the sub-blocks are read from (lines x samples; null: `data`), and the
   // lines of the block whose focused samples are written back into `data`, from its first
   // line on (keepLines < 0: every line, in place).

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "dft_reference.hpp"
+#include "dsp/detail/transpose.hpp"
 #include "dsp/fft.hpp"
 
 namespace sar::dsp {
@@ -452,6 +453,37 @@ TEST(FftMemory, AlignedAndZeroed) {
   fft_free(z);
   EXPECT_EQ(fft_calloc(static_cast<std::size_t>(-1) / 2, 4), nullptr);
   fft_free(nullptr);
+}
+
+}  // namespace
+}  // namespace sar::dsp
+
+namespace sar::dsp {
+namespace {
+
+// The vector turns of the column transforms against their formula, on shapes whose rows and
+// columns leave every kind of edge around the 4 x 4 tiles.
+TEST(FftTurns, VectorGatherAndScatterMoveEverySample) {
+  __builtin_cpu_init();
+  if (!__builtin_cpu_supports("avx2") || !__builtin_cpu_supports("fma")) GTEST_SKIP() << "no AVX2 on this processor";
+  for (const auto [n, count, stride] : {std::array<int, 3>{1, 1, 1}, {3, 5, 6}, {8, 8, 8}, {13, 7, 9}, {64, 33, 40},
+                                        {37, 16, 2056}}) {
+    const cvector src = random_samples(static_cast<std::size_t>(n) * stride, 3u + n);
+    cvector t(static_cast<std::size_t>(n) * count, fcomplex{-9.0f, -9.0f});
+    detail::gather_columns_avx2(src.data(), stride, n, count, t.data());
+    for (int k = 0; k < count; ++k)
+      for (int l = 0; l < n; ++l)
+        ASSERT_EQ(t[static_cast<std::size_t>(k) * n + l], src[static_cast<std::size_t>(l) * stride + k])
+            << n << " x " << count << " k " << k << " l " << l;
+    cvector back(src.size(), fcomplex{-9.0f, -9.0f});
+    detail::scatter_columns_avx2(t.data(), n, count, back.data(), stride);
+    for (int l = 0; l < n; ++l)
+      for (int k = 0; k < stride; ++k) {
+        const std::size_t i = static_cast<std::size_t>(l) * stride + k;
+        // Samples right of the columns are not the turn's to touch.
+        ASSERT_EQ(back[i], k < count ? src[i] : fcomplex(-9.0f, -9.0f)) << n << " x " << count << " l " << l << " k " << k;
+      }
+  }
 }
 
 }  // namespace

@@ -1,4 +1,5 @@
 #include "dsp/detail/fft_engine.hpp"
+#include "dsp/detail/transpose.hpp"
 
 #include "base/parallel.hpp"
 
@@ -21,9 +22,10 @@
 namespace sar::dsp::detail {
 namespace {
 
-// A chunk holds about this many samples (2 MiB): large enough that FFTW's loop overhead
-// vanishes, small enough that the normalisation pass finds the chunk in cache.
-constexpr std::int64_t kChunkSamples = std::int64_t{1} << 18;
+// A chunk holds about this many samples (512 KiB): large enough that FFTW's loop overhead
+// vanishes, small enough that a turned chunk of columns stays in the second-level cache
+// between its turn, its transforms, its normalisation and its turn back.
+constexpr std::int64_t kChunkSamples = std::int64_t{1} << 16;
 // Chunks are whole multiples of this many transforms, so that every chunk start keeps the
 // SIMD alignment of the array start (8 samples = 64 bytes).
 constexpr int kChunkQuantum = 8;
@@ -315,14 +317,10 @@ fcomplex* turning_buffer(std::size_t samples) {
   return b.p;
 }
 
-// Rows of this many samples are moved together, so that both sides of the transpose touch
-// whole cache lines while the tile stays in the first-level cache.
-constexpr int kTileRows = 16;
-
 // t[k n + l] = src[l stride + k] for k < count, l < n.
-void gather_columns(const fcomplex* src, std::int64_t stride, int n, int count, fcomplex* t) {
-  for (int l0 = 0; l0 < n; l0 += kTileRows) {
-    const int l1 = std::min(n, l0 + kTileRows);
+void gather_columns_base(const fcomplex* src, std::int64_t stride, int n, int count, fcomplex* t) {
+  for (int l0 = 0; l0 < n; l0 += kTurnTileRows) {
+    const int l1 = std::min(n, l0 + kTurnTileRows);
     for (int k = 0; k < count; ++k) {
       fcomplex* dst = t + static_cast<std::int64_t>(k) * n;
       for (int l = l0; l < l1; ++l) dst[l] = src[static_cast<std::int64_t>(l) * stride + k];
@@ -330,14 +328,37 @@ void gather_columns(const fcomplex* src, std::int64_t stride, int n, int count, 
   }
 }
 
-void scatter_columns(const fcomplex* t, int n, int count, fcomplex* dst, std::int64_t stride) {
-  for (int l0 = 0; l0 < n; l0 += kTileRows) {
-    const int l1 = std::min(n, l0 + kTileRows);
+void scatter_columns_base(const fcomplex* t, int n, int count, fcomplex* dst, std::int64_t stride) {
+  for (int l0 = 0; l0 < n; l0 += kTurnTileRows) {
+    const int l1 = std::min(n, l0 + kTurnTileRows);
     for (int l = l0; l < l1; ++l) {
       fcomplex* row = dst + static_cast<std::int64_t>(l) * stride;
       for (int k = 0; k < count; ++k) row[k] = t[static_cast<std::int64_t>(k) * n + l];
     }
   }
+}
+
+struct Turns {
+  void (*gather)(const fcomplex*, std::int64_t, int, int, fcomplex*);
+  void (*scatter)(const fcomplex*, int, int, fcomplex*, std::int64_t);
+};
+
+const Turns& turns() {
+  static const Turns chosen = [] {
+    __builtin_cpu_init();
+    if (__builtin_cpu_supports("avx2") && __builtin_cpu_supports("fma"))
+      return Turns{gather_columns_avx2, scatter_columns_avx2};
+    return Turns{gather_columns_base, scatter_columns_base};
+  }();
+  return chosen;
+}
+
+void gather_columns(const fcomplex* src, std::int64_t stride, int n, int count, fcomplex* t) {
+  turns().gather(src, stride, n, count, t);
+}
+
+void scatter_columns(const fcomplex* t, int n, int count, fcomplex* dst, std::int64_t stride) {
+  turns().scatter(t, n, count, dst, stride);
 }
 
 }  // namespace
