@@ -72,28 +72,85 @@ std::array<int, 2> quicklook_size(int lines, int samples, const QuickLookRequest
   return {width, height};
 }
 
-int write_quicklook_geotiff(const std::string& outPath, int lines, int samples, const ComplexRowSource& source,
-                            const QuickLookRequest& request, QuickLookResult* result) {
-  if (lines <= 0 || samples <= 0 || request.maxWidth <= 0 || request.maxHeight <= 0) return 10;
-  const auto [width, height] = quicklook_size(lines, samples, request);
+namespace {
 
-  // Mean power per output pixel, accumulated line by line: one input row in memory at a time.
-  std::vector<double> power(static_cast<std::size_t>(width) * height, 0.0);
-  std::vector<uint32_t> counts(power.size(), 0);
-  std::vector<std::complex<float>> row(static_cast<std::size_t>(samples));
-  std::vector<int> column(static_cast<std::size_t>(samples));
-  for (int s = 0; s < samples; ++s) column[static_cast<std::size_t>(s)] = static_cast<int>(int64_t(s) * width / samples);
-  for (int l = 0; l < lines; ++l) {
-    if (!source(l, row)) return 10;
-    const std::size_t base = static_cast<std::size_t>(int64_t(l) * height / lines) * width;
-    for (int s = 0; s < samples; ++s) {
-      const std::complex<float> z = row[static_cast<std::size_t>(s)];
-      if (!std::isfinite(z.real()) || !std::isfinite(z.imag())) continue;
-      const std::size_t o = base + static_cast<std::size_t>(column[static_cast<std::size_t>(s)]);
-      power[o] += static_cast<double>(std::norm(z));
-      ++counts[o];
+// Adds lines [b0, b1) (rows(l) points at line l) to the grid: each output row by one thread,
+// its lines in order, so the sums do not depend on the thread count.
+template <class Rows>
+void add_lines(QuickLookGrid& g, int b0, int b1, const Rows& rows) {
+  const auto row_of = [&](int l) { return static_cast<int>(int64_t(l) * g.height / g.lines); };
+  const int r0 = row_of(b0), r1 = row_of(b1 - 1);
+#pragma omp parallel for schedule(dynamic)
+  for (int r = r0; r <= r1; ++r) {
+    const std::size_t base = static_cast<std::size_t>(r) * g.width;
+    // The first line of output row r is the least l with l height >= r lines.
+    const auto first = static_cast<int>((int64_t(r) * g.lines + g.height - 1) / g.height);
+    for (int l = std::max(b0, first); l < b1 && row_of(l) == r; ++l) {
+      const std::complex<float>* row = rows(l);
+      // The samples of one output column are consecutive: each run is summed on its own.
+      for (int s = 0; s < g.samples;) {
+        const int c = g.column[static_cast<std::size_t>(s)];
+        double sum = 0.0;
+        uint32_t n = 0;
+        for (; s < g.samples && g.column[static_cast<std::size_t>(s)] == c; ++s) {
+          const std::complex<float> z = row[s];
+          if (!std::isfinite(z.real()) || !std::isfinite(z.imag())) continue;
+          sum += static_cast<double>(std::norm(z));
+          ++n;
+        }
+        g.power[base + static_cast<std::size_t>(c)] += sum;
+        g.counts[base + static_cast<std::size_t>(c)] += n;
+      }
     }
   }
+}
+
+}  // namespace
+
+int QuickLookGrid::start(int lines_, int samples_, const QuickLookRequest& request) {
+  if (lines_ <= 0 || samples_ <= 0 || request.maxWidth <= 0 || request.maxHeight <= 0) return 10;
+  lines = lines_;
+  samples = samples_;
+  const auto size = quicklook_size(lines, samples, request);
+  width = size[0];
+  height = size[1];
+  power.assign(static_cast<std::size_t>(width) * height, 0.0);
+  counts.assign(power.size(), 0);
+  column.resize(static_cast<std::size_t>(samples));
+  for (int s = 0; s < samples; ++s) column[static_cast<std::size_t>(s)] = static_cast<int>(int64_t(s) * width / samples);
+  return 0;
+}
+
+void quicklook_add(QuickLookGrid& grid, int first, int count, const std::complex<float>* lines, std::int64_t pitch) {
+  const int end = std::min(grid.lines, first + count);
+  if (!lines || first < 0 || first >= end) return;
+  add_lines(grid, first, end, [&](int l) { return lines + static_cast<std::int64_t>(l - first) * pitch; });
+}
+
+int write_quicklook_geotiff(const std::string& outPath, int lines, int samples, const ComplexRowSource& source,
+                            const QuickLookRequest& request, QuickLookResult* result) {
+  QuickLookGrid grid;
+  if (int st = grid.start(lines, samples, request)) return st;
+  // The lines are read in order, a batch at a time.
+  constexpr int kBatch = 256;
+  std::vector<std::complex<float>> batch(static_cast<std::size_t>(kBatch) * samples);
+  for (int b0 = 0; b0 < lines; b0 += kBatch) {
+    const int b1 = std::min(lines, b0 + kBatch);
+    for (int l = b0; l < b1; ++l)
+      if (!source(l, std::span<std::complex<float>>(batch.data() + static_cast<std::ptrdiff_t>(l - b0) * samples,
+                                                    static_cast<std::size_t>(samples))))
+        return 10;
+    add_lines(grid, b0, b1, [&](int l) { return batch.data() + static_cast<std::ptrdiff_t>(l - b0) * samples; });
+  }
+  return write_quicklook_grid(outPath, grid, request, result);
+}
+
+int write_quicklook_grid(const std::string& outPath, const QuickLookGrid& grid, const QuickLookRequest& request,
+                         QuickLookResult* result) {
+  const int width = grid.width, height = grid.height;
+  const std::vector<double>& power = grid.power;
+  const std::vector<uint32_t>& counts = grid.counts;
+  if (width <= 0 || height <= 0 || power.size() != static_cast<std::size_t>(width) * height) return 10;
   std::vector<float> amplitude(power.size(), 0.0f);
   for (std::size_t i = 0; i < power.size(); ++i)
     if (counts[i]) amplitude[i] = static_cast<float>(std::sqrt(power[i] / counts[i]));

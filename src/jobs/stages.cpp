@@ -171,5 +171,8 @@ int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az) {
   return st;
 }
 int dest_buffer(sarpar& par, procparm& proc) { return named("dest_buffer", stripmap::dest_buffer(par, proc)); }
+int dest_buffer(sarpar& par, procparm& proc, const stripmap::WrittenLines& written) {
+  return named("dest_buffer", stripmap::dest_buffer(par, proc, written));
+}
 int get_coords(procparm& proc, sarpar& par) { return named("get_coords", stripmap::get_coords(proc, par)); }
 }  // namespace sar::jobs

@@ -11,6 +11,7 @@
 #include "doppler/dcestconf.hpp"
 #include "envisat/records.hpp"
 #include "stripmap/procparm.hpp"
+#include "stripmap/range_focus.hpp"
 
 namespace sar::jobs {
 
@@ -74,6 +75,7 @@ int getgeopoly(sarpar& par, procparm& proc);
 int IMCalibration(sarpar& par, procparm& proc);
 int azimuthfoc(sarpar& par, procparm& proc, azimuthconf& az);
 int dest_buffer(sarpar& par, procparm& proc);
+int dest_buffer(sarpar& par, procparm& proc, const stripmap::WrittenLines& written);
 int get_coords(procparm& proc, sarpar& par);
 
 }  // namespace sar::jobs

@@ -163,7 +163,20 @@ int read_stripmap_parameters(const std::string& parameterFile, StripmapChannel& 
   return 0;
 }
 
-StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviauxfiles& files, bool incore) {
+// The quick-look request of an image from the job's arguments (requested size and brightness).
+hostlib::QuickLookRequest quicklook_request(double scale, int width, int height, const procparm& proc) {
+  hostlib::QuickLookRequest request;
+  request.maxWidth = width > 0 ? width : 1024;
+  request.maxHeight = height > 0 ? height : 1024;
+  request.scale = scale > 0.0 ? scale : 1.0;
+  request.rangeSpacing = proc.rangePixelSpacing > 0.0 ? proc.rangePixelSpacing : 1.0;
+  request.azimuthSpacing = proc.azimuthPixelSpacing > 0.0 ? proc.azimuthPixelSpacing : 1.0;
+  for (std::size_t i = 0; i < 4; ++i) request.corners[i] = {proc.corners[i].latitude, proc.corners[i].longitude};
+  return request;
+}
+
+StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviauxfiles& files, bool incore,
+                                           const QuickLookOptions& quicklook) {
   using C = StripmapChannel;
   const bool cleanup = flags[kStageCleanup] != 0 && !incore;  // with the data in memory nothing is left to remove
   StageChain<C> chain;
@@ -200,22 +213,35 @@ StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviau
               return 0;
             },
             flags[kStageAzimuth] != 0 && cleanup)
-      // With the data in memory the SLC is written here.
-      .then("dest_buffer", "SLC writing", [](C& c) { return dest_buffer(c.par, c.proc); }, incore, true);
+      // With the data in memory the SLC is written here; the quick-look's sums are taken from
+      // each run of lines as it is written, so that the quick-look need not read the SLC back.
+      .then("dest_buffer", "SLC writing",
+            [quicklook](C& c) {
+              c.quicklook = hostlib::QuickLookGrid();
+              if (!quicklook.wanted) return dest_buffer(c.par, c.proc);
+              const hostlib::QuickLookRequest r = quicklook_request(quicklook.scale, quicklook.width, quicklook.height, c.proc);
+              // Without sums the quick-look reads the SLC back: a refused grid costs time only.
+              if (c.quicklook.start(c.proc.focusedLines, c.proc.focusedSamples, r) != 0) return dest_buffer(c.par, c.proc);
+              const int samples = c.proc.focusedSamples;
+              return dest_buffer(c.par, c.proc, [&c, samples](int32_t first, int32_t count, const std::complex<float>* lines) {
+                hostlib::quicklook_add(c.quicklook, first, count, lines, samples);
+              });
+            },
+            incore, true);
   return chain;
 }
 
 // Quick-look of the SLC: amplitude averaged down to the requested size, tied to the ground by the
-// corners that get_coords placed.
+// corners that get_coords placed. From the sums taken in memory when there are any, else from
+// the SLC file.
 int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
-                    const procparm& proc) {
-  hostlib::QuickLookRequest request;
-  request.maxWidth = width > 0 ? width : 1024;
-  request.maxHeight = height > 0 ? height : 1024;
-  request.scale = scale > 0.0 ? scale : 1.0;
-  request.rangeSpacing = proc.rangePixelSpacing > 0.0 ? proc.rangePixelSpacing : 1.0;
-  request.azimuthSpacing = proc.azimuthPixelSpacing > 0.0 ? proc.azimuthPixelSpacing : 1.0;
-  for (std::size_t i = 0; i < 4; ++i) request.corners[i] = {proc.corners[i].latitude, proc.corners[i].longitude};
+                    const procparm& proc, const hostlib::QuickLookGrid* sums) {
+  const hostlib::QuickLookRequest request = quicklook_request(scale, width, height, proc);
+  if (sums && sums->lines == proc.focusedLines && sums->samples == proc.focusedSamples && sums->lines > 0) {
+    const int st = hostlib::write_quicklook_grid(tifPath, *sums, request);
+    if (st != 0) note_failed_stage("quick-look GeoTIFF " + tifPath);
+    return st;
+  }
   std::FILE* in = std::fopen(slcPath.c_str(), "rb");
   if (!in) {
     note_failed_stage("quick-look: " + slcPath + " cannot be opened");
@@ -315,7 +341,8 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
       if (i < extra.line_stores.size()) channels[i].proc.rawLines = std::move(extra.line_stores[i]);
     }
   }
-  const StageChain<StripmapChannel> chain = stripmap_chain(flags, files, incore);
+  const QuickLookOptions quicklook{args[12] == "OK", std::atof(args[13].c_str()), quickLook1, quickLook2};
+  const StageChain<StripmapChannel> chain = stripmap_chain(flags, files, incore, quicklook);
   for (std::size_t i = 0; i < channels.size(); ++i) {
     StripmapChannel& c = channels[i];
     if (images > 1) base::LogPrintf("Image %zu of %d: %s\n", i + 1, images, c.word.c_str());
@@ -351,6 +378,7 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
 
   // Products: the quick-looks.
   if (args[12] == "OK") {
+    const StageClock clock("quick-look");
     for (std::size_t i = 0; i < channels.size(); ++i) {
       const StripmapChannel& c = channels[i];
       const std::string_view label =
@@ -360,7 +388,7 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind) {
       base::getAndSetPerc(-1, 0, &current);
       base::getAndSetPerc(-1, 0, nullptr);
       if (write_quicklook(c.par.slcPath, c.par.slcPath + ".tif", std::atof(args[13].c_str()), quickLook1, quickLook2,
-                          c.proc) != 0)
+                          c.proc, &c.quicklook) != 0)
         base::fatal(base::ec::kStageFailed, {"GeoTIFF", failed_stage()});
     }
   }

@@ -12,6 +12,7 @@
 #include <string_view>
 #include <vector>
 
+#include "hostlib/quicklook.hpp"
 #include "base/errors.hpp"
 #include "jobs/annotation.hpp"
 #include "jobs/stage_chain.hpp"
@@ -26,6 +27,9 @@ struct StripmapChannel {
   dcestconf dc;
   azimuthconf az;
   std::string word;  // polarisation word of the output name ("hv"); empty for the IM image
+  // The quick-look's sums, taken while the focused image is in memory (empty otherwise: the
+  // quick-look then reads the SLC back).
+  hostlib::QuickLookGrid quicklook;
 };
 
 /// What tells the IM and AP jobs apart.
@@ -59,14 +63,23 @@ int run_stripmap_job(const std::string& listPath, const StripmapJobKind& kind);
 int read_stripmap_parameters(const std::string& parameterFile, StripmapChannel& channel, StageFlags& flags,
                              bool polWeightsRequired);
 
+/// The quick-look the job list asks for (argument 12 "OK"; brightness and size).
+struct QuickLookOptions {
+  bool wanted = false;
+  double scale = 1.0;
+  int width = 0, height = 0;
+};
+
 /// The stages one image of an ENVISAT stripmap product runs through after the extraction,
 /// for the stage flags and the product's auxiliary files.
-StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviauxfiles& files, bool incore);
+StageChain<StripmapChannel> stripmap_chain(const StageFlags& flags, const enviauxfiles& files, bool incore,
+                                           const QuickLookOptions& quicklook = {});
 
-/// GeoTIFF quick-look of a focused SLC (focused sizes and corners from `proc`). 0, or the
-/// writer's status with the failed stage noted.
+/// GeoTIFF quick-look of a focused SLC (focused sizes and corners from `proc`): from `sums`
+/// when they were taken of this image in memory, else from the SLC file. 0, or the writer's
+/// status with the failed stage noted.
 int write_quicklook(const std::string& slcPath, const std::string& tifPath, double scale, int width, int height,
-                    const procparm& proc);
+                    const procparm& proc, const hostlib::QuickLookGrid* sums = nullptr);
 /// An input error thrown while a channel is processed, into the host's error record: an orbit
 /// that does not reach over the channel's lines is a stage that cannot run (130560, with the
 /// scene's times and the file's span); any other fault keeps the code its reader gave it.

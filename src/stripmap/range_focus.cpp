@@ -410,7 +410,9 @@ int rangefoc(const sarpar& par, procparm& proc) {
   return 0;
 }
 
-int dest_buffer(const sarpar& par, procparm& proc) {
+int dest_buffer(const sarpar& par, procparm& proc) { return dest_buffer(par, proc, {}); }
+
+int dest_buffer(const sarpar& par, procparm& proc, const WrittenLines& written) {
   base::Frame frame("dest_buffer");
   const auto count = static_cast<int64_t>(proc.focusedLines) * proc.focusedSamples;
   if (proc.focusedLines <= 0 || proc.focusedSamples <= 0 || static_cast<int64_t>(proc.matrix.size()) < count) {
@@ -418,7 +420,19 @@ int dest_buffer(const sarpar& par, procparm& proc) {
     return frame.check(kRejected);
   }
   OutputRaster out(par.slcPath);
-  out.write(proc.matrix.data(), count);
+  if (!written) {
+    out.write(proc.matrix.data(), count);
+  } else {
+    // A few megabytes at a time, so that the observer reads the lines from the cache.
+    constexpr int64_t kRunBytes = int64_t{8} << 20;
+    const auto run = static_cast<int32_t>(std::max<int64_t>(1, kRunBytes / (8 * int64_t{proc.focusedSamples})));
+    for (int32_t first = 0; first < proc.focusedLines; first += run) {
+      const int32_t lines = std::min(run, proc.focusedLines - first);
+      const fcomplex* p = proc.matrix.data() + static_cast<int64_t>(first) * proc.focusedSamples;
+      out.write(p, static_cast<int64_t>(lines) * proc.focusedSamples);
+      written(first, lines, p);
+    }
+  }
   out.commit();
   proc.matrix = dsp::cmatrix();
   proc.lineShifts = std::vector<int32_t>();

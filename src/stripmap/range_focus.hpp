@@ -22,6 +22,7 @@
 #include <array>
 #include <complex>
 #include <cstdint>
+#include <functional>
 #include <span>
 
 #include "metadata/acquisition.hpp"
@@ -54,6 +55,10 @@ int rangefoc(const sarpar& par, procparm& proc);
 /// frees the matrix and the line shifts. The file is written under a temporary name and
 /// renamed when complete, so a failed write never leaves a product that looks whole.
 int dest_buffer(const sarpar& par, procparm& proc);
+/// The same; `written` sees each run of lines once it is written (while it is still in the
+/// cache): first line, line count, and the lines at the focused pitch.
+using WrittenLines = std::function<void(int32_t first, int32_t count, const std::complex<float>* lines)>;
+int dest_buffer(const sarpar& par, procparm& proc, const WrittenLines& written);
 
 /// Block counters of the running stage, read by the progress display.
 struct BlockCounters {

@@ -5,6 +5,7 @@
 #include <ogr_srs_api.h>
 #include <unistd.h>
 
+#include <array>
 #include <cmath>
 #include <cstdio>
 #include <filesystem>
@@ -144,6 +145,35 @@ TEST_F(QuickLook, GreyLevelsFollowTheMedianAndBrightTargetsSaturate) {
   r.scale = 2.0;
   ASSERT_EQ(write_quicklook_geotiff(out, 200, 300, scene, r), 0);
   EXPECT_EQ(read_tiff(out).at(5, 5), 127);
+}
+
+// Sums taken from an image in memory, in uneven runs of lines, give the pixels of the
+// quick-look read line by line from its source.
+TEST_F(QuickLook, SumsOfRunsInMemoryEqualTheReadBackImage) {
+  QuickLookRequest r;
+  r.maxWidth = 70;  // uneven blocks: 300 samples and 200 lines onto 70 x 47 pixels
+  r.maxHeight = 47;
+  std::vector<std::complex<float>> image(200 * 300);
+  for (int l = 0; l < 200; ++l) scene(l, std::span<std::complex<float>>(image.data() + l * 300, 300));
+  const std::string fromSource = (dir_ / "source.tif").string(), fromSums = (dir_ / "sums.tif").string();
+  ASSERT_EQ(write_quicklook_geotiff(fromSource, 200, 300, scene, r), 0);
+  QuickLookGrid grid;
+  ASSERT_EQ(grid.start(200, 300, r), 0);
+  for (const auto [first, count] : {std::array<int, 2>{0, 1}, {1, 63}, {64, 7}, {71, 129}})
+    quicklook_add(grid, first, count, image.data() + first * 300, 300);
+  ASSERT_EQ(write_quicklook_grid(fromSums, grid, r), 0);
+  const Image a = read_tiff(fromSource), b = read_tiff(fromSums);
+  ASSERT_EQ(a.width, 70);
+  ASSERT_FALSE(a.pixels.empty());
+  EXPECT_EQ(a.pixels, b.pixels);
+  // Lines left out leave their pixels without data.
+  QuickLookGrid part;
+  ASSERT_EQ(part.start(200, 300, r), 0);
+  quicklook_add(part, 0, 100, image.data(), 300);
+  ASSERT_EQ(write_quicklook_grid(fromSums, part, r), 0);
+  EXPECT_EQ(read_tiff(fromSums).at(5, 40), 0);
+  EXPECT_NE(read_tiff(fromSums).at(5, 5), 0);
+  EXPECT_EQ(write_quicklook_grid(fromSums, QuickLookGrid(), r), 10);
 }
 
 TEST_F(QuickLook, GdalSeesWgs84TiePoints) {
