@@ -154,6 +154,7 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
   const double savedNear = wk.nearTime;
   const std::span<fcomplex> block = wk.data;
   const fcomplex* source = wk.input ? wk.input : block.data();
+  const int32_t filled = wk.inputLines < 0 ? lines : std::min(wk.inputLines, lines);
   const int32_t keepFirst = wk.keepLines < 0 ? 0 : std::clamp(wk.keepFirst, 0, lines);
   const int32_t keepLines = wk.keepLines < 0 ? lines : std::min(wk.keepLines, lines - keepFirst);
   if (static_cast<int64_t>(std::max(keepLines, 0)) * n > static_cast<int64_t>(block.size())) {
@@ -185,8 +186,12 @@ int multirg(wkparm& wk, focazwk_result& result, int32_t Sb, int32_t Ov, const do
     const int32_t take = std::min(Sb, n - o);
 #pragma omp parallel for schedule(static)
     for (int32_t l = 0; l < lines; ++l) {
-      const fcomplex* src = source + static_cast<std::ptrdiff_t>(l) * n + o;
       const auto row = work.begin() + static_cast<std::ptrdiff_t>(l) * Sp;
+      if (l >= filled) {
+        std::fill(row, row + Sb, fcomplex{});
+        continue;
+      }
+      const fcomplex* src = source + static_cast<std::ptrdiff_t>(l) * n + o;
       std::fill(row + take, row + Sb, fcomplex{});
       std::copy(src, src + take, row);
     }
@@ -344,7 +349,12 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
     in = std::make_unique<InputRaster>(par.rgfPath, static_cast<int64_t>(lines) * samples * 8, "range-focused file");
     out = std::make_unique<OutputRaster>(par.slcPath);
   }
-  dsp::cmatrix block(static_cast<std::size_t>(samples) * std::min(Lb, lines));  // every block is copied in whole
+  // A block whose length has a large prime factor (the last one, as a rule) is padded with
+  // zero lines to the next length of factors 2, 3 and 5: its transforms would cost several
+  // times those of a whole block. The apertures of its output lines lie inside its data, so the
+  // zeros only take the wrap-around of the circular convolution.
+  const auto padded_length = [](int32_t n) { return std::max(n, dsp::genpow(n, 1)); };
+  dsp::cmatrix block(static_cast<std::size_t>(samples) * padded_length(std::min(Lb, lines)));
   progress_open("Azimuth Focusing");
   focazwk_result result;
   int64_t written = 0;  // focused lines so far (core mode packs them at pitch So)
@@ -364,14 +374,16 @@ int azimuthfoc(const sarpar& par, procparm& proc, const azimuthconf& az) {
       in->seek(static_cast<int64_t>(l0) * samples * 8);
       in->read(block.data(), static_cast<int64_t>(count) * 8);
     }
+    const int32_t transformLines = padded_length(blockLines);
     wk.input = core ? proc.matrix.data() + static_cast<std::ptrdiff_t>(l0) * samples : nullptr;
+    wk.inputLines = blockLines;
     wk.keepFirst = lead;
     wk.keepLines = Ln;
     const double t = (blockLines / 2 + l0) / prf + par.azimuthStartTime - dc[8];
     const double p[5] = {dc[0] + dc[2] * t, dc[1] + dc[3] * t, dc[4], dc[5], dc[6]};
-    wk.lines = blockLines;
+    wk.lines = transformLines;
     wk.samples = samples;
-    wk.data = std::span<fcomplex>(block.data(), count);
+    wk.data = std::span<fcomplex>(block.data(), static_cast<std::size_t>(transformLines) * samples);
     wk.nearTime = par.nearRangeTime;
     wk.rangeShift = sceneRangeShift;
     wk.azimuthShift = sceneAzimuthShift;

@@ -73,6 +73,9 @@ struct wkparm {
   const fcomplex* input = nullptr;
   int32_t keepFirst = 0;
   int32_t keepLines = -1;
+  // multirg only: lines of the input that hold data (< 0: all `lines`); the lines after them
+  // are zeros that pad the block to a transform length of small prime factors.
+  int32_t inputLines = -1;
   // The range sub-block work matrix: made once for the stage, reused by every block.
   dsp::cvector subBlock;
   double R0 = 0.0;            // reference range, m

@@ -206,6 +206,20 @@ TEST(AzimuthFocus, FileModeEqualsCoreModeOverSeveralBlocks) {
   EXPECT_FALSE(fs::exists(file.par.slcPath + ".part"));
 }
 
+// A last block of 1479 lines (3 x 17 x 29) is transformed padded with zero lines: a target
+// whose output falls in it is focused as well as one in the first block.
+TEST(AzimuthFocus, LastBlockOfAwkwardLengthFocusesItsTargets) {
+  for (const int kernel : {0, 1}) {
+    SCOPED_TRACE(testing::Message() << "kernel " << kernel);
+    Scene s = make_scene(2503, 256, 0.0, {{900.0, 100.0}, {1750.0, 180.0}});
+    s.az.LinesInBlock = 1600;
+    s.az.AzimuthOverlap = 300;
+    s.az.SamplesInBlock = 256;
+    focus_and_check(s, kernel, 0.1);
+    EXPECT_EQ(sar::stripmap::block_counters().total, 3);
+  }
+}
+
 TEST(AzimuthFocus, RefusesBlocksThatDoNotFit) {
   struct Case {
     int linesInBlock, azimuthOverlap, samplesInBlock, rangeOverlap;
