@@ -219,6 +219,18 @@ int gr_pt_lat_lon_s_osculated(grpt_rec& rec, const Vec3& P, const Vec3& V, const
   return geo_status::kOk;
 }
 
+grpt_rec zero_doppler_record(std::span<const double, 15> positions, double t0, double dt, double wavelength) {
+  grpt_rec rec;
+  for (std::size_t k = 0; k < 5; ++k) rec.state_vectors[k] = {positions[3 * k], positions[3 * k + 1], positions[3 * k + 2]};
+  rec.t0 = t0;
+  rec.dt = dt;
+  rec.wavelength = wavelength;
+  rec.side = 1.0;
+  rec.height = 0.0;
+  rec.fdc = 0.0;
+  return rec;
+}
+
 int gr_pt_lat_lon(grpt_rec& rec, double a, double b) {
   clear_outputs(rec);
   const OrbitPolynomial poly = orb_interp(0.0, rec.state_vectors, rec.dt, 5);

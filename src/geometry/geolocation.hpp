@@ -73,6 +73,10 @@ struct grpt_rec {
   double doppler_rate = 0.0;     ///< out: Hz/s
 };
 
+/// A record for zero-Doppler points on the ellipsoid of a right-looking sensor, from five
+/// state vectors (x, y, z each, m) starting at t0, dt apart; the caller sets azimuth_time and tau.
+grpt_rec zero_doppler_record(std::span<const double, 15> positions, double t0, double dt, double wavelength);
+
 /// Geolocate from the record's five state vectors: fit, evaluate at the azimuth time and run
 /// gr_pt_lat_lon_s_osculated; fills the beam velocity. Returns 0, -1 when the azimuth time is
 /// more than dt/2 outside the state vectors, or gr_pt's status.

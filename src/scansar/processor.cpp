@@ -19,15 +19,8 @@ SceneCorners get_coords(const scansar& scan, const wsparm& par, const RangeFocus
                         const metadata::SceneReferences& refs, int s) {
   const auto i = static_cast<std::size_t>(s);
   SceneCorners out;
-  geometry::grpt_rec rec;
-  for (std::size_t k = 0; k < 5; ++k)
-    rec.state_vectors[k] = {refs.orbitPositions[3 * k], refs.orbitPositions[3 * k + 1], refs.orbitPositions[3 * k + 2]};
-  rec.t0 = refs.orbitStartTime;
-  rec.dt = refs.orbitSpacing;
-  rec.wavelength = base::kSpeedOfLight / scan.carrierFrequency;
-  rec.side = 1.0;
-  rec.height = 0.0;
-  rec.fdc = 0.0;
+  geometry::grpt_rec rec = geometry::zero_doppler_record(refs.orbitPositions, refs.orbitStartTime, refs.orbitSpacing,
+                                                         base::kSpeedOfLight / scan.carrierFrequency);
   const int32_t ov = par.rangeOverlap;
   const double near = f.nearTime + (f.firstValid + ov / 2) / scan.samplingRate;
   const double far = near + (f.validColumns - ov - 1) / scan.samplingRate;

@@ -10,17 +10,8 @@ namespace sar::stripmap {
 
 int get_coords(procparm& proc, const metadata::sarpar& par) {
   base::Frame frame("get_coords");
-  geometry::grpt_rec rec;
-  for (int i = 0; i < 5; ++i)
-    rec.state_vectors[static_cast<std::size_t>(i)] = {proc.orbitPositions[static_cast<std::size_t>(3 * i)],
-                                                      proc.orbitPositions[static_cast<std::size_t>(3 * i + 1)],
-                                                      proc.orbitPositions[static_cast<std::size_t>(3 * i + 2)]};
-  rec.t0 = proc.orbitStartTime;
-  rec.dt = proc.orbitSpacing;
-  rec.wavelength = base::kSpeedOfLight / par.carrierFrequency;
-  rec.side = 1.0;
-  rec.height = 0.0;
-  rec.fdc = 0.0;
+  geometry::grpt_rec rec = geometry::zero_doppler_record(proc.orbitPositions, proc.orbitStartTime, proc.orbitSpacing,
+                                                         base::kSpeedOfLight / par.carrierFrequency);
   // The focused grid, not the raw extent: the block overlaps are gone from the SLC.
   const double t0 = proc.firstLineTime, r0 = proc.firstSampleTime;
   const double T = proc.focusedLines / par.prf, R = proc.focusedSamples / par.samplingRate;

@@ -217,6 +217,21 @@ TEST(AzimuthFocus, LastBlockOfAwkwardLengthFocusesItsTargets) {
     s.az.SamplesInBlock = 256;
     focus_and_check(s, kernel, 0.1);
     EXPECT_EQ(sar::stripmap::block_counters().total, 3);
+    // Away from the targets' rows and columns the image is dark: the padding holds no data.
+    const int lines = s.proc.focusedLines, samples = s.proc.focusedSamples;
+    double peak = 0.0, background = 0.0;
+    for (int l = 0; l < lines; ++l)
+      for (int i = 0; i < samples; ++i) {
+        const double p = std::norm(s.proc.matrix[static_cast<std::size_t>(l) * samples + i]);
+        bool near = false;
+        for (const auto& t : s.targets) {
+          const double tl = (kStart + t.line / kPrf - s.proc.firstLineTime) * kPrf;
+          const double ts = (s.par.nearRangeTime + t.sample / kFs - s.proc.firstSampleTime) * kFs;
+          near = near || std::abs(l - tl) < 24 || std::abs(i - ts) < 24;
+        }
+        (near ? peak : background) = std::max(near ? peak : background, p);
+      }
+    EXPECT_LT(10.0 * std::log10(background / peak), -50.0);
   }
 }
 

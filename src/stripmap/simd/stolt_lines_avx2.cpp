@@ -13,7 +13,7 @@ namespace sar::stripmap::detail::avx2 {
 namespace {
 
 // Four output bins a step; the two neighbours of each are gathered as one 64-bit pair of
-// floats. The tail goes through the same formula one bin at a time.
+// floats.
 void two_point(const fcomplex* z, int bins, const double* x, const double* s, const double* c, int count,
                fcomplex* out) {
   const __m256d zero = _mm256_setzero_pd(), one = _mm256_set1_pd(1.0), top = _mm256_set1_pd(bins);
@@ -45,18 +45,8 @@ void two_point(const fcomplex* z, int bins, const double* x, const double* s, co
     }
     _mm256_storeu_ps(reinterpret_cast<float*>(out + u), _mm256_set_m128(half[1], half[0]));
   }
-  for (; u < count; ++u) {
-    const double f = std::floor(x[u]);
-    if (!(f >= 0.0 && f < bins)) {
-      out[u] = fcomplex{};
-      continue;
-    }
-    const auto p = static_cast<std::size_t>(f);
-    const double t = x[u] - f;
-    const double mr = (1.0 - t) * z[p].real() - t * z[p + 1].real();
-    const double mi = (1.0 - t) * z[p].imag() - t * z[p + 1].imag();
-    out[u] = fcomplex(static_cast<float>(mr * c[u] - mi * s[u]), static_cast<float>(mr * s[u] + mi * c[u]));
-  }
+  // The tail through the baseline loop, the same formula a bin at a time.
+  if (u < count) base_isa::kernels.two_point(z, bins, x + u, s + u, c + u, count - u, out + u);
 }
 
 }  // namespace
